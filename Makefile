@@ -1,0 +1,44 @@
+# thevorn: the two commands that matter are `make run` and `make test`.
+BUILD_DIR ?= build
+SAN_DIR   ?= build-asan
+TSAN_DIR  ?= build-tsan
+JOBS      ?= $(shell nproc)
+CMAKE_ARGS ?=
+
+.PHONY: deps configure build test run bench sanitize tsan clean
+
+deps:
+	@scripts/install-deps
+
+$(BUILD_DIR)/build.ninja:
+	cmake -S . -B $(BUILD_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Release $(CMAKE_ARGS)
+
+configure: deps $(BUILD_DIR)/build.ninja
+
+build: configure
+	cmake --build $(BUILD_DIR) -j $(JOBS)
+
+test: build
+	cd $(BUILD_DIR) && ctest --output-on-failure -j $(JOBS) --timeout 600
+
+run: build
+	@scripts/run-example $(BUILD_DIR)
+
+bench: build
+	@echo "benchmarks are in $(BUILD_DIR)/bench/"
+
+# Address and undefined-behaviour sanitizers over the tests.
+sanitize: deps
+	cmake -S . -B $(SAN_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Debug -DOX_SANITIZE=address -DOX_BUILD_BENCH=OFF
+	cmake --build $(SAN_DIR) -j $(JOBS)
+	cd $(SAN_DIR) && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
+		ctest --output-on-failure -j $(JOBS) --timeout 900
+
+# ThreadSanitizer over the tests that exercise threads.
+tsan: deps
+	cmake -S . -B $(TSAN_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Debug -DOX_SANITIZE=thread -DOX_BUILD_BENCH=OFF
+	cmake --build $(TSAN_DIR) -j $(JOBS)
+	cd $(TSAN_DIR) && TSAN_OPTIONS=halt_on_error=1 ctest --output-on-failure -j $(JOBS) --timeout 900 -L threads
+
+clean:
+	rm -rf $(BUILD_DIR) $(SAN_DIR) $(TSAN_DIR)

@@ -1,0 +1,1 @@
+// The run sequence lives here.

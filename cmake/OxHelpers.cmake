@@ -1,0 +1,49 @@
+# Shared build settings: warnings, optimisation and sanitizers as INTERFACE targets, and the
+# helpers that turn one folder into one static library and one test executable.
+
+add_library(ox_warnings INTERFACE)
+target_compile_options(ox_warnings INTERFACE -Wall -Wextra -Wpedantic -Wshadow=local
+    -Wno-unused-parameter -Wnon-virtual-dtor)
+
+add_library(ox_opt INTERFACE)
+target_compile_options(ox_opt INTERFACE $<$<CONFIG:Release>:-O2> -fno-fast-math -g1)
+
+if(OX_SANITIZE STREQUAL "address")
+    target_compile_options(ox_opt INTERFACE -fsanitize=address,undefined -fno-omit-frame-pointer
+        -fno-sanitize-recover=undefined)
+    target_link_options(ox_opt INTERFACE -fsanitize=address,undefined)
+elseif(OX_SANITIZE STREQUAL "thread")
+    target_compile_options(ox_opt INTERFACE -fsanitize=thread -fno-omit-frame-pointer)
+    target_link_options(ox_opt INTERFACE -fsanitize=thread)
+elseif(NOT OX_SANITIZE STREQUAL "")
+    message(FATAL_ERROR "OX_SANITIZE must be empty, address or thread")
+endif()
+
+# ox_library(<folder> [PUBLIC deps...] [PRIVATE deps...])
+# Builds every .cpp of the folder into the static library ox_<folder> (alias ox::<folder>).
+# Headers are included from the source root: #include "core/types.h".
+function(ox_library folder)
+    cmake_parse_arguments(ARG "" "" "PUBLIC;PRIVATE" ${ARGN})
+    file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp")
+    list(FILTER sources EXCLUDE REGEX ".*/main[^/]*\\.cpp$")
+    add_library(ox_${folder} STATIC ${sources})
+    add_library(ox::${folder} ALIAS ox_${folder})
+    target_include_directories(ox_${folder} PUBLIC "${PROJECT_SOURCE_DIR}")
+    target_link_libraries(ox_${folder} PUBLIC ox_opt ${ARG_PUBLIC} PRIVATE ox_warnings ${ARG_PRIVATE})
+endfunction()
+
+# ox_test(<folder> [deps...]): one GoogleTest executable of every *_test.cpp in the folder.
+function(ox_test folder)
+    file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*_test.cpp")
+    if(NOT sources)
+        return()
+    endif()
+    add_executable(${folder}_tests ${sources})
+    target_link_libraries(${folder}_tests PRIVATE ox_warnings ${ARGN} GTest::gtest GTest::gtest_main)
+    target_compile_definitions(${folder}_tests PRIVATE
+        OX_TEST_DATA_DIR="${PROJECT_SOURCE_DIR}/tests/data"
+        OX_BINARY_DIR="${PROJECT_BINARY_DIR}")
+    include(GoogleTest)
+    gtest_discover_tests(${folder}_tests DISCOVERY_TIMEOUT 60
+        PROPERTIES ENVIRONMENT "OX_BINARY_DIR=${PROJECT_BINARY_DIR}")
+endfunction()
