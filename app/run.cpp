@@ -1,1 +1,0 @@
-// The run sequence lives here.
