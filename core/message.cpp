@@ -52,14 +52,22 @@ void dispatch(uint32_t type, const char *text) {
 
 const char *messagePrefix(uint32_t type) {
     switch (type) {
-        case kMsgDebug: return "[DEBUG]    ";
-        case kMsgVerbose: return "[VERBOSE]  ";
-        case kMsgProgress: return "[PROGRESS] ";
-        case kMsgWarning: return "[WARNING]  ";
-        case kMsgInfo: return "[INFO]     ";
-        case kMsgBench: return "[BENCH]    ";
-        case kMsgError: return "[ERROR]    ";
-        default: return "[UNKNOWN]  ";
+        case kMsgDebug:
+            return "[DEBUG]    ";
+        case kMsgVerbose:
+            return "[VERBOSE]  ";
+        case kMsgProgress:
+            return "[PROGRESS] ";
+        case kMsgWarning:
+            return "[WARNING]  ";
+        case kMsgInfo:
+            return "[INFO]     ";
+        case kMsgBench:
+            return "[BENCH]    ";
+        case kMsgError:
+            return "[ERROR]    ";
+        default:
+            return "[UNKNOWN]  ";
     }
 }
 
@@ -108,10 +116,36 @@ bool setDebugFile(const std::string &name) {
     l.debugFileName = name;
     if (name.empty()) return true;
     FILE *f = std::fopen(name.c_str(), "a");
-    if (!f) return false;
+    if (!f) {
+        // A file that cannot be opened is forgotten, so later messages do not retry it.
+        l.debugFileName.clear();
+        return false;
+    }
     std::fputs(kDebugBanner, f);
     std::fclose(f);
     return true;
+}
+
+void consoleLine(const std::string &text) {
+    std::string line = text;
+    line += '\n';
+    std::fwrite(line.data(), 1, line.size(), stdout);
+    std::fflush(stdout);
+}
+
+bool applyOutputVerbosity(const OutputVerbosityFlags &flags, const std::string &outputDirectory) {
+    setTypeEnabled(kMsgError, flags.errorPrint);
+    setTypeEnabled(kMsgWarning, flags.warningPrint);
+    setTypeEnabled(kMsgDebug, flags.debugPrint);
+    setTypeEnabled(kMsgVerbose, flags.verbosePrint);
+    setTypeEnabled(kMsgProgress, flags.progressPrint);
+    setTypeEnabled(kMsgBench, flags.benchmarkPrint);
+    setTypeEnabled(kMsgInfo, flags.infoPrint);
+    if (!flags.debugFile) return true;
+    const std::string name = outputDirectory + "debug.out";
+    if (setDebugFile(name)) return true;
+    message(kMsgWarning, 6, "Unable to open the debug file %s", name.c_str());
+    return false;
 }
 
 std::string debugFile() {

@@ -45,4 +45,27 @@ bool setDebugFile(const std::string &name);
 /// The current debug file name (empty = none).
 std::string debugFile();
 
+/// Writes one line to standard output as it stands: no prefix, no filter, no debug file. Used
+/// for the command line's syntax lines, which are printed before any filter exists.
+void consoleLine(const std::string &text);
+
+/// The switches of the OutputVerbosity settings, one per message type, plus the debug file flag.
+/// The defaults are those of a new process.
+struct OutputVerbosityFlags {
+    bool errorPrint = true;       ///< messages of type kMsgError
+    bool warningPrint = true;     ///< messages of type kMsgWarning
+    bool debugPrint = false;      ///< messages of type kMsgDebug
+    bool verbosePrint = false;    ///< messages of type kMsgVerbose
+    bool progressPrint = true;    ///< messages of type kMsgProgress
+    bool benchmarkPrint = false;  ///< messages of type kMsgBench
+    bool infoPrint = true;        ///< messages of type kMsgInfo
+    bool debugFile = false;       ///< also append every message to "debug.out"
+};
+
+/// Switches the seven types on or off (error, warning, debug, verbose, progress, benchmark, info,
+/// in that order); with debugFile, copies messages to outputDirectory + "debug.out" from now on.
+/// outputDirectory is used as given (it ends in "/" or is empty). Returns false only when the
+/// debug file cannot be opened (reported as a warning).
+bool applyOutputVerbosity(const OutputVerbosityFlags &flags, const std::string &outputDirectory);
+
 }  // namespace ox

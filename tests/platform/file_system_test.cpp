@@ -1,0 +1,158 @@
+#include "platform/file_system.h"
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "core/message.h"
+#include "platform/system.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+
+class FileSystemTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        dir_ = fs::temp_directory_path() /
+               ("ox_fs_test_" + std::to_string(::getpid()) + "_" +
+                ::testing::UnitTest::GetInstance()->current_test_info()->name());
+        fs::remove_all(dir_);
+        fs::create_directories(dir_);
+    }
+    void TearDown() override { fs::remove_all(dir_); }
+    std::string path(const std::string &name) const { return (dir_ / name).string(); }
+    std::vector<std::string> entries() const {
+        std::vector<std::string> out;
+        for (const auto &e : fs::directory_iterator(dir_)) out.push_back(e.path().filename());
+        return out;
+    }
+    static std::string read(const std::string &p) {
+        std::ifstream in(p, std::ios::binary);
+        std::stringstream s;
+        s << in.rdbuf();
+        return s.str();
+    }
+    fs::path dir_;
+};
+
+using ox::FileSystemUtilities;
+
+TEST_F(FileSystemTest, CreatesEveryMissingLevel) {
+    EXPECT_TRUE(FileSystemUtilities::createDirectories(path("a/b/c/")));
+    EXPECT_TRUE(fs::is_directory(path("a/b/c")));
+    EXPECT_TRUE(FileSystemUtilities::createDirectories(path("a/b/c")));  // already there
+    EXPECT_TRUE(FileSystemUtilities::createDirectories(path("a//d/./e")));
+    EXPECT_TRUE(fs::is_directory(path("a/d/e")));
+    std::ofstream(path("file")) << "x";
+    EXPECT_FALSE(FileSystemUtilities::createDirectories(path("file/sub")));
+    EXPECT_EQ(FileSystemUtilities::lastError(), ENOTDIR);
+    EXPECT_FALSE(FileSystemUtilities::createDirectories(""));
+}
+
+TEST_F(FileSystemTest, CanReadOnlyReadableFiles) {
+    std::ofstream(path("there")) << "x";
+    EXPECT_TRUE(FileSystemUtilities::canRead(path("there")));
+    EXPECT_FALSE(FileSystemUtilities::canRead(path("missing")));
+    EXPECT_EQ(FileSystemUtilities::lastError(), ENOENT);
+    EXPECT_FALSE(FileSystemUtilities::canRead(dir_.string()));
+    EXPECT_EQ(FileSystemUtilities::lastError(), EISDIR);
+    EXPECT_FALSE(FileSystemUtilities::canRead(""));
+
+    std::string text;
+    EXPECT_TRUE(FileSystemUtilities::readFile(path("there"), text));
+    EXPECT_EQ(text, "x");
+    std::ofstream(path("big")) << std::string(100, 'y');
+    EXPECT_FALSE(FileSystemUtilities::readFile(path("big"), text, 99));
+    EXPECT_EQ(FileSystemUtilities::lastError(), EFBIG);
+    EXPECT_TRUE(text.empty());
+}
+
+TEST_F(FileSystemTest, OpenModes) {
+    {
+        auto f = FileSystemUtilities::open(path("log"), ox::FileAccess::kWrite, false);
+        ASSERT_TRUE(f);
+        std::fputs("one\n", f.get());
+    }
+    {
+        auto f = FileSystemUtilities::open(path("log"), ox::FileAccess::kAppend);
+        std::fputs("two\n", f.get());
+    }
+    EXPECT_EQ(read(path("log")), "one\ntwo\n");
+    EXPECT_FALSE(FileSystemUtilities::open(path("none/x"), ox::FileAccess::kRead));
+    EXPECT_EQ(FileSystemUtilities::lastError(), ENOENT);
+}
+
+TEST_F(FileSystemTest, AtomicWritesReplaceWholeOrNothing) {
+    const std::string target = path("out.txt");
+    std::ofstream(target) << "old";
+    EXPECT_FALSE(ox::writeFileAtomically(target, [](std::FILE *f) {
+        std::fputs("half", f);
+        return false;
+    }));
+    EXPECT_EQ(read(target), "old");
+    EXPECT_EQ(entries(), std::vector<std::string>{"out.txt"});  // no temporary left behind
+
+    EXPECT_TRUE(ox::writeFileAtomically(target, std::string("new contents")));
+    EXPECT_EQ(read(target), "new contents");
+    EXPECT_EQ(entries(), std::vector<std::string>{"out.txt"});
+
+    {
+        // Writers that want a name write to the temporary name, which appears only on commit.
+        ox::AtomicFile file(path("image.tga"));
+        const std::string temp = file.tempPath();
+        ASSERT_FALSE(temp.empty());
+        EXPECT_EQ(ox::FileSystemUtilities::directoryOf(temp), dir_.string() + "/");
+        std::ofstream(temp) << "pixels";
+        EXPECT_FALSE(fs::exists(path("image.tga")));
+        EXPECT_TRUE(file.commit());
+    }
+    EXPECT_EQ(read(path("image.tga")), "pixels");
+    {
+        ox::AtomicFile abandoned(path("never.bin"));
+        std::fputs("data", abandoned.file());
+    }
+    EXPECT_FALSE(fs::exists(path("never.bin")));
+    EXPECT_EQ(entries().size(), 2u);
+
+    EXPECT_FALSE(ox::writeFileAtomically(path("nodir/x.txt"), std::string("x")));
+    EXPECT_EQ(FileSystemUtilities::lastError(), ENOENT);
+    EXPECT_FALSE(ox::writeFileAtomically(dir_.string() + "/", std::string("x")));
+}
+
+TEST(System, ProcessorsPriorityAndDenormals) {
+    EXPECT_GE(ox::processorCount(), 1);
+    // Priority changes stick to the process, so they are tried in a child.
+    const pid_t child = ::fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        ox::setTypeEnabled(ox::kMsgWarning, false);
+        // A process already below nice 10 cannot come back up without privileges.
+        if (ox::processNiceValue() > 10) ::_exit(0);
+        const bool low = ox::setProcessPriority(ox::kPriorityLow);
+        const int lowNice = ox::processNiceValue();
+        ox::setProcessPriority(ox::kPriorityHigh);  // may be refused: only a warning
+        const bool unknown = ox::setProcessPriority(7);
+        ::_exit(low && lowNice >= 10 && !unknown ? 0 : 1);
+    }
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+
+    ox::setFlushDenormalsToZero();
+#if defined(__x86_64__) || defined(__aarch64__)
+    EXPECT_TRUE(ox::flushDenormalsToZero());
+    volatile float tiny = 1e-38f;
+    volatile float smaller = tiny * 1e-3f;
+    EXPECT_EQ(smaller, 0.0f);
+#endif
+}
+
+}  // namespace
