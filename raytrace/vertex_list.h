@@ -36,7 +36,7 @@ public:
     /// Number of UV sets (equal to the number of tangent and of bitangent sets).
     uint32_t uvSetCount() const { return static_cast<uint32_t>(uv_.size()); }
     /// True when every vertex carries a colour.
-    bool hasColors() const { return !colors_.empty(); }
+    bool hasColors() const { return colorsOn_; }
 
     /// Position of vertex i.
     Vec3 position(uint32_t i) const { return {x_[i], y_[i], z_[i]}; }
@@ -68,6 +68,21 @@ public:
     Vec3 *tangentData(uint32_t k) { return tangents_[k].data(); }
     Vec3 *bitangentData(uint32_t k) { return bitangents_[k].data(); }
 
+    /// Reserves room for count vertices in every array.
+    void reserve(uint32_t count);
+    /// Appends one vertex: uvs holds uvSetCount() pairs; colour is used only when the list
+    /// has colours; the tangent and bitangent go to set 0 (the other sets get zero).
+    uint32_t append(const Vec3 &p, const Vec3 &n, const Color &color, const Vec2 *uvs,
+                    const Vec3 &tangent, const Vec3 &bitangent);
+    /// Appends a copy of vertex i and returns its index.
+    uint32_t appendCopy(uint32_t i);
+    /// Keeps only the vertices listed (strictly increasing old indices), in that order.
+    void keep(const std::vector<uint32_t> &order);
+    /// Copies tangent and bitangent set 0 into every other set.
+    void copyFirstFrameToAllSets();
+    /// Releases unused capacity.
+    void shrinkToFit();
+
     /// Names of the UV sets, in set order (may be shorter than uvSetCount() for unnamed sets).
     const std::vector<std::string> &uvSetNames() const { return uvSetNames_; }
     void setUvSetNames(std::vector<std::string> names) { uvSetNames_ = std::move(names); }
@@ -85,6 +100,7 @@ private:
     std::vector<std::vector<Vec3>> tangents_;
     std::vector<std::vector<Vec3>> bitangents_;
     std::vector<std::string> uvSetNames_;
+    bool colorsOn_ = false;
 };
 
 }  // namespace ox

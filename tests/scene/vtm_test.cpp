@@ -1,0 +1,252 @@
+#include "scene/vtm.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+
+#include "scene_test_util.h"
+
+namespace ox {
+namespace {
+
+using test::MeshMaker;
+using test::TempDir;
+
+// Appends little-endian values the way the file layout lists them.
+struct Bytes {
+    std::vector<unsigned char> b;
+    Bytes &str(const std::string &s) {
+        b.insert(b.end(), s.begin(), s.end());
+        b.push_back(0);
+        return *this;
+    }
+    Bytes &u32(uint32_t v) {
+        unsigned char x[4];
+        std::memcpy(x, &v, 4);
+        b.insert(b.end(), x, x + 4);
+        return *this;
+    }
+    Bytes &f32(float v) {
+        uint32_t u;
+        std::memcpy(&u, &v, 4);
+        return u32(u);
+    }
+};
+
+// The header of a small valid file up to the box (version given, one UV set "map1", one group
+// of one triangle over three vertices).
+Bytes smallHeader(uint32_t version, uint32_t vertices = 3, uint32_t triangles = 1) {
+    Bytes h;
+    h.str("VTM").u32(version).str("tri").u32(vertices).u32(1).str("map1").u32(1).str("mat").u32(
+        triangles);
+    for (float f : {0.f, 0.f, 0.f, 1.f, 1.f, 0.f}) h.f32(f);
+    return h;
+}
+
+Bytes smallFile(uint32_t version) {
+    Bytes f = smallHeader(version);
+    if (version == 2) f.u32(0);
+    const float pos[3][2] = {{0, 0}, {1, 0}, {0, 1}};
+    for (auto &p : pos) {
+        for (float v : {p[0], p[1], 0.f, 0.f, 0.f, 1.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.f}) f.f32(v);
+        f.f32(p[0]).f32(p[1]);
+    }
+    f.u32(0).u32(1).u32(2);
+    return f;
+}
+
+TEST(Vtm, WriterEmitsTheExactLayout) {
+    TempDir dir;
+    MeshMaker m("tri", 1);
+    m.vertex({0, 0, 0});
+    m.vertex({1, 0, 0});
+    m.vertex({0, 1, 0});
+    m.group("mat", {0, 1, 2});
+    m.mesh.uvSetNames = {"map1"};
+    m.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(1, 1, 0));
+    for (uint32_t version : {1u, 2u}) {
+        std::string path = dir.file("v" + std::to_string(version) + ".vtm");
+        ASSERT_TRUE(vtm::writeTempMesh(path, m.mesh, version));
+        EXPECT_EQ(test::readBytes(path), smallFile(version).b) << "version " << version;
+    }
+    // Version 2 with colours: 16 floats, then the UV pair, and the flag set.
+    MeshMaker c("c", 0, true);
+    c.vertex({1, 2, 3}, {0, 0, 1}, {}, {}, Color(0.1f, 0.2f, 0.3f, 0.4f));
+    std::string path = dir.file("c.vtm");
+    c.mesh.groups.push_back({"m", 0});
+    ASSERT_TRUE(vtm::writeTempMesh(path, c.mesh, 2));
+    Bytes want;
+    want.str("VTM").u32(2).str("c").u32(1).u32(0).u32(1).str("m").u32(0);
+    for (float f : {1.f, 2.f, 3.f, 1.f, 2.f, 3.f}) want.f32(f);
+    want.u32(1);
+    for (float f : {1.f, 2.f, 3.f, 0.f, 0.f, 1.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.1f, 0.2f, 0.3f,
+                    0.4f})
+        want.f32(f);
+    EXPECT_EQ(test::readBytes(path), want.b);
+}
+
+TEST(Vtm, RoundTripsBothVersionsColoursAndUvSets) {
+    TempDir dir;
+    for (uint32_t version : {1u, 2u})
+        for (bool colors : {false, true})
+            for (uint32_t sets = 0; sets <= 3; ++sets) {
+                MeshMaker m("shape_" + std::to_string(sets), sets, colors);
+                for (int i = 0; i < 5; ++i) {
+                    std::vector<Vec2> uv;
+                    for (uint32_t k = 0; k < sets; ++k) uv.push_back({i * 0.1f + k, -float(k)});
+                    m.vertex({float(i), float(i * i), -1.5f}, {0, 1, 0}, {1, 0, 0}, {0, 0, 1},
+                             Color(i * 0.25f, 1, 0.5f, 1), uv);
+                }
+                m.group("a", {0, 1, 2, 1, 3, 4});
+                m.group("b", {});
+                m.group("c", {2, 3, 4});
+                std::string path = dir.file("m.vtm");
+                std::string err;
+                ASSERT_TRUE(vtm::writeTempMesh(path, m.mesh, version, &err)) << err;
+                vtm::TempMesh back;
+                ASSERT_TRUE(vtm::readTempMesh(path, back, &err)) << err;
+                vtm::TempMesh want = m.mesh;
+                if (version == 1 && colors) {
+                    // Version 1 cannot carry colours: the writer drops them.
+                    want.colors = false;
+                    std::vector<float> v;
+                    for (size_t i = 0; i < want.vertices.size(); i += 16)
+                        v.insert(v.end(), want.vertices.begin() + i,
+                                 want.vertices.begin() + i + 12);
+                    want.vertices = v;
+                }
+                EXPECT_EQ(back.name, want.name);
+                EXPECT_EQ(back.uvSetNames, want.uvSetNames);
+                EXPECT_EQ(back.groups, want.groups);
+                EXPECT_EQ(back.bounds, want.bounds);
+                EXPECT_EQ(back.colors, want.colors);
+                EXPECT_EQ(back.vertices, want.vertices);
+                EXPECT_EQ(back.uvs, want.uvs);
+                EXPECT_EQ(back.indices, want.indices);
+            }
+}
+
+TEST(Vtm, WriterLeavesNothingBehindUntilCommitted) {
+    TempDir dir;
+    std::string path = dir.file("half.vtm");
+    test::writeBytes(path, {'o', 'l', 'd'});
+    {
+        auto w = vtm::createWriter(path, 2);
+        ASSERT_TRUE(w);
+        w->setShapeName("x");
+        ASSERT_TRUE(w->writeHeader());
+        // Dropped without commit: the old file stays and no temporary file is left.
+    }
+    EXPECT_EQ(test::readBytes(path), std::vector<unsigned char>({'o', 'l', 'd'}));
+    EXPECT_EQ(std::system(("test $(ls '" + dir.path() + "' | wc -l) -eq 1").c_str()), 0);
+    EXPECT_FALSE(vtm::createWriter(path, 3));
+    EXPECT_FALSE(vtm::createWriter(dir.file("no/such/dir.vtm"), 1));
+    // A name longer than the reader accepts is refused by the writer too.
+    MeshMaker m(std::string(5000, 'n'), 0);
+    std::string err;
+    EXPECT_FALSE(vtm::writeTempMesh(dir.file("long.vtm"), m.mesh, 1, &err));
+}
+
+// Opens a byte string as a mesh file and returns the status.
+vtm::OpenStatus openBytes(const TempDir &dir, const std::vector<unsigned char> &bytes,
+                          std::string *why = nullptr) {
+    std::string path = dir.file("h.vtm");
+    test::writeBytes(path, bytes);
+    vtm::OpenStatus status = vtm::OpenStatus::kOk;
+    auto r = vtm::TempMeshReaderFactory::instance().open(path, &status, why);
+    EXPECT_EQ(r != nullptr, status == vtm::OpenStatus::kOk);
+    return status;
+}
+
+TEST(Vtm, HostileHeadersFailCleanly) {
+    TempDir dir;
+    using S = vtm::OpenStatus;
+    EXPECT_EQ(openBytes(dir, smallFile(1).b), S::kOk);
+    EXPECT_EQ(openBytes(dir, smallFile(2).b), S::kOk);
+    EXPECT_EQ(vtm::TempMeshReaderFactory::instance().open(dir.file("missing.vtm")), nullptr);
+
+    // A fourth letter before the 0 byte, a lower-case magic, version 0 and 3.
+    auto f = smallFile(1).b;
+    f[3] = 'X';
+    EXPECT_EQ(openBytes(dir, f), S::kBadMagic);
+    f = smallFile(1).b;
+    f[0] = 'v';
+    EXPECT_EQ(openBytes(dir, f), S::kBadMagic);
+    f = smallFile(1).b;
+    f[4] = 3;
+    EXPECT_EQ(openBytes(dir, f), S::kBadVersion);
+    f[4] = 0;
+    EXPECT_EQ(openBytes(dir, f), S::kBadVersion);
+
+    // Truncation at every offset of a small file of either version fails, never crashes.
+    for (uint32_t version : {1u, 2u}) {
+        auto full = smallFile(version).b;
+        for (size_t n = 0; n < full.size(); ++n) {
+            std::vector<unsigned char> cut(full.begin(), full.begin() + n);
+            EXPECT_NE(openBytes(dir, cut), S::kOk) << "version " << version << " cut at " << n;
+        }
+    }
+
+    // A name without terminator, and one longer than 4096 bytes.
+    Bytes noTerm;
+    noTerm.str("VTM").u32(1);
+    noTerm.b.insert(noTerm.b.end(), 100, 'a');
+    std::string why;
+    EXPECT_EQ(openBytes(dir, noTerm.b, &why), S::kBadHeader);
+    EXPECT_EQ(why, "string without terminator");
+    Bytes longName;
+    longName.str("VTM").u32(1).str(std::string(5000, 'a'));
+    EXPECT_EQ(openBytes(dir, longName.b, &why), S::kBadHeader);
+    EXPECT_EQ(why, "string longer than 4096 bytes");
+
+    // Huge counts: more vertices, UV sets, groups or triangles than the file can hold.
+    Bytes hugeV = smallHeader(1, 0xFFFFFFFFu);
+    EXPECT_EQ(openBytes(dir, hugeV.b, &why), S::kBadHeader);
+    EXPECT_NE(why.find("shorter than its header"), std::string::npos);
+    Bytes hugeT = smallHeader(2, 3, 0xFFFFFFFFu);
+    hugeT.u32(0);
+    EXPECT_EQ(openBytes(dir, hugeT.b), S::kBadHeader);
+    Bytes hugeU;
+    hugeU.str("VTM").u32(1).str("s").u32(3).u32(0xFFFFFFFFu).str("a");
+    EXPECT_EQ(openBytes(dir, hugeU.b, &why), S::kBadHeader);
+    EXPECT_EQ(why, "UV-set count larger than the file");
+    Bytes hugeG;
+    hugeG.str("VTM").u32(1).str("s").u32(3).u32(0).u32(0x40000000u).str("m").u32(1);
+    EXPECT_EQ(openBytes(dir, hugeG.b, &why), S::kBadHeader);
+    EXPECT_EQ(why, "material-group count larger than the file");
+    // Many groups of 2^32-1 triangles: the total must not wrap around.
+    Bytes manyG;
+    manyG.str("VTM").u32(1).str("s").u32(0).u32(0).u32(3);
+    for (int i = 0; i < 3; ++i) manyG.str("m").u32(0xFFFFFFFFu);
+    for (float v : {0.f, 0.f, 0.f, 1.f, 1.f, 1.f}) manyG.f32(v);
+    EXPECT_EQ(openBytes(dir, manyG.b), S::kBadHeader);
+
+    // Non-finite and inverted boxes.
+    for (float bad : {std::nanf(""), INFINITY, -2.0f}) {
+        Bytes b;
+        b.str("VTM").u32(1).str("tri").u32(3).u32(1).str("map1").u32(1).str("mat").u32(1);
+        for (float v : {0.f, 0.f, 0.f, 1.f, bad, 0.f}) b.f32(v);
+        auto body = smallFile(1).b;
+        size_t headerSize = smallHeader(1).b.size();
+        b.b.insert(b.b.end(), body.begin() + long(headerSize), body.end());
+        EXPECT_EQ(openBytes(dir, b.b, &why), S::kBadHeader) << bad;
+        EXPECT_EQ(why, "bounding box is not finite or inverted");
+    }
+    // The empty box is the honest box of a mesh without triangles.
+    Bytes empty;
+    empty.str("VTM").u32(1).str("e").u32(0).u32(0).u32(0);
+    for (float v : {3.4028235e38f, 3.4028235e38f, 3.4028235e38f, -3.4028235e38f, -3.4028235e38f,
+                    -3.4028235e38f})
+        empty.f32(v);
+    EXPECT_EQ(openBytes(dir, empty.b), S::kOk);
+
+    // Bytes after the last triangle: a warning, and the file still opens.
+    auto longer = smallFile(2).b;
+    longer.push_back(7);
+    std::string out = test::captureMessages([&] { EXPECT_EQ(openBytes(dir, longer), S::kOk); });
+    EXPECT_NE(out.find("has 1 bytes after its last triangle"), std::string::npos) << out;
+}
+
+}  // namespace
+}  // namespace ox
