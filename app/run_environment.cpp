@@ -1,0 +1,15 @@
+#include "app/run.h"
+#include "platform/system.h"
+
+namespace ox {
+
+RunEnvironment defaultRunEnvironment() {
+    RunEnvironment env;
+    // The configuration, the input-list reader and the drivers plug in here as they arrive.
+    env.makeSettings = [] { return std::make_unique<DefaultRunSettings>(); };
+    env.loadInputList = loadNoInputList;
+    env.processorCount = [] { return processorCount(); };
+    return env;
+}
+
+}  // namespace ox
