@@ -1,0 +1,190 @@
+#include "app/command_line.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <map>
+
+namespace {
+
+using Args = std::vector<std::string>;
+
+struct Parsed {
+    bool ok;
+    std::string out;
+    ox::CommandLineOptions options;
+};
+
+Parsed parse(Args args, const ox::InputListLoader &loader = ox::loadNoInputList) {
+    args.insert(args.begin(), "thevorn");
+    Parsed p;
+    testing::internal::CaptureStdout();
+    p.ok = ox::parseCommandLine(args, loader, p.options);
+    p.out = testing::internal::GetCapturedStdout();
+    return p;
+}
+
+TEST(CommandLine, DefaultsAndPlainArguments) {
+    Parsed p = parse({"scene.xml", "", "-o", "", "-x", "c.xml"});
+    ASSERT_TRUE(p.ok) << p.out;
+    EXPECT_EQ(p.out, "");
+    const ox::CommandLineOptions &o = p.options;
+    EXPECT_EQ(o.inputFiles, (Args{"scene.xml", ""}));  // an empty argument is an input file
+    EXPECT_EQ(o.outputFile, "");
+    EXPECT_EQ(o.configFiles, Args{"c.xml"});
+    EXPECT_EQ(o.action, ox::kActionNone);
+    EXPECT_EQ(o.fileFormat, ox::kFormatNone);
+    EXPECT_TRUE(o.showDisplay);
+    EXPECT_FALSE(o.quitWhenDone);
+    EXPECT_EQ(o.renderThreads, -1);
+    EXPECT_EQ(o.priority, ox::kCommandPriorityNone);
+
+    p = parse({"s.xml", "-b", "-me", "-d", "-q", "-cs", "-pat", "x", "-p", "l", "-rt", "12abc"});
+    ASSERT_TRUE(p.ok) << p.out;
+    EXPECT_EQ(p.options.action, ox::kActionTextureBake);
+    EXPECT_EQ(p.options.fileFormat, ox::kFormatExrMultiLayer);
+    EXPECT_FALSE(p.options.showDisplay);
+    EXPECT_TRUE(p.options.quitWhenDone);
+    EXPECT_TRUE(p.options.crashSilently);
+    EXPECT_EQ(p.options.patArgument, "x");
+    EXPECT_EQ(p.options.priority, ox::kCommandPriorityLow);
+    EXPECT_EQ(p.options.renderThreads, 12);  // stream extraction stops at the letters
+}
+
+TEST(CommandLine, EverySyntaxMessage) {
+    const std::vector<std::pair<std::string, Args>> cases = {
+        {"Syntax error, -x needs argument.", {"s.xml", "-x"}},
+        {"Syntax error, -x needs argument.", {"s.xml", "-x", "-r"}},
+        {"Syntax error, more than one output file specified", {"s", "-o", "a", "-o"}},
+        {"Syntax error, -o needs argument.", {"s", "-o"}},
+        {"Syntax error, more than one output directory specified", {"s", "-od", "a", "-od"}},
+        {"Syntax error, -od needs argument.", {"s", "-od", ""}},
+        {"Syntax error, -spl needs <num> argument.", {"-spl", "0"}},
+        {"Syntax error, -spl needs <num> argument.", {"-spl", "many"}},
+        {"Syntax error, -pat needs argument.", {"s", "-pat"}},
+        {"Syntax error, -p needs argument.", {"s", "-p"}},
+        {"Syntax error, -i needs argument.", {"s", "-i"}},
+        {"Syntax error, -pi needs argument.", {"s", "-pi"}},
+        {"Syntax error, -ri needs argument.", {"s", "-ri"}},
+        {"Syntax error, -rt needs argument.", {"s", "-rt"}},
+        {"Syntax error, unknown option -R", {"s", "-R"}},
+        {"Syntax error, unknown option -", {"s", "-"}},
+        {"Syntax error, too many actions specified.", {"-c", "-xs"}},
+        {"Syntax error, too many file formats specified.", {"s", "-t", "-j"}},
+        {"Syntax error, -rm needs at least one image to merge.", {"s", "-rm", "target"}},
+        {"Syntax error, -im needs at least one image to merge.", {"s", "-im"}},
+        {"Syntax error, -pm needs at least one pointcloud to merge.", {"-pm"}},
+        {"Syntax error, -pmpt needs at least one pointcloud to merge.", {"-pmpt", "1", "2"}},
+        {"Syntax error, the chosen command requires a scene but no input filename was "
+         "specified.",
+         {}},
+        {"Syntax error, the chosen command requires a scene but no input filename was "
+         "specified.",
+         {"-b", "-x", "c.xml"}},
+    };
+    for (const auto &[message, args] : cases) {
+        const Parsed p = parse(args);
+        EXPECT_FALSE(p.ok) << message;
+        EXPECT_EQ(p.out, message + "\n");
+    }
+    // Two configuration files fail without a line of their own.
+    const Parsed two = parse({"s", "-x", "a.xml", "b.xml"});
+    EXPECT_FALSE(two.ok);
+    EXPECT_EQ(two.out, "");
+}
+
+TEST(CommandLine, LinesThatLetParsingGoOn) {
+    Parsed p = parse({"s", "-p", "h", "-p", "x", "-rt", "abc"});
+    ASSERT_TRUE(p.ok);
+    EXPECT_EQ(p.out,
+              "Syntax error, x is not a valid priority (h, l or n).\n"
+              "Syntax error, abc is not a valid input to -rt\n");
+    EXPECT_EQ(p.options.priority, ox::kCommandPriorityHigh);
+    EXPECT_EQ(p.options.renderThreads, -1);
+}
+
+TEST(CommandLine, OutputDirectoryAndMergeArguments) {
+    EXPECT_EQ(parse({"s", "-od", "out"}).options.outputDirectory, "out/");
+    EXPECT_EQ(parse({"s", "-od", "out/"}).options.outputDirectory, "out/");
+    EXPECT_EQ(parse({"s", "-od", "out\\"}).options.outputDirectory, "out\\");
+
+    Parsed p = parse({"-pmpt", "0.5", "2", "a.pc", "b.pc", "-o", "m"});
+    ASSERT_TRUE(p.ok) << p.out;
+    EXPECT_EQ(p.options.action, ox::kActionPathTracerMerge);
+    EXPECT_FLOAT_EQ(p.options.mergeParam1, 0.5f);
+    EXPECT_FLOAT_EQ(p.options.mergeParam2, 2.0f);
+    EXPECT_EQ(p.options.pointCloudInputs, (Args{"a.pc", "b.pc"}));
+
+    p = parse({"-pmb", "3", "a.pc"});
+    ASSERT_TRUE(p.ok);
+    EXPECT_EQ(p.options.action, ox::kActionPointCloudMergeB);
+    EXPECT_FLOAT_EQ(p.options.mergeParam1, 3.0f);
+
+    p = parse({"s.xml", "-rm", "wall", "a.exr", "b.exr", "-t"});
+    ASSERT_TRUE(p.ok) << p.out;
+    EXPECT_EQ(p.options.action, ox::kActionRegionMerge);
+    EXPECT_EQ(p.options.mergeTarget, "wall");
+    EXPECT_EQ(p.options.imageInputs, (Args{"a.exr", "b.exr"}));
+    EXPECT_EQ(p.options.inputFiles, Args{"s.xml"});
+
+    p = parse({"-spl", "4"});
+    ASSERT_TRUE(p.ok);
+    EXPECT_EQ(p.options.action, ox::kActionSplitConfig);
+    EXPECT_EQ(p.options.splitCount, 4);
+}
+
+TEST(CommandLine, InputListsAreExpandedAfterDirectArguments) {
+    std::vector<std::string> asked;
+    const ox::InputListLoader loader = [&](const std::string &file, std::vector<std::string> &out) {
+        asked.push_back(file);
+        if (file == "bad.xml") return false;
+        out.push_back(file + ":1");
+        out.push_back(file + ":2");
+        return true;
+    };
+    Parsed p = parse({"-i", "a.xml", "s.xml", "-i", "b.xml", "-ri", "r.xml", "-im", "t", "x.exr"},
+                     loader);
+    ASSERT_TRUE(p.ok) << p.out;
+    EXPECT_EQ(p.options.inputFiles, (Args{"s.xml", "a.xml:1", "a.xml:2", "b.xml:1", "b.xml:2"}));
+    EXPECT_EQ(p.options.imageInputs, (Args{"x.exr", "r.xml:1", "r.xml:2"}));
+    EXPECT_EQ(asked, (Args{"a.xml", "b.xml", "r.xml"}));
+
+    // A list alone satisfies the merge's need for inputs.
+    p = parse({"-pm", "-pi", "p.xml"}, loader);
+    ASSERT_TRUE(p.ok) << p.out;
+    EXPECT_EQ(p.options.pointCloudInputs, (Args{"p.xml:1", "p.xml:2"}));
+
+    const struct {
+        Args args;
+        std::string out;
+    } failures[] = {
+        {{"s", "-i", "bad.xml"},
+         "Unable to load input file list from file: bad.xml\nUnable to build list of input "
+         "files.\n"},
+        {{"-pm", "x", "-pi", "bad.xml"},
+         "Unable to load input file list from file: bad.xml\nUnable to build list of point "
+         "cloud input files.\n"},
+        {{"s", "-ri", "bad.xml"},
+         "Unable to load input file list from file: bad.xml\nUnable to build list of image "
+         "merge input files.\n"},
+    };
+    for (const auto &f : failures) {
+        p = parse(f.args, loader);
+        EXPECT_FALSE(p.ok);
+        EXPECT_EQ(p.out, f.out);
+    }
+    // Without a configuration reader every list fails.
+    p = parse({"s", "-i", "a.xml"});
+    EXPECT_FALSE(p.ok);
+}
+
+TEST(CommandLine, UsageTextShape) {
+    const std::string usage = ox::kUsageText;
+    EXPECT_EQ(usage.rfind("thevorn <scene.xml> -o <outfile> -x <configuration.xml>\n", 0), 0u);
+    EXPECT_NE(usage.find("\n-uvpack forces uv-packing\n\noutfile"), std::string::npos);
+    EXPECT_NE(usage.find("one image\n\n-i <file>"), std::string::npos);
+    EXPECT_EQ(usage.substr(usage.size() - 46), "    More than one -ri parameter is supported.\n");
+    EXPECT_EQ(std::count(usage.begin(), usage.end(), '\n'), 33);
+}
+
+}  // namespace

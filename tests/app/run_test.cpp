@@ -1,0 +1,315 @@
+#include "app/run.h"
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "app/exit_status.h"
+#include "core/message.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+
+/// Runs the tests of one case in a fresh temporary directory and returns to the old one.
+class RunTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        old_ = fs::current_path();
+        dir_ = fs::temp_directory_path() /
+               ("ox_run_test_" + std::to_string(::getpid()) + "_" +
+                ::testing::UnitTest::GetInstance()->current_test_info()->name());
+        fs::remove_all(dir_);
+        fs::create_directories(dir_);
+        fs::current_path(dir_);
+        ox::resetMessageFilters();
+    }
+    void TearDown() override {
+        ox::resetMessageFilters();
+        fs::current_path(old_);
+        fs::remove_all(dir_);
+    }
+    fs::path old_, dir_;
+};
+
+std::string readAll(const fs::path &p) {
+    std::ifstream in(p, std::ios::binary);
+    std::stringstream s;
+    s << in.rdbuf();
+    return s.str();
+}
+
+/// A driver that remembers what it was given.
+struct RecordingDriver : ox::RunDriverInterface {
+    int32_t run(int32_t action, ox::RunContext &c) override {
+        actions.push_back(action);
+        baseName = c.outputBaseName;
+        directory = c.outputDirectory;
+        format = c.format;
+        threads = c.renderThreads;
+        c.statistics.beginPass("beauty");
+        c.progress.setProgress(1.0f);
+        c.progress.finish();
+        return result;
+    }
+    std::vector<int32_t> actions;
+    std::string baseName, directory;
+    int32_t format = -1;
+    int64_t threads = -1;
+    int32_t result = 0;
+};
+
+TEST(ExitStatus, LowByteMapping) {
+    EXPECT_EQ(ox::processExitCode(0), 0);
+    EXPECT_EQ(ox::processExitCode(ox::kStatusFailure), 1);
+    const int listed[] = {2, 3, 4, 5, 7, 8, 9, 10, 12, 13};
+    for (int nn : listed) EXPECT_EQ(ox::processExitCode(0x20000000 + nn), nn);
+    EXPECT_EQ(ox::processExitCode(0x20000001), 1);
+    EXPECT_EQ(ox::processExitCode(0x20000006), 1);
+    EXPECT_EQ(ox::processExitCode(0x20000100), 1);
+    EXPECT_EQ(ox::processExitCode(ox::kStatusAborted), 199);
+    EXPECT_EQ(ox::processExitCode(ox::kStatusCrash), 139);
+    EXPECT_EQ(ox::processExitCode(ENOENT), ENOENT);
+    EXPECT_EQ(ox::processExitCode(EACCES), EACCES);
+    EXPECT_EQ(ox::processExitCode(256), 1);
+    EXPECT_EQ(ox::processExitCode(-5), 1);
+    EXPECT_EQ(ox::statusFromPlatformError(0), ox::kStatusFailure);
+    EXPECT_EQ(ox::statusFromPlatformError(EACCES), EACCES);
+}
+
+TEST(RunSteps, ActionsFromAndIntoRenderType) {
+    const int32_t fromType[] = {1, 2, 4, 3, 5, 16};
+    for (int32_t type = 0; type < 6; ++type) {
+        ox::DefaultRunSettings s;
+        s.renderTypeValue = type;
+        EXPECT_EQ(ox::resolveAction(ox::kActionNone, s), fromType[type]);
+        EXPECT_EQ(s.fgUseLegacy, type == 2 || type == 4 || type == 5);
+    }
+    const std::pair<int32_t, int32_t> intoType[] = {{1, 0}, {2, 1}, {3, 3}, {4, 2},
+                                                    {5, 4}, {16, 5}, {17, 3}, {19, 3}};
+    for (const auto &[action, type] : intoType) {
+        ox::DefaultRunSettings s;
+        s.renderTypeValue = 3;
+        EXPECT_EQ(ox::resolveAction(action, s), action);
+        EXPECT_EQ(s.renderTypeValue, type) << action;
+    }
+    ox::DefaultRunSettings bad;
+    bad.renderTypeValue = 9;
+    EXPECT_EQ(ox::resolveAction(ox::kActionNone, bad), ox::kActionNone);
+
+    EXPECT_EQ(ox::resolveFileFormat(ox::kFormatNone, 0), ox::kFormatTga);
+    EXPECT_EQ(ox::resolveFileFormat(ox::kFormatNone, 2), ox::kFormatExr);
+    EXPECT_EQ(ox::resolveFileFormat(ox::kFormatNone, 1), ox::kFormatExr);  // PPM
+    EXPECT_EQ(ox::resolveFileFormat(ox::kFormatNone, 7), ox::kFormatExrMultiLayer);
+    EXPECT_EQ(ox::resolveFileFormat(ox::kFormatJpeg, 7), ox::kFormatJpeg);
+}
+
+TEST(RunSteps, ThreadCountsAreClampedIn64Bits) {
+    ox::resetMessageFilters();
+    ox::DefaultRunSettings s;
+    s.autoThreadsSubtractValue = 10;
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 1);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[INFO]     Detected 8 cores, using 1 cores\n");
+    EXPECT_EQ(s.renderThreadsValue, 1);
+
+    s.autoThreadsSubtractValue = 4294967295LL;  // the largest unsigned setting
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 1);
+    testing::internal::GetCapturedStdout();
+
+    s.autoThreadsValue = false;
+    s.renderThreadsValue = 6;
+    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 6);
+    s.renderThreadsValue = 0;
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 1);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[WARNING]  The render thread count 0 is outside 1 to 1024, using 1\n");
+    s.autoThreadsValue = true;  // -rt wins over autoThreads
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::resolveRenderThreads(5000000000LL, s, 8), 1024);
+    EXPECT_EQ(ox::resolveRenderThreads(3, s, 8), 3);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[WARNING]  The render thread count 5000000000 is outside 1 to 1024, using 1024\n");
+    EXPECT_EQ(s.renderThreadsValue, 3);
+}
+
+TEST_F(RunTest, OutputTreeAndCachePrefixes) {
+    ox::DefaultRunSettings s;
+    s.setCacheFile(ox::CacheFile::kFinalGather, "fg.pc");
+    s.setCacheFile(ox::CacheFile::kCausticsPhotonMap, "c.pm");
+    s.setCacheFile(ox::CacheFile::kOcclusionMap, "o.occ");
+    EXPECT_EQ(ox::prepareOutputTree("deep/out/", s), 0);
+    for (const char *d : {"deep/out/GI/fgMaps", "deep/out/GI/ptMaps", "deep/out/GI/photonMaps",
+                          "deep/out/GI/occMaps"})
+        EXPECT_TRUE(fs::is_directory(d)) << d;
+    EXPECT_EQ(s.cacheFile(ox::CacheFile::kFinalGather), "deep/out/GI/fgMaps/fg.pc");
+    EXPECT_EQ(s.cacheFile(ox::CacheFile::kCausticsPhotonMap), "deep/out/GI/photonMaps/c.pm");
+    EXPECT_EQ(s.cacheFile(ox::CacheFile::kOcclusionMap), "deep/out/GI/occMaps/o.occ");
+    EXPECT_EQ(s.cacheFile(ox::CacheFile::kPathTracer), "");
+
+    std::ofstream("blocker") << "x";
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::prepareOutputTree("blocker/", s), ENOTDIR);
+    EXPECT_NE(testing::internal::GetCapturedStdout().find("[ERROR]    Unable to create"),
+              std::string::npos);
+}
+
+TEST_F(RunTest, InputChecks) {
+    ox::DefaultRunSettings s;
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), 0);
+
+    s.inputCheck.vertexBakeLightPasses = 1;
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::checkInputs(ox::kActionVertexBake, s), ox::kStatusUnsupported);
+    EXPECT_EQ(ox::checkInputs(ox::kActionVertexTransfer, s), 0);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[ERROR]    Light passes are not supported together with vertex bakes. Use vertex "
+              "transfer instead!\n");
+    s.inputCheck.vertexBakeLightPasses = 0;
+
+    s.renderTypeValue = 1;
+    s.inputCheck.firstTextureBakeTarget = ox::TargetSize{"wall", 512, 0};
+    s.inputCheck.firstSurfaceTransferTarget = ox::TargetSize{"hi", 0, 0};
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::checkInputs(ox::kActionTextureBake, s), ox::kStatusZeroDimension);
+    s.renderTypeValue = 3;
+    EXPECT_EQ(ox::checkInputs(ox::kActionSurfaceTransfer, s), ox::kStatusZeroDimension);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[ERROR]    BakeTextureTarget 'wall' with invalid dimension 512x0.\n\n"
+              "[ERROR]    SurfaceTransferTexture 'hi' with invalid dimension 0x0.\n\n");
+    s.renderTypeValue = 0;
+
+    // The final-gather irradiance cache is looked for with its suffix, only when it is read.
+    s.setCacheFile(ox::CacheFile::kFinalGather, "fg");
+    s.inputCheck.enableGI = true;
+    s.inputCheck.secondaryIntegrator = ox::kIntegratorFinalGather;
+    s.inputCheck.finalGatherCacheKind = 1;
+    s.inputCheck.finalGatherCacheMode = 1;  // computes, reads nothing
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), 0);
+    s.inputCheck.finalGatherCacheMode = 2;
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), ENOENT);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[ERROR]    Unable to read fg irradiance file 'fg.irradiance'.\n");
+    std::ofstream("fg.irradiance") << "x";
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), 0);
+    s.inputCheck.enableGI = false;
+
+    // The first missing file of the table is the one reported.
+    s.inputCheck.imageBasedEnvironment = true;
+    s.inputCheck.environmentImageFile = "sky.hdr";
+    s.inputCheck.causticsPhotonMapMode = 3;
+    s.setCacheFile(ox::CacheFile::kCausticsPhotonMap, "caustics.pm");
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), ENOENT);
+    s.inputCheck.imageBasedEnvironment = false;
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), ENOENT);
+    s.inputCheck.causticsPhotonMapMode = 0;
+    s.inputCheck.textureBakeUsesLua = true;
+    s.inputCheck.textureBakeLuaFile = ".";  // a directory cannot be read as a file
+    EXPECT_EQ(ox::checkInputs(ox::kActionRender, s), 0);
+    EXPECT_EQ(ox::checkInputs(ox::kActionSurfaceTransfer, s), EISDIR);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[ERROR]    Unable to read ibl environment file 'sky.hdr'.\n"
+              "[ERROR]    Unable to read caustics photon map file 'caustics.pm'.\n"
+              "[ERROR]    Unable to read texture bake lua settings '.'.\n");
+}
+
+TEST_F(RunTest, TheRunPlugsInDriversListsAndSettings) {
+    auto driver = std::make_shared<RecordingDriver>();
+    ox::DefaultRunSettings *seen = nullptr;
+    ox::RunEnvironment env;
+    env.makeSettings = [&] {
+        auto s = std::make_unique<ox::DefaultRunSettings>();
+        s->verbosity.debugFile = true;
+        s->verbosity.benchmarkPrint = true;
+        s->renderTypeValue = 4;  // VertexTransfer
+        seen = s.get();
+        return s;
+    };
+    env.loadInputList = [](const std::string &, std::vector<std::string> &out) {
+        out.push_back("listed.xml");
+        return true;
+    };
+    env.processorCount = [] { return 3; };
+    env.drivers.set(ox::kActionVertexTransfer, driver);
+
+    testing::internal::CaptureStdout();
+    const int32_t status =
+        ox::runThevorn({"thevorn", "-i", "list.xml", "-od", "out", "-o", "base"}, env);
+    const std::string out = testing::internal::GetCapturedStdout();
+    EXPECT_EQ(status, 0) << out;
+    EXPECT_EQ(driver->actions, std::vector<int32_t>{ox::kActionVertexTransfer});
+    EXPECT_EQ(driver->baseName, "base");
+    EXPECT_EQ(driver->directory, "out/");
+    EXPECT_EQ(driver->format, ox::kFormatTga);
+    EXPECT_EQ(driver->threads, 3);
+    EXPECT_TRUE(seen->fgUseLegacy);
+    EXPECT_NE(out.find("[INFO]     Detected 3 cores, using 3 cores\n"), std::string::npos);
+    EXPECT_NE(out.find("[BENCH]    Statistics for this run:\n[BENCH]    Pass 1: beauty ("),
+              std::string::npos)
+        << out;
+    // The output tree came first, so the debug file starts with its banner.
+    const std::string debug = readAll("out/debug.out");
+    EXPECT_EQ(debug.rfind(" +++++++++++++++ KESTRIN RENDERER DEBUG MESSAGES +++++++++++ \n", 0),
+              0u);
+    EXPECT_NE(debug.find("[PROGRESS] Progress 100.0%\n"), std::string::npos);
+
+    // A driver's status is the run's; an action without a driver says so.
+    driver->result = ox::kStatusAborted;
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-vt"}, env), ox::kStatusAborted);
+    EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-b"}, env), ox::kStatusUnsupported);
+    const std::string out2 = testing::internal::GetCapturedStdout();
+    EXPECT_NE(out2.find("[ERROR]    The texture bake (-b) is not available: this build has no "
+                        "driver for it.\n"),
+              std::string::npos)
+        << out2;
+    EXPECT_EQ(seen->renderTypeValue, 1);  // the option was written back before the driver
+}
+
+TEST_F(RunTest, WritingTheDefaultsReportsPlatformErrors) {
+    ox::RunEnvironment env = ox::defaultRunEnvironment();
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(ox::runThevorn({"thevorn", "-xs"}, env), 0);
+    fs::create_directory("config.xml");  // a directory where the file should go
+    const int32_t status = ox::runThevorn({"thevorn", "-c"}, env);
+    const std::string out = testing::internal::GetCapturedStdout();
+    EXPECT_EQ(status, EISDIR) << out;
+    EXPECT_TRUE(fs::is_regular_file("config.xsd"));
+    EXPECT_NE(out.find("[ERROR]    Unable to write config.xml: "), std::string::npos) << out;
+    for (const auto &e : fs::directory_iterator(dir_))  // no temporary file is left behind
+        EXPECT_NE(e.path().filename().string().front(), '.') << e.path();
+}
+
+TEST(CrashHandler, SilentCrashExitsWith139) {
+    for (bool silent : {true, false}) {
+        const pid_t child = ::fork();
+        ASSERT_GE(child, 0);
+        if (child == 0) {
+            ox::installCrashHandler(silent);
+            ::raise(SIGSEGV);
+            ::_exit(0);
+        }
+        int status = 0;
+        ASSERT_EQ(::waitpid(child, &status, 0), child);
+        if (silent) {
+            ASSERT_TRUE(WIFEXITED(status));
+            EXPECT_EQ(WEXITSTATUS(status), 139);
+        } else {
+            ASSERT_TRUE(WIFSIGNALED(status));
+            EXPECT_EQ(WTERMSIG(status), SIGSEGV);
+        }
+    }
+}
+
+}  // namespace
