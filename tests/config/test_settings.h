@@ -1,0 +1,71 @@
+#pragma once
+
+#include <string>
+
+#include "config/type.h"
+
+// Settings classes shared by the configuration tests: every value type, a nested object, both
+// vector kinds, two enumerations that share a type name.
+namespace cfgtest {
+
+enum class Mode : int32_t { Render, TextureBake, VertexBake };
+OX_ENUM_NAMES(Mode, "RenderType", "Render", "TextureBake", "VertexBake");
+
+enum class Sampling : int32_t { Adaptive = 1, SuperSampling = 2 };
+OX_ENUM_VALUES(Sampling, "SamplingType", {"Adaptive", 1}, {"SuperSampling", 2});
+
+enum class Folded : int32_t { Alpha, Beta };
+OX_ENUM_NAMES_FOLD(Folded, "FoldedType", "Alpha", "Beta");
+
+enum class EnvA : int32_t { None, Camera, SkyLight };
+OX_ENUM_NAMES(EnvA, "EnvironmentType", "None", "Camera", "SkyLight");
+enum class EnvB : int32_t { Cubemap, Ball, Latlong };
+OX_ENUM_NAMES(EnvB, "EnvironmentType", "CUBEMAP", "BALL", "LATLONG");
+
+class InnerBase : public ox::OXCComplexType {
+public:
+    InnerBase() : OXCComplexType("inner") {}
+    ox::OXCType<float> gamma{this, "gamma", 1.0f, "Output gamma"};
+    ox::OXCEnum<EnvA> env{this, "env", EnvA::Camera, "Environment"};
+};
+
+class TargetBase : public ox::OXCComplexType {
+public:
+    TargetBase() : OXCComplexType("Target") {}
+    ox::OXCType<std::string> name{this, "name", "", "Target name"};
+    ox::OXCType<ox::Vec2i> size{this, "size", {0, 0}, "Target size"};
+};
+
+class AllBase : public ox::OXCComplexType {
+public:
+    AllBase() : OXCComplexType("All") {}
+    ox::OXCType<bool> flag{this, "flag", true, "A bool"};
+    ox::OXCType<int32_t> count{this, "count", -2, "An int"};
+    ox::OXCType<uint32_t> rays{this, "rays", 4294967295u, "An unsigned"};
+    ox::OXCType<float> bias{this, "bias", 0.005f, "A float"};
+    ox::OXCType<std::string> camera{this, "camera", "persp", "A string"};
+    ox::OXCType<ox::Color> ambient{this, "ambient", {0, 0, 0, 0}, "A colour"};
+    ox::OXCType<ox::RGBf> tint{this, "tint", {1, 0.5f, 0.25f}, "An RGB"};
+    ox::OXCType<ox::Vec2i> resolution{this, "resolution", {640, 480}, "A Vec2i"};
+    ox::OXCType<ox::Vec2> filter{this, "filter", {1, 1}, "A Vec2"};
+    ox::OXCType<ox::Vec3> up{this, "up", {0, 1, 0}, "A Vec3"};
+    ox::OXCType<ox::Mtx4> placement{this, "placement", ox::Mtx4::identity(), "A matrix"};
+    ox::OXCEnum<Mode> mode{this, "mode", Mode::Render, "An enum"};
+    ox::OXCEnum<Sampling> sampling{this, "sampling", Sampling::Adaptive, "Explicit values"};
+    ox::OXCEnum<Folded> folded{this, "folded", Folded::Alpha, "Case-folded enum"};
+    ox::OXCNested<InnerBase> inner{this, "", "Nested settings"};
+    ox::OXCTypedVector<std::string> files{this, "files", "A string vector"};
+    ox::OXCTypedComplexVector<TargetBase> targets{this, "targets", "An object vector"};
+};
+
+using All = ox::OXCComplexTypeInstantiator<AllBase>;
+using Target = ox::OXCComplexTypeInstantiator<TargetBase>;
+
+class RootBase : public ox::OXCComplexType {
+public:
+    RootBase() : OXCComplexType("OXConfig") {}
+    ox::OXCNested<AllBase> all{this, "", "Everything"};
+};
+using Root = ox::OXCComplexTypeInstantiator<RootBase>;
+
+}  // namespace cfgtest

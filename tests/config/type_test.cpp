@@ -1,0 +1,201 @@
+#include <gtest/gtest.h>
+
+#include <type_traits>
+
+#include "config/type.h"
+#include "config/xml.h"
+#include "tests/config/test_settings.h"
+
+using namespace cfgtest;
+using testing::internal::CaptureStdout;
+using testing::internal::GetCapturedStdout;
+
+namespace {
+
+int countOf(const std::string &text, const std::string &what) {
+    int n = 0;
+    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
+    return n;
+}
+
+std::string xmlOf(const ox::OXCTypeBase &v) {
+    std::string s;
+    EXPECT_TRUE(ox::writeSettingsToString(s, v));
+    return s;
+}
+
+class DuplicateBase : public ox::OXCComplexType {
+public:
+    DuplicateBase() : OXCComplexType("Dup") {}
+    ox::OXCType<int32_t> first{this, "key", 1, "first"};
+    ox::OXCType<float> second{this, "key", 2.0f, "second"};
+    ox::OXCType<bool> undocumented{this, "plain", false, nullptr};
+};
+
+}  // namespace
+
+static_assert(!std::is_copy_constructible_v<All> && !std::is_move_constructible_v<All>);
+static_assert(!std::is_copy_assignable_v<All> && !std::is_move_assignable_v<All>);
+static_assert(!std::is_copy_constructible_v<ox::OXCType<int32_t>>);
+
+TEST(ConfigType, RegistryOrderLookupAndDuplicates) {
+    All all;
+    std::vector<std::string> keys;
+    for (const auto &m : all.members()) keys.emplace_back(m.key());
+    EXPECT_TRUE(std::is_sorted(keys.begin(), keys.end()));
+    EXPECT_EQ(keys.size(), 17u);
+    EXPECT_EQ(ox::findMember(all, "inner"), &all.inner);  // nested: its type name is the key
+    EXPECT_EQ(ox::findMember(all, "bias"), &all.bias);
+    EXPECT_EQ(ox::findMember(all, "nope"), nullptr);
+
+    CaptureStdout();
+    ox::OXCComplexTypeInstantiator<DuplicateBase> dup;
+    std::string out = GetCapturedStdout();
+    EXPECT_EQ(countOf(out, "Error registring variable key in container Dup, it already exists"), 1);
+    EXPECT_EQ(dup.findMember("key"), &dup.first);
+    EXPECT_EQ(dup.members().size(), 2u);
+
+    CaptureStdout();
+    EXPECT_EQ(ox::checkDocumentation(dup), 1);
+    EXPECT_EQ(countOf(GetCapturedStdout(), "Attribute plain in type Dup is undocumented"), 1);
+    EXPECT_EQ(ox::checkDocumentation(all), 0);
+    std::map<std::string, std::string> docs;
+    all.getDocumentation(docs);
+    EXPECT_EQ(docs["inner"], "Nested settings");
+}
+
+TEST(ConfigType, TextForms) {
+    All a;
+    EXPECT_EQ(a.flag.toString(), "1");
+    EXPECT_EQ(a.count.toString(), "-2");
+    EXPECT_EQ(a.rays.toString(), "4294967295");
+    EXPECT_EQ(a.bias.toString(), "0.005");
+    a.bias = 0.1f;
+    EXPECT_EQ(a.bias.toString(), "0.1");
+    a.bias = 3.4028235e38f;
+    EXPECT_EQ(a.bias.toString(), "3.4028235e+38");
+    a.bias = 16777217.0f;  // not representable: the nearest float prints exactly
+    EXPECT_EQ(a.bias.toString(), "16777216");
+    EXPECT_EQ(a.ambient.toString(), "(0.0000, 0.0000, 0.0000, 0.0000)");
+    EXPECT_EQ(a.tint.toString(), "(1.0000, 0.5000, 0.2500)");
+    EXPECT_EQ(a.resolution.toString(), "(640, 480)");
+    EXPECT_EQ(a.filter.toString(), "(1, 1)");
+    EXPECT_EQ(a.up.toString(), "(0, 1, 0)");
+    EXPECT_EQ(a.placement.toString(), "(1, 0, 0, 0)\n(0, 1, 0, 0)\n(0, 0, 1, 0)\n(0, 0, 0, 1)\n");
+    EXPECT_EQ(a.camera.toString(), "persp");
+    EXPECT_EQ(a.mode.toString(), "Render");
+    EXPECT_EQ(a.inner.toString(), "");
+    a.files.push("a");
+    a.files.push("b");
+    EXPECT_EQ(a.files.toString(), "a\nb\n");
+}
+
+TEST(ConfigType, EnumerationsAreKeyedByTheirType) {
+    All a;
+    EXPECT_TRUE(a.mode.setFromString("TextureBake"));
+    EXPECT_EQ(a.mode.get(), Mode::TextureBake);
+    EXPECT_FALSE(a.mode.setFromString("texturebake"));  // exact table
+    EXPECT_EQ(a.mode.get(), Mode::TextureBake);
+    EXPECT_TRUE(a.folded.setFromString("bEtA"));  // folding table
+    EXPECT_EQ(a.folded.get(), Folded::Beta);
+    EXPECT_EQ(a.folded.toString(), "Beta");  // names keep their declared spelling
+
+    EXPECT_EQ(a.sampling.value(), 1);
+    a.sampling.setValue(0);  // no name has 0
+    EXPECT_EQ(a.sampling.toString(), "");
+    EXPECT_FALSE(a.sampling.setFromString(""));
+
+    // Two enumerations named "EnvironmentType" are different tables.
+    const ox::OXCEnumTable &ta = ox::enumTable<EnvA>();
+    const ox::OXCEnumTable &tb = ox::enumTable<EnvB>();
+    EXPECT_NE(&ta, &tb);
+    EXPECT_EQ(ta.typeName(), tb.typeName());
+    EXPECT_EQ(ta.find("Camera"), 1);
+    EXPECT_EQ(tb.find("Camera"), -1);
+    EXPECT_EQ(tb.find("LATLONG"), 2);
+
+    ox::OXCEnum<EnvB> camEnv("env", EnvB::Latlong);
+    CaptureStdout();
+    ox::assign(a.inner.env, camEnv);  // same member name, another table: refused
+    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error when assigning variable env"), 1);
+    EXPECT_EQ(a.inner.env.get(), EnvA::Camera);
+    ox::OXCEnum<EnvA> other("somethingElse", EnvA::SkyLight);
+    ox::assign(a.inner.env, other);  // same table: copied whatever the name
+    EXPECT_EQ(a.inner.env.get(), EnvA::SkyLight);
+}
+
+TEST(ConfigType, AssignmentByName) {
+    All target;
+    All source;
+    source.count = 7;
+    source.camera = "cam2";
+    source.inner.gamma = 2.2f;
+    source.placement.ref().m[3][0] = 5.0f;
+    source.files.push("x");
+    source.files.push("y");
+    source.files.push("z");
+    target.files.push("keep1");
+    target.files.push("keep2");
+    source.targets.append().name = "t1";
+    ox::assign(target, source);
+    EXPECT_EQ(target.count.get(), 7);
+    EXPECT_EQ(target.camera.get(), "cam2");
+    EXPECT_FLOAT_EQ(target.inner.gamma.get(), 2.2f);
+    EXPECT_EQ(target.placement.get().m[3][0], 5.0f);
+    ASSERT_EQ(target.files.size(), 5u);  // appended after the entries it had
+    EXPECT_EQ(target.files.values(),
+              (std::vector<std::string>{"keep1", "keep2", "x", "y", "z"}));
+    ASSERT_EQ(target.targets.size(), 1u);
+    EXPECT_EQ(target.targets[0].name.get(), "t1");
+
+    // A scalar of another type warns and keeps the target.
+    ox::OXCType<int32_t> intSource("bias", 3);
+    CaptureStdout();
+    ox::assign(target.bias, intSource);
+    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error when assigning variable bias"), 1);
+    EXPECT_FLOAT_EQ(target.bias.get(), 0.005f);
+
+    // Vector entries must have the target's element type.
+    ox::OXCTypedVector<std::string> strings("targets");
+    strings.push("not a target");
+    CaptureStdout();
+    ox::assign(target.targets, strings);
+    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error when assigning variable targets"), 1);
+    EXPECT_EQ(target.targets.size(), 1u);
+    ox::OXCType<int32_t> wrongEntry("element", 1);
+    CaptureStdout();
+    EXPECT_FALSE(target.files.add(wrongEntry));
+    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error"), 1);
+
+    // Members the target lacks are reported and skipped.
+    ox::OXCComplexTypeInstantiator<DuplicateBase> dupSource;
+    ox::OXCComplexTypeInstantiator<InnerBase> innerTarget;
+    CaptureStdout();
+    ox::assign(innerTarget, dupSource);
+    std::string out = GetCapturedStdout();
+    EXPECT_EQ(countOf(out, "Unknown target for assignment key in complex type inner"), 1);
+    EXPECT_EQ(countOf(out, "Unknown target for assignment plain in complex type inner"), 1);
+}
+
+TEST(ConfigType, CloneIsDeepAndIndependent) {
+    All a;
+    a.count = 11;
+    a.inner.gamma = 0.45f;
+    a.files.push("f");
+    a.targets.append().size = ox::Vec2i(64, 32);
+    std::unique_ptr<ox::OXCTypeBase> c = a.clone();
+    EXPECT_EQ(xmlOf(*c), xmlOf(a));
+    auto &copy = static_cast<All &>(*c);
+    copy.targets[0].size = ox::Vec2i(1, 1);
+    copy.files.push("g");
+    EXPECT_EQ(a.targets[0].size.get(), ox::Vec2i(64, 32));
+    EXPECT_EQ(a.files.size(), 1u);
+    // A clone of a nested member is a free-standing object of the same class.
+    std::unique_ptr<ox::OXCTypeBase> inner = a.inner.clone();
+    EXPECT_EQ(inner->name(), "inner");
+    EXPECT_FLOAT_EQ(static_cast<InnerBase &>(*inner).gamma.get(), 0.45f);
+    // A clone of a vector clones its entries and keeps its prototype.
+    std::unique_ptr<ox::OXCTypeBase> vec = a.targets.clone();
+    EXPECT_TRUE(ox::sameType(*vec, a.targets));
+    EXPECT_EQ(static_cast<ox::OXCTypeVector &>(*vec).size(), 1u);
+}

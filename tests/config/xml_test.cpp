@@ -1,0 +1,450 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "config/type.h"
+#include "config/input_list.h"
+#include "config/xml.h"
+#include "tests/config/test_settings.h"
+
+using namespace cfgtest;
+using testing::internal::CaptureStdout;
+using testing::internal::GetCapturedStdout;
+namespace fs = std::filesystem;
+
+namespace {
+
+int countOf(const std::string &text, const std::string &what) {
+    int n = 0;
+    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
+    return n;
+}
+
+std::string readFile(const fs::path &p) {
+    std::ifstream in(p, std::ios::binary);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+void writeFile(const fs::path &p, const std::string &text) {
+    std::ofstream out(p, std::ios::binary);
+    out << text;
+}
+
+/// A fresh directory per test, made the current directory while the test runs.
+class ConfigXml : public testing::Test {
+protected:
+    void SetUp() override {
+        dir_ = fs::temp_directory_path() /
+               ("oxcfg_" + std::to_string(::getpid()) + "_" +
+                testing::UnitTest::GetInstance()->current_test_info()->name());
+        fs::remove_all(dir_);
+        fs::create_directories(dir_);
+        old_ = fs::current_path();
+        fs::current_path(dir_);
+    }
+    void TearDown() override {
+        fs::current_path(old_);
+        fs::remove_all(dir_);
+    }
+    fs::path dir_, old_;
+};
+
+void fillEverything(All &a) {
+    a.flag = false;
+    a.count = -123456;
+    a.rays = 4000000000u;
+    a.bias = 1.0f / 3.0f;
+    a.camera = "cam <\"&'> \xc3\xa9t\xc3\xa9";  // markup characters and Latin-1 letters
+    a.ambient = ox::Color(0.1f, 0.2f, 0.3f, 0.4f);
+    a.tint = ox::RGBf(1e-7f, 3.4028235e38f, -0.0f);
+    a.resolution = ox::Vec2i(-1, 2147483647);
+    a.filter = ox::Vec2(0.7f, 123456.789f);
+    a.up = ox::Vec3(1, 2, 3);
+    for (int r = 0; r < 4; ++r)
+        for (int c = 0; c < 4; ++c) a.placement.ref().m[r][c] = float(r * 4 + c) / 7.0f;
+    a.mode = Mode::VertexBake;
+    a.sampling = Sampling::SuperSampling;
+    a.folded = Folded::Beta;
+    a.inner.gamma = 0.45f;
+    a.inner.env = EnvA::SkyLight;
+    a.files.push("one.xml");
+    a.files.push("");
+    a.files.push("three");
+    a.targets.append().name = "lightmap";
+    auto &t = a.targets.append();
+    t.name = "second";
+    t.size = ox::Vec2i(512, 256);
+}
+
+}  // namespace
+
+TEST_F(ConfigXml, WriteReadWriteGivesIdenticalFiles) {
+    Root original;
+    fillEverything(original.all);
+    ASSERT_TRUE(ox::writeSettings("a.xml", original));
+
+    Root loaded;
+    ASSERT_TRUE(ox::loadSettings("a.xml", loaded));
+    ASSERT_TRUE(ox::writeSettings("b.xml", loaded));
+    std::string a = readFile("a.xml"), b = readFile("b.xml");
+    EXPECT_EQ(a, b);
+    EXPECT_EQ(loaded.all.bias.get(), original.all.bias.get());
+    EXPECT_EQ(loaded.all.tint.get(), original.all.tint.get());
+    EXPECT_EQ(loaded.all.camera.get(), original.all.camera.get());
+    ASSERT_EQ(loaded.all.targets.size(), 2u);
+    EXPECT_EQ(loaded.all.targets[1].size.get(), ox::Vec2i(512, 256));
+
+    // The written form: declaration, tab indentation, entries under their own names.
+    EXPECT_EQ(a.rfind("<?xml version=\"1.0\" encoding=\"ISO-8859-1\"?>\n<OXConfig>\n\t<All>", 0),
+              0u);
+    EXPECT_NE(a.find("\t\t<flag>false</flag>\n"), std::string::npos);
+    EXPECT_NE(a.find("<element>one.xml</element>"), std::string::npos);
+    EXPECT_NE(a.find("<Target>"), std::string::npos);
+    EXPECT_NE(a.find("<mode>VertexBake</mode>"), std::string::npos);
+    EXPECT_NE(a.find("<bias>0.33333334</bias>"), std::string::npos);
+    EXPECT_NE(a.find("<rays>4000000000</rays>"), std::string::npos);
+
+    // Reading again into a tree that has entries appends after them.
+    ASSERT_TRUE(ox::loadSettings("a.xml", loaded));
+    EXPECT_EQ(loaded.all.files.size(), 6u);
+    EXPECT_EQ(loaded.all.files[3], "one.xml");
+    EXPECT_EQ(loaded.all.targets.size(), 4u);
+
+    // Defaults print as they always did.
+    Root defaults;
+    std::string d;
+    ASSERT_TRUE(ox::writeSettingsToString(d, defaults));
+    EXPECT_NE(d.find("<bias>0.005</bias>"), std::string::npos);
+    EXPECT_NE(d.find("<rays>4294967295</rays>"), std::string::npos);
+    EXPECT_NE(d.find("<files/>"), std::string::npos);
+}
+
+TEST_F(ConfigXml, PartialFilesWarnAndKeepDefaults) {
+    writeFile("min.xml", "<OXConfig><All><mode>TextureBake</mode></All></OXConfig>");
+    Root r;
+    ASSERT_TRUE(ox::loadSettings("min.xml", r));
+    EXPECT_EQ(r.all.mode.get(), Mode::TextureBake);
+    EXPECT_EQ(r.all.camera.get(), "persp");
+    EXPECT_EQ(r.all.resolution.get(), ox::Vec2i(640, 480));
+
+    writeFile("bad.xml", R"(<AnyRootName>
+  <Alll/>
+  <All>
+    <mode>
+        VertexBake
+    </mode>
+    <sampling>Sampled</sampling>
+    <folded> BETA </folded>
+    <count>8x</count>
+    <rays>-1</rays>
+    <bias>1e99</bias>
+    <flag>yes</flag>
+    <camera>  spaced  </camera>
+    <resolution><x>12</x><y>1.5</y><w>3</w></resolution>
+    <placement><r><c>2</c></r><r/><r/><r/><r><c>9</c></r></placement>
+    <files><element>a</element><item>b</item><element> c </element></files>
+    <targets><element><name>hand</name></element><Target><name>typed</name></Target></targets>
+    <inner><gamma>2.2</gamma><bogus>1</bogus></inner>
+  </All>
+</AnyRootName>)");
+    Root b;
+    CaptureStdout();
+    ASSERT_TRUE(ox::loadSettings("bad.xml", b));
+    std::string out = GetCapturedStdout();
+    EXPECT_EQ(countOf(out, "Warning, unknown node: Alll"), 1);
+    EXPECT_EQ(countOf(out, "Warning, unknown node: bogus"), 1);
+    EXPECT_EQ(countOf(out, "Warning, unknown node: item"), 1);
+    EXPECT_EQ(countOf(out, "Warning, unknown node: w"), 1);
+    EXPECT_EQ(countOf(out, "Warning, unknown node: r"), 1);  // a fifth matrix row
+    EXPECT_EQ(countOf(out, "Warning, could not set value Sampled for enum sampling"), 1);
+    EXPECT_EQ(countOf(out, "Type conversion error when assigning value 8x"), 1);
+    EXPECT_EQ(countOf(out, "Type conversion error when assigning value -1"), 1);
+    EXPECT_EQ(countOf(out, "Type conversion error when assigning value 1e99"), 1);
+    EXPECT_EQ(countOf(out, "Type conversion error when assigning value yes"), 1);
+    EXPECT_EQ(countOf(out, "Type conversion error when assigning value 1.5"), 1);
+    EXPECT_EQ(b.all.mode.get(), Mode::VertexBake);  // wrapped in spaces and line breaks
+    EXPECT_EQ(b.all.sampling.get(), Sampling::Adaptive);
+    EXPECT_EQ(b.all.folded.get(), Folded::Beta);
+    EXPECT_EQ(b.all.count.get(), -2);
+    EXPECT_EQ(b.all.rays.get(), 4294967295u);
+    EXPECT_FLOAT_EQ(b.all.bias.get(), 0.005f);
+    EXPECT_TRUE(b.all.flag.get());
+    EXPECT_EQ(b.all.camera.get(), "spaced");
+    EXPECT_EQ(b.all.resolution.get(), ox::Vec2i(12, 480));
+    EXPECT_EQ(b.all.placement.get().m[0][0], 2.0f);
+    EXPECT_EQ(b.all.placement.get().m[1][1], 1.0f);
+    EXPECT_EQ(b.all.files.values(), (std::vector<std::string>{"a", "c"}));
+    ASSERT_EQ(b.all.targets.size(), 2u);
+    EXPECT_EQ(b.all.targets[0].name.get(), "hand");
+    EXPECT_EQ(b.all.targets[1].name.get(), "typed");
+    EXPECT_FLOAT_EQ(b.all.inner.gamma.get(), 2.2f);
+
+    // Digits for bools, explicit plus signs, and the largest unsigned.
+    writeFile("num.xml",
+              "<X><All><flag>0</flag><rays>4294967295</rays><count>+5</count></All></X>");
+    Root n;
+    n.all.rays = 1;
+    ASSERT_TRUE(ox::loadSettings("num.xml", n));
+    EXPECT_FALSE(n.all.flag.get());
+    EXPECT_EQ(n.all.rays.get(), 4294967295u);
+    EXPECT_EQ(n.all.count.get(), 5);
+}
+
+TEST_F(ConfigXml, XIncludeIsRelativeToTheCurrentDirectory) {
+    fs::create_directories("sub");
+    writeFile("part.xml", "<inner><gamma>3.5</gamma></inner>");
+    writeFile("sub/main.xml",
+              "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All>"
+              "<xi:include href=\"part.xml\"/></All></OXConfig>");
+    Root r;
+    CaptureStdout();
+    ASSERT_TRUE(ox::loadSettings("sub/main.xml", r));
+    EXPECT_EQ(countOf(GetCapturedStdout(), "Did XInclude inclusions"), 1);
+    EXPECT_FLOAT_EQ(r.all.inner.gamma.get(), 3.5f);
+
+    // A missing include fails the load and leaves the tree untouched.
+    writeFile("miss.xml",
+              "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>9</count>"
+              "<xi:include href=\"nothere.xml\"/></All></OXConfig>");
+    Root m;
+    CaptureStdout();
+    EXPECT_FALSE(ox::loadSettings("miss.xml", m));
+    EXPECT_EQ(countOf(GetCapturedStdout(), "XInclude processing failed"), 1);
+    EXPECT_EQ(m.all.count.get(), -2);
+}
+
+TEST_F(ConfigXml, HostileFilesFailCleanly) {
+    Root r;
+    auto failsWith = [&](const std::string &file, const std::string &text) {
+        CaptureStdout();
+        bool ok = ox::loadSettings(file, r);
+        std::string out = GetCapturedStdout();
+        EXPECT_FALSE(ok) << file;
+        EXPECT_NE(out.find(text), std::string::npos) << file << ": " << out;
+    };
+    failsWith("missing.xml", "Error opening file missing.xml in xmlsource");
+    fs::create_directories("adir");
+    failsWith("adir", "not a regular file");
+    ASSERT_EQ(::mkfifo("fifo", 0600), 0);
+    failsWith("fifo", "not a regular file");  // refused without waiting for a writer
+    {
+        int fd = ::open("huge.xml", O_WRONLY | O_CREAT, 0600);
+        ASSERT_GE(fd, 0);
+        ASSERT_EQ(::ftruncate(fd, off_t(ox::kMaxXmlFileSize) + 1), 0);  // sparse
+        ::close(fd);
+    }
+    failsWith("huge.xml", "too large");
+    writeFile("empty.xml", "");
+    failsWith("empty.xml", "Error parsing file empty.xml in xmlsource");
+    writeFile("broken.xml", "<OXConfig><All><count>3</count></Al></OXConfig>");
+    failsWith("broken.xml", "Error parsing file broken.xml in xmlsource");
+    writeFile("noroot.xml", "<?xml version=\"1.0\"?><!-- nothing -->");
+    failsWith("noroot.xml", "Error parsing file");
+    EXPECT_EQ(r.all.count.get(), -2);
+
+    // Entities are never substituted: an exponential entity stays a reference.
+    std::string laughs;
+    laughs = "<?xml version=\"1.0\"?><!DOCTYPE r [<!ENTITY a0 \"lol\">";
+    for (int i = 1; i < 30; ++i) {
+        std::string prev = "&a" + std::to_string(i - 1) + ";";
+        std::string body;
+        for (int k = 0; k < 10; ++k) body += prev;
+        laughs += "<!ENTITY a" + std::to_string(i) + " \"" + body + "\">";
+    }
+    laughs += "]><OXConfig><All><camera>x&a29;y</camera><count>4</count></All></OXConfig>";
+    writeFile("laughs.xml", laughs);
+    Root e;
+    auto t0 = std::chrono::steady_clock::now();
+    CaptureStdout();
+    bool ok = ox::loadSettings("laughs.xml", e);
+    GetCapturedStdout();
+    EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(20));
+    if (ok) {
+        EXPECT_EQ(e.all.camera.get(), "xy");
+        EXPECT_EQ(e.all.count.get(), 4);
+    }
+
+    // External entities and DTDs are not loaded.
+    writeFile("secret.txt", "SECRET");
+    writeFile("ext.xml",
+              "<?xml version=\"1.0\"?><!DOCTYPE r SYSTEM \"nothere.dtd\" [<!ENTITY s SYSTEM "
+              "\"secret.txt\">]><OXConfig><All><camera>&s;</camera></All></OXConfig>");
+    Root x;
+    CaptureStdout();
+    ok = ox::loadSettings("ext.xml", x);
+    GetCapturedStdout();
+    EXPECT_EQ(x.all.camera.get().find("SECRET"), std::string::npos);
+
+    // XInclude of a device is refused, not read forever.
+    writeFile("dev.xml",
+              "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All>"
+              "<xi:include href=\"/dev/zero\" parse=\"text\"/></All></OXConfig>");
+    CaptureStdout();
+    EXPECT_FALSE(ox::loadSettings("dev.xml", x));
+    GetCapturedStdout();
+}
+
+TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
+    Root r;
+    writeFile("keep.xml", "precious");
+    CaptureStdout();
+    EXPECT_FALSE(ox::writeSettings("keep.xml", r, "NO-SUCH-ENCODING"));
+    EXPECT_NE(GetCapturedStdout().find("Error starting xml document"), std::string::npos);
+    EXPECT_EQ(readFile("keep.xml"), "precious");
+
+    CaptureStdout();
+    errno = 0;
+    EXPECT_FALSE(ox::writeSettings("nodir/x.xml", r));
+    EXPECT_EQ(errno, ENOENT);
+    EXPECT_NE(GetCapturedStdout().find("Error creating xml writer"), std::string::npos);
+
+    fs::create_directories("target_is_dir");
+    CaptureStdout();
+    EXPECT_FALSE(ox::writeSettings("target_is_dir", r));
+    GetCapturedStdout();
+    EXPECT_TRUE(fs::is_directory("target_is_dir"));
+
+    ASSERT_TRUE(ox::writeSettings("keep.xml", r));
+    EXPECT_NE(readFile("keep.xml").find("<OXConfig>"), std::string::npos);
+    for (const auto &e : fs::directory_iterator(".")) {  // no temporary files left behind
+        EXPECT_EQ(e.path().filename().string().find(".tmp"), std::string::npos);
+    }
+}
+
+TEST_F(ConfigXml, SchemaValidatesTheWrittenConfiguration) {
+    Root r;
+    fillEverything(r.all);
+    ASSERT_TRUE(ox::writeSettings("config.xml", r));
+    CaptureStdout();
+    ASSERT_TRUE(ox::writeSchema("config.xsd", r));
+    EXPECT_EQ(GetCapturedStdout().find("undocumented"), std::string::npos);
+    std::string xsd = readFile("config.xsd");
+    // The type of a documented scalar comes before its annotation.
+    EXPECT_NE(xsd.find("<xsd:element name=\"bias\" type=\"xsd:float\">"), std::string::npos);
+    EXPECT_NE(xsd.find("<xsd:documentation xml:lang=\"en\">A float</xsd:documentation>"),
+              std::string::npos);
+    EXPECT_NE(xsd.find("<xsd:enumeration value=\"SuperSampling\"/>"), std::string::npos);
+    EXPECT_NE(xsd.find("name=\"rays\" type=\"xsd:nonNegativeInteger\""), std::string::npos);
+    int rc = std::system("xmllint --noout --schema config.xsd config.xml > lint.txt 2>&1");
+    EXPECT_EQ(rc, 0) << readFile("lint.txt");
+    // An invalid enumeration name is caught by the schema.
+    writeFile("bad.xml", std::string(readFile("config.xml"))
+                             .replace(readFile("config.xml").find("VertexBake"), 10, "Nope"));
+    rc = std::system("xmllint --noout --schema config.xsd bad.xml > lint2.txt 2>&1");
+    EXPECT_NE(rc, 0);
+}
+
+// ---- streaming -------------------------------------------------------------------------------
+
+namespace {
+
+int gLive = 0;
+int gMaxLive = 0;
+
+class CountedBase : public ox::OXCComplexType {
+public:
+    CountedBase() : OXCComplexType("XMLThing") { gMaxLive = std::max(gMaxLive, ++gLive); }
+    ~CountedBase() override { --gLive; }
+    ox::OXCType<std::string> name{this, "Name", "", "Name"};
+    ox::OXCType<ox::Mtx4> objectToWorld{this, "ObjectToWorld", ox::Mtx4::identity(), "Placement"};
+    ox::OXCTypedVector<std::string> links{this, "Links", "Links"};
+    ox::OXCTypedComplexVector<TargetBase> ramp{this, "Ramp", "Ramp"};
+    ox::OXCEnum<EnvB> env{this, "EnvironmentType", EnvB::Latlong, "Projection"};
+    ox::OXCType<int32_t> samples{this, "Samples", 1, "Samples"};
+};
+
+}  // namespace
+
+TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
+    std::vector<std::string> names;
+    std::vector<float> tx;
+    std::vector<size_t> linkCounts;
+    ox::XMLSAXDeserializer sax;
+    sax.addFactory<CountedBase>("Thing", [&](CountedBase &t) {
+        names.push_back(t.name.get());
+        tx.push_back(t.objectToWorld.get().m[3][0]);
+        linkCounts.push_back(t.links.size() + t.ramp.size());
+        return true;
+    });
+    std::string doc = "<?xml version=\"1.0\"?>\n<OXScene>\n";
+    for (int i = 0; i < 50; ++i)
+        doc += "<Thing><Name>t" + std::to_string(i) +
+               "</Name><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r/><r/>"
+               "<r><c>" + std::to_string(i) + "</c></r></ObjectToWorld>"
+               "<Links><element>a</element><element>b</element></Links></Thing>\n";
+    doc += "<Other><Name>x</Name></Other>\n"
+           "<Thing><Name>odd</Name><Bogus>1</Bogus><Links><link>q</link></Links>"
+           "<Ramp><Target><name>r</name></Target><element/></Ramp>"
+           "<Samples>many</Samples><EnvironmentType> BALL </EnvironmentType></Thing>\n"
+           "</OXScene>\n";
+    gLive = gMaxLive = 0;
+    CaptureStdout();
+    ASSERT_TRUE(sax.parseMemory(doc));
+    std::string out = GetCapturedStdout();
+    ASSERT_EQ(names.size(), 51u);
+    EXPECT_EQ(names[7], "t7");
+    EXPECT_EQ(tx[7], 7.0f);
+    EXPECT_EQ(linkCounts[0], 2u);
+    EXPECT_EQ(names[50], "odd");
+    EXPECT_EQ(linkCounts[50], 2u);
+    EXPECT_EQ(gMaxLive, 1);
+    EXPECT_EQ(gLive, 0);
+    EXPECT_EQ(countOf(out, "[XMLSAXParser] Unknown node: Other"), 1);
+    EXPECT_EQ(countOf(out, "Unknown member Bogus of complex type XMLThing"), 1);
+    EXPECT_EQ(countOf(out, "Trying to assign a node of type link to a node named Links"), 1);
+    EXPECT_EQ(countOf(out, "Type conversion error when assigning value many"), 1);
+
+    // Another document element: nothing is read.
+    names.clear();
+    CaptureStdout();
+    EXPECT_TRUE(sax.parseMemory("<Scene><Thing><Name>n</Name></Thing></Scene>"));
+    EXPECT_EQ(countOf(GetCapturedStdout(), "[XMLSAXParser] Unknown node: Scene"), 1);
+    EXPECT_TRUE(names.empty());
+
+    // A malformed document fails after delivering what came before the fault.
+    CaptureStdout();
+    EXPECT_FALSE(sax.parseMemory("<OXScene><Thing><Name>ok</Name></Thing><Thing></OXScene>"));
+    EXPECT_NE(GetCapturedStdout().find("Error parsing file"), std::string::npos);
+    EXPECT_EQ(names, std::vector<std::string>{"ok"});
+    EXPECT_EQ(gLive, 0);
+
+    // A handler that refuses stops the parse.
+    ox::XMLSAXDeserializer stopper;
+    int seen = 0;
+    stopper.addFactory<CountedBase>("Thing", [&](CountedBase &) { return ++seen < 2; });
+    EXPECT_FALSE(stopper.parseMemory("<OXScene><Thing/><Thing/><Thing/></OXScene>"));
+    EXPECT_EQ(seen, 2);
+
+    // Files: a directory is refused, a real file streams.
+    writeFile("scene.xml", doc);
+    names.clear();
+    CaptureStdout();
+    EXPECT_TRUE(sax.parseFile("scene.xml"));
+    EXPECT_FALSE(sax.parseFile("."));
+    GetCapturedStdout();
+    EXPECT_EQ(names.size(), 51u);
+}
+
+TEST_F(ConfigXml, InputListsExpandInOrder) {
+    writeFile("l1.xml",
+              "<inputspecification><filelist><element>a.xml</element><element> b.vtm "
+              "</element></filelist></inputspecification>");
+    writeFile("l2.xml", "<list><filelist><element>c.xml</element></filelist></list>");
+    std::vector<std::string> files{"direct.xml"};
+    ASSERT_TRUE(ox::expandInputLists({"l1.xml", "l2.xml"}, files));
+    EXPECT_EQ(files, (std::vector<std::string>{"direct.xml", "a.xml", "b.vtm", "c.xml"}));
+    CaptureStdout();
+    EXPECT_FALSE(ox::expandInputLists({"l1.xml", "missing.xml"}, files));
+    EXPECT_NE(GetCapturedStdout().find("Unable to load input file list from file: missing.xml"),
+              std::string::npos);
+    EXPECT_EQ(files.size(), 4u);
+}
