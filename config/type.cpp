@@ -124,14 +124,16 @@ void valueToString(const Mtx4 &v, std::string &out) {
 bool sameType(const OXCTypeBase &target, const OXCTypeBase &source) {
     if (target.kind() != source.kind()) return false;
     switch (target.kind()) {
-        case OXCKind::Complex: return target.name() == source.name();
+        case OXCKind::Complex:
+            return target.name() == source.name();
         case OXCKind::Enum:
             return &static_cast<const OXCEnumBase &>(target).table() ==
                    &static_cast<const OXCEnumBase &>(source).table();
         case OXCKind::Vector:
             return sameType(static_cast<const OXCTypeVector &>(target).prototype(),
                             static_cast<const OXCTypeVector &>(source).prototype());
-        default: return true;
+        default:
+            return true;
     }
 }
 
@@ -195,8 +197,7 @@ void OXCEnumBase::toString(std::string &out) const {
 
 // ---- settings objects -------------------------------------------------------------------------
 
-bool OXCComplexType::addMember(OXCTypeBase *member, std::string_view key,
-                               const char *description) {
+bool OXCComplexType::addMember(OXCTypeBase *member, std::string_view key, const char *description) {
     std::string_view k = key.empty() ? std::string_view(member->name()) : key;
     auto it = std::lower_bound(members_.begin(), members_.end(), k,
                                [](const Member &m, std::string_view x) { return m.key() < x; });

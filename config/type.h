@@ -71,17 +71,50 @@ enum class OXCKind : uint8_t {
 /// Maps a scalar value type to its kind; only the eleven value types have one.
 template <typename T>
 struct OXCKindOf;
-template <> struct OXCKindOf<Mtx4> { static constexpr OXCKind kKind = OXCKind::Mtx4; };
-template <> struct OXCKindOf<Vec3> { static constexpr OXCKind kKind = OXCKind::Vec3; };
-template <> struct OXCKindOf<Vec2> { static constexpr OXCKind kKind = OXCKind::Vec2f; };
-template <> struct OXCKindOf<Vec2i> { static constexpr OXCKind kKind = OXCKind::Vec2i; };
-template <> struct OXCKindOf<RGBf> { static constexpr OXCKind kKind = OXCKind::RGB; };
-template <> struct OXCKindOf<Color> { static constexpr OXCKind kKind = OXCKind::Color; };
-template <> struct OXCKindOf<std::string> { static constexpr OXCKind kKind = OXCKind::String; };
-template <> struct OXCKindOf<float> { static constexpr OXCKind kKind = OXCKind::Float; };
-template <> struct OXCKindOf<bool> { static constexpr OXCKind kKind = OXCKind::Bool; };
-template <> struct OXCKindOf<uint32_t> { static constexpr OXCKind kKind = OXCKind::UInt; };
-template <> struct OXCKindOf<int32_t> { static constexpr OXCKind kKind = OXCKind::Int; };
+template <>
+struct OXCKindOf<Mtx4> {
+    static constexpr OXCKind kKind = OXCKind::Mtx4;
+};
+template <>
+struct OXCKindOf<Vec3> {
+    static constexpr OXCKind kKind = OXCKind::Vec3;
+};
+template <>
+struct OXCKindOf<Vec2> {
+    static constexpr OXCKind kKind = OXCKind::Vec2f;
+};
+template <>
+struct OXCKindOf<Vec2i> {
+    static constexpr OXCKind kKind = OXCKind::Vec2i;
+};
+template <>
+struct OXCKindOf<RGBf> {
+    static constexpr OXCKind kKind = OXCKind::RGB;
+};
+template <>
+struct OXCKindOf<Color> {
+    static constexpr OXCKind kKind = OXCKind::Color;
+};
+template <>
+struct OXCKindOf<std::string> {
+    static constexpr OXCKind kKind = OXCKind::String;
+};
+template <>
+struct OXCKindOf<float> {
+    static constexpr OXCKind kKind = OXCKind::Float;
+};
+template <>
+struct OXCKindOf<bool> {
+    static constexpr OXCKind kKind = OXCKind::Bool;
+};
+template <>
+struct OXCKindOf<uint32_t> {
+    static constexpr OXCKind kKind = OXCKind::UInt;
+};
+template <>
+struct OXCKindOf<int32_t> {
+    static constexpr OXCKind kKind = OXCKind::Int;
+};
 
 /// Visitor over mutable values: one operation per kind.
 class OXCTypeVisitor {
@@ -319,27 +352,26 @@ public:
 
 /// Declares the table of enumeration E (written beside E, in E's namespace): its type name and
 /// its names, whose values are their positions. Names match exactly.
-#define OX_ENUM_NAMES(E, typeName, ...)                                                \
-    inline const ::ox::OXCEnumTable &oxcEnumTable(E *) {                               \
-        static const ::ox::OXCEnumTable table(typeName, false, {__VA_ARGS__});         \
-        return table;                                                                  \
-    }                                                                                  \
+#define OX_ENUM_NAMES(E, typeName, ...)                                        \
+    inline const ::ox::OXCEnumTable &oxcEnumTable(E *) {                       \
+        static const ::ox::OXCEnumTable table(typeName, false, {__VA_ARGS__}); \
+        return table;                                                          \
+    }                                                                          \
     static_assert(true)
 /// As OX_ENUM_NAMES, with names that match regardless of case.
-#define OX_ENUM_NAMES_FOLD(E, typeName, ...)                                           \
-    inline const ::ox::OXCEnumTable &oxcEnumTable(E *) {                               \
-        static const ::ox::OXCEnumTable table(typeName, true, {__VA_ARGS__});          \
-        return table;                                                                  \
-    }                                                                                  \
+#define OX_ENUM_NAMES_FOLD(E, typeName, ...)                                  \
+    inline const ::ox::OXCEnumTable &oxcEnumTable(E *) {                      \
+        static const ::ox::OXCEnumTable table(typeName, true, {__VA_ARGS__}); \
+        return table;                                                         \
+    }                                                                         \
     static_assert(true)
 /// Declares the table of enumeration E with explicit values: {"Adaptive", 1}, ...
-#define OX_ENUM_VALUES(E, typeName, ...)                                               \
-    inline const ::ox::OXCEnumTable &oxcEnumTable(E *) {                               \
-        static const ::ox::OXCEnumTable table(typeName, false,                         \
-                                              std::initializer_list<::ox::OXCEnumEntry>{ \
-                                                  __VA_ARGS__});                       \
-        return table;                                                                  \
-    }                                                                                  \
+#define OX_ENUM_VALUES(E, typeName, ...)                                              \
+    inline const ::ox::OXCEnumTable &oxcEnumTable(E *) {                              \
+        static const ::ox::OXCEnumTable table(                                        \
+            typeName, false, std::initializer_list<::ox::OXCEnumEntry>{__VA_ARGS__}); \
+        return table;                                                                 \
+    }                                                                                 \
     static_assert(true)
 
 /// The table of enumeration E.
@@ -440,8 +472,8 @@ public:
 class OXCTypeVector : public OXCTypeBase {
 public:
     /// A member of `owner` holding clones of `prototype` (a free-standing value).
-    OXCTypeVector(OXCComplexType *owner, std::string name,
-                  std::unique_ptr<OXCTypeBase> prototype, const char *description);
+    OXCTypeVector(OXCComplexType *owner, std::string name, std::unique_ptr<OXCTypeBase> prototype,
+                  const char *description);
     /// A free-standing vector.
     OXCTypeVector(std::string name, std::unique_ptr<OXCTypeBase> prototype);
 

@@ -42,8 +42,7 @@ bool parseFloat(std::string_view text, float &out) {
     if (!text.empty() && text[0] == '+') text.remove_prefix(1);
     if (text.empty() || text[0] == '+') return false;
     float v = 0.0f;
-    auto r = std::from_chars(text.data(), text.data() + text.size(), v,
-                             std::chars_format::general);
+    auto r = std::from_chars(text.data(), text.data() + text.size(), v, std::chars_format::general);
     if (r.ec != std::errc() || r.ptr != text.data() + text.size() || !std::isfinite(v))
         return false;
     out = v;

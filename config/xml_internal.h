@@ -1,12 +1,12 @@
 #pragma once
 
+#include <libxml/xmlerror.h>
+
 #include <cstdint>
 #include <memory>
 #include <string>
 #include <string_view>
 #include <vector>
-
-#include <libxml/xmlerror.h>
 
 #include "config/type.h"
 
@@ -41,12 +41,12 @@ private:
         enum Kind : uint8_t { Skip, Value, FloatPart, IntPart, Row };
         Kind kind = Skip;
         bool collectsText = false;
-        int children = 0;   // rows of a matrix, columns of a row
-        int row = 0;        // index of a matrix row
-        OXCTypeBase *value = nullptr;  // Value, Row (the matrix)
-        void *part = nullptr;          // FloatPart, IntPart
-        OXCTypeVector *vector = nullptr;        // owner of a pending entry
-        std::unique_ptr<OXCTypeBase> entry;     // a vector entry being read
+        int children = 0;                    // rows of a matrix, columns of a row
+        int row = 0;                         // index of a matrix row
+        OXCTypeBase *value = nullptr;        // Value, Row (the matrix)
+        void *part = nullptr;                // FloatPart, IntPart
+        OXCTypeVector *vector = nullptr;     // owner of a pending entry
+        std::unique_ptr<OXCTypeBase> entry;  // a vector entry being read
         size_t textStart = 0;
     };
 

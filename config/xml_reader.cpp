@@ -31,8 +31,10 @@ bool collectsText(OXCKind k) {
         case OXCKind::Float:
         case OXCKind::Bool:
         case OXCKind::UInt:
-        case OXCKind::Int: return true;
-        default: return false;
+        case OXCKind::Int:
+            return true;
+        default:
+            return false;
     }
 }
 
@@ -57,7 +59,8 @@ float *floatPart(OXCTypeBase &v, std::string_view name) {
             Color &p = static_cast<OXCType<Color> &>(v).ref();
             return c == 'r' ? &p.r : c == 'g' ? &p.g : c == 'b' ? &p.b : c == 'a' ? &p.a : nullptr;
         }
-        default: return nullptr;
+        default:
+            return nullptr;
     }
 }
 
@@ -118,7 +121,8 @@ void ValueReader::startElement(std::string_view name) {
             unknownMember(name, "r");
             return pushSkip();
         }
-        case Frame::Value: break;
+        case Frame::Value:
+            break;
     }
 
     OXCTypeBase &v = *top.value;
@@ -187,13 +191,14 @@ void ValueReader::storeText(Frame &frame, std::string_view raw) {
     }
     OXCTypeBase &v = *frame.value;
     switch (v.kind()) {
-        case OXCKind::String: static_cast<OXCType<std::string> &>(v).ref().assign(text); break;
+        case OXCKind::String:
+            static_cast<OXCType<std::string> &>(v).ref().assign(text);
+            break;
         case OXCKind::Float:
             if (!parseFloat(text, static_cast<OXCType<float> &>(v).ref())) conversionError(text);
             break;
         case OXCKind::Int:
-            if (!parseInt32(text, static_cast<OXCType<int32_t> &>(v).ref()))
-                conversionError(text);
+            if (!parseInt32(text, static_cast<OXCType<int32_t> &>(v).ref())) conversionError(text);
             break;
         case OXCKind::UInt:
             if (!parseUInt32(text, static_cast<OXCType<uint32_t> &>(v).ref()))
@@ -205,12 +210,13 @@ void ValueReader::storeText(Frame &frame, std::string_view raw) {
         case OXCKind::Enum: {
             auto &e = static_cast<OXCEnumBase &>(v);
             if (!e.setFromString(text))
-                messageText(kMsgWarning, 1,
-                            "Warning, could not set value " + std::string(text) + " for enum " +
-                                e.name());
+                messageText(
+                    kMsgWarning, 1,
+                    "Warning, could not set value " + std::string(text) + " for enum " + e.name());
             break;
         }
-        default: break;
+        default:
+            break;
     }
 }
 
@@ -297,7 +303,8 @@ void initXml() {
     std::call_once(once, [] { xmlInitParser(); });
 }
 
-// ---- library errors ------------------------------------------------------------------------------
+// ---- library errors
+// ------------------------------------------------------------------------------
 
 namespace {
 
@@ -336,7 +343,8 @@ void XmlErrorCapture::record(int line, const char *text) {
 
 }  // namespace xmldetail
 
-// ---- the tree reader -----------------------------------------------------------------------------
+// ---- the tree reader
+// -----------------------------------------------------------------------------
 
 namespace {
 
@@ -389,8 +397,7 @@ void walkTree(xmlNode *root, ValueReader &reader) {
                 continue;
             }
             reader.endElement();
-        } else if ((n->type == XML_TEXT_NODE || n->type == XML_CDATA_SECTION_NODE) &&
-                   n->content) {
+        } else if ((n->type == XML_TEXT_NODE || n->type == XML_CDATA_SECTION_NODE) && n->content) {
             reader.characters(reinterpret_cast<const char *>(n->content));
         }
         // Entity references are never expanded: their text is not part of any value.
@@ -416,8 +423,8 @@ bool loadDocument(std::string_view data, OXCTypeBase &root, const std::string &d
         message(kMsgError, 1, "Error parsing file %s in xmlsource", displayName.c_str());
         return false;
     }
-    xmlDocPtr doc = xmlCtxtReadMemory(ctxt, data.data(), int(data.size()), "noname.xml", nullptr,
-                                      kOptions);
+    xmlDocPtr doc =
+        xmlCtxtReadMemory(ctxt, data.data(), int(data.size()), "noname.xml", nullptr, kOptions);
     xmlFreeParserCtxt(ctxt);
     if (!doc) {
         if (!errors.firstError().empty())

@@ -102,7 +102,8 @@ struct SaxCallbacks {
         auto *p = static_cast<Parse *>(ctx);
         if (p->depth < 3 || !p->object) return;
         try {
-            p->reader.characters(std::string_view(reinterpret_cast<const char *>(text), size_t(len)));
+            p->reader.characters(
+                std::string_view(reinterpret_cast<const char *>(text), size_t(len)));
         } catch (const std::bad_alloc &) {
             p->exception = true;
             p->stop();

@@ -142,7 +142,9 @@ private:
         if (rc < 0) ok_ = false;
         return ok_;
     }
-    bool start(const std::string &name) { return ok_ && check(xmlTextWriterStartElement(w_, X(name.c_str()))); }
+    bool start(const std::string &name) {
+        return ok_ && check(xmlTextWriterStartElement(w_, X(name.c_str())));
+    }
     bool start(const char *name) { return ok_ && check(xmlTextWriterStartElement(w_, X(name))); }
     void end() {
         if (ok_) check(xmlTextWriterEndElement(w_));
@@ -378,17 +380,20 @@ bool writeFileAtomically(const std::string &fileName, const char *encoding,
     int err = sink.error;
     if (ok && ::fsync(fd) != 0 && errno != EINVAL && errno != EROFS) {
         err = errno;
-        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(), std::strerror(err));
+        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
+                std::strerror(err));
         ok = false;
     }
     if (::close(fd) != 0 && ok) {
         err = errno;
-        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(), std::strerror(err));
+        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
+                std::strerror(err));
         ok = false;
     }
     if (ok && ::rename(temp.c_str(), fileName.c_str()) != 0) {
         err = errno;
-        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(), std::strerror(err));
+        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
+                std::strerror(err));
         ok = false;
     }
     if (!ok) {

@@ -1,8 +1,9 @@
+#include "config/type.h"
+
 #include <gtest/gtest.h>
 
 #include <type_traits>
 
-#include "config/type.h"
 #include "config/xml.h"
 #include "tests/config/test_settings.h"
 
@@ -143,8 +144,7 @@ TEST(ConfigType, AssignmentByName) {
     EXPECT_FLOAT_EQ(target.inner.gamma.get(), 2.2f);
     EXPECT_EQ(target.placement.get().m[3][0], 5.0f);
     ASSERT_EQ(target.files.size(), 5u);  // appended after the entries it had
-    EXPECT_EQ(target.files.values(),
-              (std::vector<std::string>{"keep1", "keep2", "x", "y", "z"}));
+    EXPECT_EQ(target.files.values(), (std::vector<std::string>{"keep1", "keep2", "x", "y", "z"}));
     ASSERT_EQ(target.targets.size(), 1u);
     EXPECT_EQ(target.targets[0].name.get(), "t1");
 

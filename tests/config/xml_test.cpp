@@ -1,3 +1,5 @@
+#include "config/xml.h"
+
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
@@ -9,9 +11,8 @@
 #include <fstream>
 #include <sstream>
 
-#include "config/type.h"
 #include "config/input_list.h"
-#include "config/xml.h"
+#include "config/type.h"
 #include "tests/config/test_settings.h"
 
 using namespace cfgtest;
@@ -379,13 +380,16 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
     for (int i = 0; i < 50; ++i)
         doc += "<Thing><Name>t" + std::to_string(i) +
                "</Name><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r/><r/>"
-               "<r><c>" + std::to_string(i) + "</c></r></ObjectToWorld>"
+               "<r><c>" +
+               std::to_string(i) +
+               "</c></r></ObjectToWorld>"
                "<Links><element>a</element><element>b</element></Links></Thing>\n";
-    doc += "<Other><Name>x</Name></Other>\n"
-           "<Thing><Name>odd</Name><Bogus>1</Bogus><Links><link>q</link></Links>"
-           "<Ramp><Target><name>r</name></Target><element/></Ramp>"
-           "<Samples>many</Samples><EnvironmentType> BALL </EnvironmentType></Thing>\n"
-           "</OXScene>\n";
+    doc +=
+        "<Other><Name>x</Name></Other>\n"
+        "<Thing><Name>odd</Name><Bogus>1</Bogus><Links><link>q</link></Links>"
+        "<Ramp><Target><name>r</name></Target><element/></Ramp>"
+        "<Samples>many</Samples><EnvironmentType> BALL </EnvironmentType></Thing>\n"
+        "</OXScene>\n";
     gLive = gMaxLive = 0;
     CaptureStdout();
     ASSERT_TRUE(sax.parseMemory(doc));
