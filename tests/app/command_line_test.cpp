@@ -142,8 +142,8 @@ TEST(CommandLine, InputListsAreExpandedAfterDirectArguments) {
         out.push_back(file + ":2");
         return true;
     };
-    Parsed p = parse({"-i", "a.xml", "s.xml", "-i", "b.xml", "-ri", "r.xml", "-im", "t", "x.exr"},
-                     loader);
+    Parsed p =
+        parse({"-i", "a.xml", "s.xml", "-i", "b.xml", "-ri", "r.xml", "-im", "t", "x.exr"}, loader);
     ASSERT_TRUE(p.ok) << p.out;
     EXPECT_EQ(p.options.inputFiles, (Args{"s.xml", "a.xml:1", "a.xml:2", "b.xml:1", "b.xml:2"}));
     EXPECT_EQ(p.options.imageInputs, (Args{"x.exr", "r.xml:1", "r.xml:2"}));

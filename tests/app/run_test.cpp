@@ -53,6 +53,11 @@ struct RecordingDriver : ox::RunDriverInterface {
         directory = c.outputDirectory;
         format = c.format;
         threads = c.renderThreads;
+        // The settings live only as long as the run, so the driver looks at them now.
+        if (auto *d = dynamic_cast<ox::DefaultRunSettings *>(&c.settings)) {
+            fgUseLegacy = d->fgUseLegacy;
+            renderType = d->renderTypeValue;
+        }
         c.statistics.beginPass("beauty");
         c.progress.setProgress(1.0f);
         c.progress.finish();
@@ -62,6 +67,8 @@ struct RecordingDriver : ox::RunDriverInterface {
     std::string baseName, directory;
     int32_t format = -1;
     int64_t threads = -1;
+    bool fgUseLegacy = false;
+    int32_t renderType = -1;
     int32_t result = 0;
 };
 
@@ -91,7 +98,7 @@ TEST(RunSteps, ActionsFromAndIntoRenderType) {
         EXPECT_EQ(ox::resolveAction(ox::kActionNone, s), fromType[type]);
         EXPECT_EQ(s.fgUseLegacy, type == 2 || type == 4 || type == 5);
     }
-    const std::pair<int32_t, int32_t> intoType[] = {{1, 0}, {2, 1}, {3, 3}, {4, 2},
+    const std::pair<int32_t, int32_t> intoType[] = {{1, 0}, {2, 1},  {3, 3},  {4, 2},
                                                     {5, 4}, {16, 5}, {17, 3}, {19, 3}};
     for (const auto &[action, type] : intoType) {
         ox::DefaultRunSettings s;
@@ -226,14 +233,12 @@ TEST_F(RunTest, InputChecks) {
 
 TEST_F(RunTest, TheRunPlugsInDriversListsAndSettings) {
     auto driver = std::make_shared<RecordingDriver>();
-    ox::DefaultRunSettings *seen = nullptr;
     ox::RunEnvironment env;
     env.makeSettings = [&] {
         auto s = std::make_unique<ox::DefaultRunSettings>();
         s->verbosity.debugFile = true;
         s->verbosity.benchmarkPrint = true;
         s->renderTypeValue = 4;  // VertexTransfer
-        seen = s.get();
         return s;
     };
     env.loadInputList = [](const std::string &, std::vector<std::string> &out) {
@@ -253,7 +258,8 @@ TEST_F(RunTest, TheRunPlugsInDriversListsAndSettings) {
     EXPECT_EQ(driver->directory, "out/");
     EXPECT_EQ(driver->format, ox::kFormatTga);
     EXPECT_EQ(driver->threads, 3);
-    EXPECT_TRUE(seen->fgUseLegacy);
+    EXPECT_TRUE(driver->fgUseLegacy);
+    EXPECT_EQ(driver->renderType, 4);
     EXPECT_NE(out.find("[INFO]     Detected 3 cores, using 3 cores\n"), std::string::npos);
     EXPECT_NE(out.find("[BENCH]    Statistics for this run:\n[BENCH]    Pass 1: beauty ("),
               std::string::npos)
@@ -268,13 +274,17 @@ TEST_F(RunTest, TheRunPlugsInDriversListsAndSettings) {
     driver->result = ox::kStatusAborted;
     testing::internal::CaptureStdout();
     EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-vt"}, env), ox::kStatusAborted);
+    EXPECT_EQ(driver->renderType, 4);
+    env.drivers.set(ox::kActionRender, driver);
+    EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-r", "-d", "-q"}, env), ox::kStatusAborted);
+    EXPECT_EQ(driver->renderType, 0);  // the option was written back before the driver ran
+    EXPECT_FALSE(driver->fgUseLegacy);
     EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-b"}, env), ox::kStatusUnsupported);
     const std::string out2 = testing::internal::GetCapturedStdout();
     EXPECT_NE(out2.find("[ERROR]    The texture bake (-b) is not available: this build has no "
                         "driver for it.\n"),
               std::string::npos)
         << out2;
-    EXPECT_EQ(seen->renderTypeValue, 1);  // the option was written back before the driver
 }
 
 TEST_F(RunTest, WritingTheDefaultsReportsPlatformErrors) {

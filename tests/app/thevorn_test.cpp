@@ -35,8 +35,8 @@ protected:
     void TearDown() override { fs::remove_all(dir_); }
 
     Result run(const std::vector<std::string> &args, const std::string &env = "") {
-        std::string command = "cd " + quote(dir_.string()) + " && " + env + " " +
-                              quote(OX_BINARY_DIR "/app/thevorn");
+        std::string command =
+            "cd " + quote(dir_.string()) + " && " + env + " " + quote(OX_BINARY_DIR "/app/thevorn");
         for (const auto &a : args) command += " " + quote(a);
         command += " > console.txt 2>&1";
         const int status = std::system(command.c_str());
@@ -56,14 +56,16 @@ protected:
 };
 
 constexpr const char *kBanner = "[INFO]     Zarnex Vorn (Rev: 179347)\n";
-constexpr const char *kUsageStart = "[ERROR]    thevorn <scene.xml> -o <outfile> -x <configuration.xml>\n";
+constexpr const char *kUsageStart =
+    "[ERROR]    thevorn <scene.xml> -o <outfile> -x <configuration.xml>\n";
 
 TEST_F(Thevorn, NoArgumentsPrintsTheSyntaxLineAndUsage) {
     const Result r = run({});
     EXPECT_EQ(r.exitCode, 2);
     EXPECT_EQ(r.out.rfind(std::string(kBanner) +
                               "Syntax error, the chosen command requires a scene but no input "
-                              "filename was specified.\n" + kUsageStart,
+                              "filename was specified.\n" +
+                              kUsageStart,
                           0),
               0u)
         << r.out;
@@ -142,8 +144,8 @@ TEST_F(Thevorn, LinesThatLetTheRunGoOnAndTheOutputTree) {
     EXPECT_TRUE(has(r, "[INFO]     Detected "));
     EXPECT_TRUE(has(r, "[ERROR]    The camera render (-r) is not available"));
     EXPECT_FALSE(has(r, "[ERROR]    thevorn <scene.xml>"));
-    for (const char *sub : {"out", "out/GI", "out/GI/fgMaps", "out/GI/ptMaps",
-                            "out/GI/photonMaps", "out/GI/occMaps"})
+    for (const char *sub :
+         {"out", "out/GI", "out/GI/fgMaps", "out/GI/ptMaps", "out/GI/photonMaps", "out/GI/occMaps"})
         EXPECT_TRUE(fs::is_directory(dir_ / sub)) << sub;
 }
 
