@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <map>
 
 namespace {
 
@@ -49,48 +48,6 @@ TEST(CommandLine, DefaultsAndPlainArguments) {
     EXPECT_EQ(p.options.patArgument, "x");
     EXPECT_EQ(p.options.priority, ox::kCommandPriorityLow);
     EXPECT_EQ(p.options.renderThreads, 12);  // stream extraction stops at the letters
-}
-
-TEST(CommandLine, EverySyntaxMessage) {
-    const std::vector<std::pair<std::string, Args>> cases = {
-        {"Syntax error, -x needs argument.", {"s.xml", "-x"}},
-        {"Syntax error, -x needs argument.", {"s.xml", "-x", "-r"}},
-        {"Syntax error, more than one output file specified", {"s", "-o", "a", "-o"}},
-        {"Syntax error, -o needs argument.", {"s", "-o"}},
-        {"Syntax error, more than one output directory specified", {"s", "-od", "a", "-od"}},
-        {"Syntax error, -od needs argument.", {"s", "-od", ""}},
-        {"Syntax error, -spl needs <num> argument.", {"-spl", "0"}},
-        {"Syntax error, -spl needs <num> argument.", {"-spl", "many"}},
-        {"Syntax error, -pat needs argument.", {"s", "-pat"}},
-        {"Syntax error, -p needs argument.", {"s", "-p"}},
-        {"Syntax error, -i needs argument.", {"s", "-i"}},
-        {"Syntax error, -pi needs argument.", {"s", "-pi"}},
-        {"Syntax error, -ri needs argument.", {"s", "-ri"}},
-        {"Syntax error, -rt needs argument.", {"s", "-rt"}},
-        {"Syntax error, unknown option -R", {"s", "-R"}},
-        {"Syntax error, unknown option -", {"s", "-"}},
-        {"Syntax error, too many actions specified.", {"-c", "-xs"}},
-        {"Syntax error, too many file formats specified.", {"s", "-t", "-j"}},
-        {"Syntax error, -rm needs at least one image to merge.", {"s", "-rm", "target"}},
-        {"Syntax error, -im needs at least one image to merge.", {"s", "-im"}},
-        {"Syntax error, -pm needs at least one pointcloud to merge.", {"-pm"}},
-        {"Syntax error, -pmpt needs at least one pointcloud to merge.", {"-pmpt", "1", "2"}},
-        {"Syntax error, the chosen command requires a scene but no input filename was "
-         "specified.",
-         {}},
-        {"Syntax error, the chosen command requires a scene but no input filename was "
-         "specified.",
-         {"-b", "-x", "c.xml"}},
-    };
-    for (const auto &[message, args] : cases) {
-        const Parsed p = parse(args);
-        EXPECT_FALSE(p.ok) << message;
-        EXPECT_EQ(p.out, message + "\n");
-    }
-    // Two configuration files fail without a line of their own.
-    const Parsed two = parse({"s", "-x", "a.xml", "b.xml"});
-    EXPECT_FALSE(two.ok);
-    EXPECT_EQ(two.out, "");
 }
 
 TEST(CommandLine, LinesThatLetParsingGoOn) {
