@@ -1,4 +1,5 @@
 #include "app/run.h"
+#include "config/input_list.h"
 #include "platform/system.h"
 
 namespace ox {
@@ -7,7 +8,7 @@ RunEnvironment defaultRunEnvironment() {
     RunEnvironment env;
     // The configuration, the input-list reader and the drivers plug in here as they arrive.
     env.makeSettings = [] { return std::make_unique<DefaultRunSettings>(); };
-    env.loadInputList = loadNoInputList;
+    env.loadInputList = loadInputList;
     env.processorCount = [] { return processorCount(); };
     return env;
 }

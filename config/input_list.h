@@ -19,9 +19,8 @@ public:
 /// The concrete input list object.
 using InputSpecification = OXCComplexTypeInstantiator<InputSpecificationBase>;
 
-/// Appends the files named by each list file, list files in the given order, to `out`. A list
-/// that cannot be loaded prints "Unable to load input file list from file: " + its name and
-/// makes the whole expansion fail (nothing is appended then).
-bool expandInputLists(const std::vector<std::string> &listFiles, std::vector<std::string> &out);
+/// Reads one list file and appends its "filelist" entries, in order, to `out`. False when the
+/// file cannot be loaded (the reader has reported why; nothing is appended then).
+bool loadInputList(const std::string &file, std::vector<std::string> &out);
 
 }  // namespace ox
