@@ -96,12 +96,15 @@ TEST_F(Thevorn, EverySyntaxMessageEndsWithTheUsage) {
         {{"s.xml", "-im", "target"}, "Syntax error, -im needs at least one image to merge."},
         {{"-pmbo", "0.5"}, "Syntax error, -pmbo needs at least one pointcloud to merge."},
         {{"s.xml", "-i", "list.xml"},
+         "[ERROR]    Error opening file list.xml in xmlsource\n"  // the reader's reason
          "Unable to load input file list from file: list.xml\n"
          "Unable to build list of input files."},
         {{"-pm", "-pi", "p.xml"},
+         "[ERROR]    Error opening file p.xml in xmlsource\n"  // the reader's reason
          "Unable to load input file list from file: p.xml\n"
          "Unable to build list of point cloud input files."},
         {{"s.xml", "-ri", "r.xml"},
+         "[ERROR]    Error opening file r.xml in xmlsource\n"  // the reader's reason
          "Unable to load input file list from file: r.xml\n"
          "Unable to build list of image merge input files."},
     };
