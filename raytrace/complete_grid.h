@@ -1,0 +1,119 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "core/types.h"
+#include "raytrace/grid.h"
+#include "raytrace/ray.h"
+
+namespace ox {
+
+class MotionBlurHandler;
+
+/// The query interface of the built acceleration structure.
+class ADSInterface {
+public:
+    virtual ~ADSInterface();
+    /// Closest hit with 1e-6 < t < tmax; counts the ray in counter (may be null).
+    virtual bool intersect(const Ray &ray, Hit &hit, float tmax, RayCounter *counter) const = 0;
+    /// Closest hit without a distance limit.
+    virtual bool intersect(const Ray &ray, Hit &hit, RayCounter *counter) const {
+        return intersect(ray, hit, 3.4028235e38f, counter);
+    }
+    /// Closest hit in the second structure kept beside the main one.
+    virtual bool intersectSecond(const Ray &ray, Hit &hit, float tmax,
+                                 RayCounter *counter) const = 0;
+    /// Bounding box of the scene.
+    virtual BBox bounds() const = 0;
+    /// True when anything visible to the ray's type lies at 1e-6 < t < tmax (any hit, early exit).
+    virtual bool occluded(const Ray &ray, float tmax, RayCounter *counter) const = 0;
+};
+
+/// How instances are chosen for instancing (values as the settings number them).
+enum InstancingType : int { kInstancingNever = 0, kInstancingAutoDetect = 1, kInstancingAlways = 2 };
+
+/// The settings of the acceleration structure, as plain values.
+struct ADSParameters {
+    uint32_t gridMaxDepth = 4;
+    uint32_t gridThreshold = 25;
+    float gridDensity = 1.0f;
+    bool useSSE = true;
+    int useInstancing = kInstancingAutoDetect;
+    uint32_t instancingThreshold = 500;
+    /// Instances with one of these flag bits also go into the second structure.
+    uint32_t secondStructureMask = kFlagEnvelop;
+};
+
+/// Object-space triangle mesh as the grid reads it (borrowed, not copied).
+struct MeshInput {
+    const Vec3 *positions = nullptr;
+    size_t vertexCount = 0;
+    const uint32_t *indices = nullptr;  ///< Three per triangle.
+    size_t triangleCount = 0;
+};
+
+/// One scene instance as handed to the grid.
+struct InstanceInput {
+    std::string name;
+    uint32_t shape = 0;               ///< Shape identity: instances of one shape share it.
+    MeshInput mesh;
+    Mtx4 objectToWorld;
+    uint32_t flags = 0;               ///< RenderStats flag word.
+    uint32_t index = kNoInstance;     ///< Scene instance index reported in hits.
+    bool displaced = false;           ///< Material uses render-time displacement.
+    std::vector<Mtx4> stepTransforms;       ///< Per-step placements (motion), or empty.
+    std::vector<const Vec3 *> stepPositions;  ///< Per-step deformed positions, or empty.
+};
+
+/// The acceleration structure of a scene: one top-level Grid over the scene's primitives, shape
+/// grids reached through instance grids, and a second structure.
+class CompleteGrid final : public ADSInterface {
+public:
+    CompleteGrid();
+    ~CompleteGrid() override;
+
+    /// Builds over the instances. False (with the error message) when the scene box is broken.
+    bool build(const std::vector<InstanceInput> &instances, const ADSParameters &params,
+               const MotionBlurHandler *motion = nullptr);
+
+    bool intersect(const Ray &ray, Hit &hit, float tmax, RayCounter *counter) const override;
+    using ADSInterface::intersect;
+    bool intersectSecond(const Ray &ray, Hit &hit, float tmax,
+                         RayCounter *counter) const override;
+    BBox bounds() const override { return box_; }
+    bool occluded(const Ray &ray, float tmax, RayCounter *counter) const override;
+
+    /// Whether the instance was chosen for instancing (before the displacement/motion copy rule).
+    static bool choosesInstancing(int useInstancing, uint32_t instancingThreshold,
+                                  size_t shapeUses, size_t shapeTriangles);
+
+    /// Number of primitives in the top-level store (triangles, moving triangles, instances).
+    size_t primitiveCount() const;
+    /// Number of instance-grid primitives.
+    size_t shapeGridCount() const { return store_.instances.size(); }
+    /// Number of shape base grids built.
+    size_t shapeBaseGridCount() const { return shapes_.size(); }
+    /// Bytes held by the structure (grids, stores, shape grids).
+    size_t sizeBytes() const;
+    /// The top-level grid.
+    const Grid &grid() const { return grid_; }
+
+private:
+    struct ShapeGrid {
+        PrimitiveStore store;
+        Grid grid;
+    };
+    template <bool kAny>
+    bool query(const Grid &grid, const PrimitiveStore &store, const Ray &ray, Hit *hit, float tmax,
+               RayCounter *counter) const;
+
+    PrimitiveStore store_, secondStore_;
+    Grid grid_, second_;
+    std::vector<std::unique_ptr<ShapeGrid>> shapes_;
+    BBox box_;
+};
+
+}  // namespace ox

@@ -1,0 +1,533 @@
+#include "raytrace/grid.h"
+
+#include <algorithm>
+#include <cmath>
+#include <string>
+
+#include "core/message.h"
+#include "raytrace/motion_blur.h"
+
+namespace ox {
+
+namespace {
+
+constexpr double kMaxCells = double(1u << 28);
+
+bool boxesOverlap(const BBox &a, const BBox &b) {
+    return a.min.x <= b.max.x && a.max.x >= b.min.x && a.min.y <= b.max.y &&
+           a.max.y >= b.min.y && a.min.z <= b.max.z && a.max.z >= b.min.z;
+}
+
+struct D3 {
+    double x, y, z;
+};
+D3 sub(const D3 &a, const D3 &b) { return {a.x - b.x, a.y - b.y, a.z - b.z}; }
+D3 crossD(const D3 &a, const D3 &b) {
+    return {a.y * b.z - a.z * b.y, a.z * b.x - a.x * b.z, a.x * b.y - a.y * b.x};
+}
+double dotD(const D3 &a, const D3 &b) { return a.x * b.x + a.y * b.y + a.z * b.z; }
+
+// Separating-axis test of a triangle against a box (the nine edge cross axes, the box faces and
+// the triangle plane), in double precision.
+bool triangleBoxOverlap(const Vec3 &a, const Vec3 &b, const Vec3 &c, const BBox &box) {
+    D3 center{0.5 * (double(box.min.x) + box.max.x), 0.5 * (double(box.min.y) + box.max.y),
+              0.5 * (double(box.min.z) + box.max.z)};
+    D3 h{0.5 * (double(box.max.x) - box.min.x), 0.5 * (double(box.max.y) - box.min.y),
+         0.5 * (double(box.max.z) - box.min.z)};
+    D3 v[3] = {sub({a.x, a.y, a.z}, center), sub({b.x, b.y, b.z}, center),
+               sub({c.x, c.y, c.z}, center)};
+    // Box faces.
+    for (int axis = 0; axis < 3; ++axis) {
+        double lo = std::min({(&v[0].x)[axis], (&v[1].x)[axis], (&v[2].x)[axis]});
+        double hi = std::max({(&v[0].x)[axis], (&v[1].x)[axis], (&v[2].x)[axis]});
+        if (lo > (&h.x)[axis] || hi < -(&h.x)[axis]) return false;
+    }
+    D3 e[3] = {sub(v[1], v[0]), sub(v[2], v[1]), sub(v[0], v[2])};
+    const D3 axes[3] = {{1, 0, 0}, {0, 1, 0}, {0, 0, 1}};
+    for (const D3 &edge : e)
+        for (const D3 &u : axes) {
+            D3 l = crossD(u, edge);
+            double p0 = dotD(v[0], l), p1 = dotD(v[1], l), p2 = dotD(v[2], l);
+            double r = h.x * std::fabs(l.x) + h.y * std::fabs(l.y) + h.z * std::fabs(l.z);
+            if (std::min({p0, p1, p2}) > r || std::max({p0, p1, p2}) < -r) return false;
+        }
+    D3 n = crossD(e[0], e[1]);
+    double d = dotD(n, v[0]);
+    double r = h.x * std::fabs(n.x) + h.y * std::fabs(n.y) + h.z * std::fabs(n.z);
+    return std::fabs(d) <= r;
+}
+
+std::string boxText(const BBox &b) {
+    char buf[256];
+    std::snprintf(buf, sizeof buf, "min (%g, %g, %g) max (%g, %g, %g)", b.min.x, b.min.y, b.min.z,
+                  b.max.x, b.max.y, b.max.z);
+    return buf;
+}
+
+}  // namespace
+
+BBox PrimitiveStore::bounds(uint32_t code) const {
+    uint32_t index = code & kItemIndexMask;
+    switch (code >> kItemIndexBits) {
+        case kItemTriangle:
+            return triangles[index].bounds();
+        case kItemMotion:
+            return motion[index].box;
+        case kItemInstance:
+            return instances[index].box;
+        default:
+            return BBox();
+    }
+}
+
+size_t PrimitiveStore::sizeBytes() const {
+    return triangles.capacity() * sizeof(IntersectTriangle) +
+           motion.capacity() * sizeof(MotionTriangle) + motionCorners.capacity() * sizeof(Vec3) +
+           instances.capacity() * sizeof(IntersectInstanceGrid);
+}
+
+BBox Grid::widen(const BBox &box) {
+    BBox out;
+    for (int a = 0; a < 3; ++a) {
+        float c = 0.5f * (box.min[a] + box.max[a]);
+        float extent = box.max[a] - box.min[a];
+        float h = 0.5f * extent * 1.001f;
+        if (extent < 0.0015f) h += 0.0015f;
+        out.min[a] = c - h;
+        out.max[a] = c + h;
+    }
+    return out;
+}
+
+bool Grid::boxUsable(const BBox &box) {
+    for (int a = 0; a < 3; ++a) {
+        float extent = box.max[a] - box.min[a];
+        if (!std::isfinite(extent) || !(extent >= 0.0f)) return false;
+    }
+    return true;
+}
+
+GridResolution Grid::resolution(uint64_t n, double dx, double dy, double dz, float density) {
+    GridResolution r;
+    if (n == 0) return r;
+    double dens = (density > 0.0f && std::isfinite(density)) ? double(density) : 1.0;
+    double limit = std::min(8.0 * double(n), kMaxCells);
+    double t = std::min(double(n) * dens, limit);
+    double nz = std::ceil(std::cbrt(t * dz * dz / (dx * dy)));
+    auto clampAxis = [&](double v) {
+        if (!std::isfinite(v) || v < 1.0) return 1.0;
+        return std::min(v, limit);
+    };
+    nz = clampAxis(nz);
+    double ny = clampAxis(std::ceil(std::sqrt(t * dy / (dx * nz))));
+    double nx = clampAxis(std::ceil(t / (ny * nz)));
+    // Bound the total: shrink all axes together until the product fits.
+    while (nx * ny * nz > limit) {
+        double f = std::cbrt(limit / (nx * ny * nz));
+        double nnx = std::max(1.0, std::floor(nx * f)), nny = std::max(1.0, std::floor(ny * f)),
+               nnz = std::max(1.0, std::floor(nz * f));
+        if (nnx == nx && nny == ny && nnz == nz) {
+            // Rounding kept the product; take one cell from the largest axis.
+            double &m = nx >= ny && nx >= nz ? nnx : (ny >= nz ? nny : nnz);
+            m = std::max(1.0, m - 1.0);
+        }
+        nx = nnx, ny = nny, nz = nnz;
+    }
+    r.nx = int64_t(nx), r.ny = int64_t(ny), r.nz = int64_t(nz);
+    return r;
+}
+
+bool Grid::build(const PrimitiveStore &store, const std::vector<uint32_t> &prims, const BBox &box,
+                 const GridParams &params, uint32_t depth, bool widenBox) {
+    if (!prepare(store, prims, box, params, depth, widenBox)) return false;
+    if (nx_ > 0) refine();
+    return true;
+}
+
+bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &prims,
+                   const BBox &box, const GridParams &params, uint32_t depth, bool widenBox) {
+    store_ = &store;
+    params_ = params;
+    params_.maxDepth = std::min(params.maxDepth, kMaxDepthLimit);
+    depth_ = depth;
+    mode_ = params.sse ? 3 : 2;
+    cellBegin_.clear();
+    items_.clear();
+    packets_.clear();
+    children_.clear();
+    stats_ = GridStats();
+    nx_ = ny_ = nz_ = 0;
+    box_ = BBox(Vec3(), Vec3());
+    if (prims.empty()) return true;
+    if (!boxUsable(box)) {
+        message(kMsgError, 1, "Scene Bounding Box is broken, not rendering (%s)\n",
+                boxText(box).c_str());
+        return false;
+    }
+    BBox b = widenBox ? widen(box) : box;
+    if (!boxUsable(b)) {
+        message(kMsgError, 1, "Scene Bounding Box is broken, not rendering (%s)\n",
+                boxText(box).c_str());
+        return false;
+    }
+    Vec3 ext = b.extent();
+    if (!(ext.x > 0.0f && ext.y > 0.0f && ext.z > 0.0f)) {
+        // A nested grid over a flat cell cannot be subdivided meaningfully; the caller keeps the
+        // cell's list (the top-level box is always widened and never lands here).
+        return false;
+    }
+    box_ = b;
+    GridResolution res = resolution(prims.size(), ext.x, ext.y, ext.z, params.density);
+    nx_ = res.nx, ny_ = res.ny, nz_ = res.nz;
+    cellSize_ = {ext.x / float(nx_), ext.y / float(ny_), ext.z / float(nz_)};
+    invCellSize_ = {float(nx_) / ext.x, float(ny_) / ext.y, float(nz_) / ext.z};
+    tolerance_ = std::max(0.001f, 1e-5f * cellSize_.length());
+    // Cells take their primitives with a small margin, so that a ray walking next to a cell
+    // boundary finds a triangle that only touches the neighbouring cell. The tolerance, bounded
+    // by a twentieth of the smallest cell, plus the float resolution of the coordinates.
+    float maxAbs = std::max({std::fabs(b.min.x), std::fabs(b.min.y), std::fabs(b.min.z),
+                             std::fabs(b.max.x), std::fabs(b.max.y), std::fabs(b.max.z)});
+    float minCell = std::min({cellSize_.x, cellSize_.y, cellSize_.z});
+    margin_ = std::min(tolerance_, 0.05f * minCell) + 4e-7f * maxAbs;
+    insertAll(prims);
+    return true;
+}
+
+int64_t Grid::cellCoord(float v, int axis) const {
+    float n = float(axis == 0 ? nx_ : axis == 1 ? ny_ : nz_);
+    float f = std::floor((v - box_.min[axis]) * invCellSize_[axis]);
+    // Clamp in floating point first: NaN and huge values never reach the integer conversion.
+    f = std::fmin(std::fmax(f, 0.0f), n - 1.0f);
+    return int64_t(f);
+}
+
+BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
+    BBox c;
+    c.min = {box_.min.x + float(x) * cellSize_.x, box_.min.y + float(y) * cellSize_.y,
+             box_.min.z + float(z) * cellSize_.z};
+    c.max = {x + 1 == nx_ ? box_.max.x : box_.min.x + float(x + 1) * cellSize_.x,
+             y + 1 == ny_ ? box_.max.y : box_.min.y + float(y + 1) * cellSize_.y,
+             z + 1 == nz_ ? box_.max.z : box_.min.z + float(z + 1) * cellSize_.z};
+    return c;
+}
+
+bool Grid::overlaps(uint32_t code, const BBox &b, const BBox &cell) const {
+    BBox grown(cell.min - Vec3(margin_, margin_, margin_), cell.max + Vec3(margin_, margin_, margin_));
+    if (!boxesOverlap(b, grown)) return false;
+    if ((code >> kItemIndexBits) == kItemTriangle) {
+        const IntersectTriangle &t = store_->triangles[code & kItemIndexMask];
+        return triangleBoxOverlap(t.p0, t.p0 + t.e1, t.p0 + t.e2, grown);
+    }
+    return true;
+}
+
+void Grid::insertAll(const std::vector<uint32_t> &prims) {
+    size_t ncells = size_t(nx_ * ny_ * nz_);
+    std::vector<std::pair<uint32_t, uint32_t>> pairs;
+    pairs.reserve(prims.size() * 2);
+    for (uint32_t code : prims) {
+        BBox b = store_->bounds(code);
+        int64_t lo[3], hi[3];
+        for (int a = 0; a < 3; ++a) {
+            lo[a] = cellCoord(b.min[a] - margin_, a);
+            hi[a] = cellCoord(b.max[a] + margin_, a);
+        }
+        if (lo[0] == hi[0] && lo[1] == hi[1] && lo[2] == hi[2]) {
+            pairs.emplace_back(uint32_t((lo[2] * ny_ + lo[1]) * nx_ + lo[0]), code);
+            continue;
+        }
+        for (int64_t z = lo[2]; z <= hi[2]; ++z)
+            for (int64_t y = lo[1]; y <= hi[1]; ++y)
+                for (int64_t x = lo[0]; x <= hi[0]; ++x)
+                    if (overlaps(code, b, cellBox(x, y, z)))
+                        pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
+    }
+    buildBegin_.assign(ncells + 1, 0);
+    for (const auto &p : pairs) ++buildBegin_[p.first + 1];
+    for (size_t i = 0; i < ncells; ++i) buildBegin_[i + 1] += buildBegin_[i];
+    buildItems_.resize(pairs.size());
+    std::vector<uint32_t> fill(buildBegin_.begin(), buildBegin_.end() - 1);
+    for (const auto &p : pairs) buildItems_[fill[p.first]++] = p.second;
+    refinedChild_.clear();
+}
+
+void Grid::refine() {
+    size_t ncells = size_t(nx_ * ny_ * nz_);
+    refinedChild_.assign(ncells, 0xFFFFFFFFu);
+    if (depth_ < params_.maxDepth) {
+        uint64_t limit = params_.sse ? 4ull * params_.threshold : params_.threshold;
+        for (int64_t z = 0; z < nz_; ++z)
+            for (int64_t y = 0; y < ny_; ++y)
+                for (int64_t x = 0; x < nx_; ++x) {
+                    size_t c = size_t((z * ny_ + y) * nx_ + x);
+                    if (refinedChild_[c] != 0xFFFFFFFFu) continue;
+                    uint32_t count = buildBegin_[c + 1] - buildBegin_[c];
+                    if (count <= limit) continue;
+                    std::vector<uint32_t> cellPrims(buildItems_.begin() + buildBegin_[c],
+                                                    buildItems_.begin() + buildBegin_[c + 1]);
+                    auto child = std::make_unique<Grid>();
+                    if (!child->prepare(*store_, cellPrims, cellBox(x, y, z), params_,
+                                        depth_ + 1, false))
+                        continue;
+                    uint64_t occupied = 0, refs = 0;
+                    size_t childCells = size_t(child->nx_ * child->ny_ * child->nz_);
+                    for (size_t i = 0; i < childCells; ++i) {
+                        uint32_t k = child->buildBegin_[i + 1] - child->buildBegin_[i];
+                        refs += k;
+                        occupied += k != 0;
+                    }
+                    uint64_t average = occupied ? refs / occupied : 0;
+                    if (double(average) > double(count) / 4.0) continue;
+                    child->refine();
+                    refinedChild_[c] = uint32_t(children_.size());
+                    children_.push_back(std::move(child));
+                }
+    }
+    finalize();
+}
+
+void Grid::finalize() {
+    size_t ncells = size_t(nx_ * ny_ * nz_);
+    if (refinedChild_.size() != ncells) refinedChild_.assign(ncells, 0xFFFFFFFFu);
+    cellBegin_.assign(ncells + 1, 0);
+    items_.clear();
+    packets_.clear();
+    stats_ = GridStats();
+    stats_.voxels = ncells;
+    std::vector<uint32_t> tris, others;
+    for (size_t c = 0; c < ncells; ++c) {
+        cellBegin_[c] = uint32_t(items_.size());
+        uint64_t elements = 0;
+        if (refinedChild_[c] != 0xFFFFFFFFu) {
+            items_.push_back(itemCode(kItemChild, refinedChild_[c]));
+            elements = 1;
+        } else {
+            tris.clear();
+            others.clear();
+            for (uint32_t k = buildBegin_[c]; k < buildBegin_[c + 1]; ++k) {
+                uint32_t code = buildItems_[k];
+                ++elements;
+                if (params_.sse && (code >> kItemIndexBits) == kItemTriangle)
+                    tris.push_back(code & kItemIndexMask);
+                else
+                    others.push_back(code);
+            }
+            const float nan = std::numeric_limits<float>::quiet_NaN();
+            for (size_t i = 0; i < tris.size(); i += 4) {
+                IntersectSSETriangle pk;
+                for (int lane = 0; lane < 4; ++lane) {
+                    bool used = i + lane < tris.size();
+                    const IntersectTriangle *t = used ? &store_->triangles[tris[i + lane]] : nullptr;
+                    for (int a = 0; a < 3; ++a) {
+                        pk.p0[a][lane] = used ? t->p0[a] : nan;
+                        pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
+                        pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
+                    }
+                    pk.flags[lane] = used ? t->flags : 0u;
+                    pk.prim[lane] = used ? tris[i + lane] : 0xFFFFFFFFu;
+                }
+                items_.push_back(itemCode(kItemPacket, uint32_t(packets_.size())));
+                packets_.push_back(pk);
+            }
+            items_.insert(items_.end(), others.begin(), others.end());
+        }
+        stats_.occupied += elements != 0;
+        stats_.elements += elements;
+        stats_.maxElements = std::max(stats_.maxElements, elements);
+    }
+    cellBegin_[ncells] = uint32_t(items_.size());
+    items_.shrink_to_fit();
+    packets_.shrink_to_fit();
+    std::vector<uint32_t>().swap(buildBegin_);
+    std::vector<uint32_t>().swap(buildItems_);
+    std::vector<uint32_t>().swap(refinedChild_);
+}
+
+size_t Grid::nestedGridCount() const {
+    size_t n = children_.size();
+    for (const auto &c : children_) n += c->nestedGridCount();
+    return n;
+}
+
+uint32_t Grid::nestingDepth() const {
+    uint32_t d = 0;
+    for (const auto &c : children_) d = std::max(d, 1 + c->nestingDepth());
+    return d;
+}
+
+size_t Grid::sizeBytes() const {
+    size_t n = sizeof(Grid) + cellBegin_.capacity() * 4 + items_.capacity() * 4 +
+               packets_.capacity() * sizeof(IntersectSSETriangle) +
+               children_.capacity() * sizeof(void *);
+    for (const auto &c : children_) n += c->sizeBytes();
+    return n;
+}
+
+std::vector<uint32_t> Grid::cellItems(int64_t x, int64_t y, int64_t z) const {
+    if (empty() || x < 0 || y < 0 || z < 0 || x >= nx_ || y >= ny_ || z >= nz_) return {};
+    size_t c = size_t((z * ny_ + y) * nx_ + x);
+    return {items_.begin() + cellBegin_[c], items_.begin() + cellBegin_[c + 1]};
+}
+
+bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, TraceRay &local) {
+    const Mtx4 &m = inst.worldToObject;
+    Vec3 o = affinePoint(m, world.o);
+    Vec3 d = m.transformVector(world.d);
+    if (!local.prepare(o, d, world.required, world.time)) return false;
+    local.overrideFlags = true;
+    local.instFlags = inst.testFlags;
+    return true;
+}
+
+template <bool kAny>
+bool Grid::testItems(const TraceRay &r, TraceState &s, uint32_t begin, uint32_t end) const {
+    bool hit = false;
+    for (uint32_t k = begin; k < end; ++k) {
+        uint32_t code = items_[k];
+        uint32_t index = code & kItemIndexMask;
+        switch (code >> kItemIndexBits) {
+            case kItemPacket: {
+                float4 t, u, v;
+                int mask = intersectPacket(packets_[index], r, s.limit, t, u, v);
+                if (!mask) break;
+                if constexpr (kAny) return true;
+                alignas(16) float ts[4], us[4], vs[4];
+                _mm_store_ps(ts, t);
+                int lane = -1;
+                for (int i = 0; i < 4; ++i)
+                    if ((mask >> i & 1) && (lane < 0 || ts[i] < ts[lane])) lane = i;
+                _mm_store_ps(us, u);
+                _mm_store_ps(vs, v);
+                s.limit = ts[lane];
+                s.u = us[lane], s.v = vs[lane];
+                s.kind = kItemTriangle;
+                s.prim = packets_[index].prim[lane];
+                s.found = hit = true;
+                break;
+            }
+            case kItemTriangle: {
+                float t, u, v;
+                if (!intersectTriangle(store_->triangles[index], r, s.limit, t, u, v)) break;
+                if constexpr (kAny) return true;
+                s.limit = t, s.u = u, s.v = v;
+                s.kind = kItemTriangle;
+                s.prim = index;
+                s.found = hit = true;
+                break;
+            }
+            case kItemMotion: {
+                const MotionTriangle &mt = store_->motion[index];
+                Vec3 p[3];
+                MotionHitInterpolator::cornersAt(&store_->motionCorners[mt.firstCorner], mt.steps,
+                                                 r.time, p);
+                float t, u, v;
+                uint32_t flags = r.overrideFlags ? r.instFlags : mt.flags;
+                if (!intersectTriangle(p[0], p[1] - p[0], p[2] - p[0], flags, r, s.limit, t, u, v))
+                    break;
+                if constexpr (kAny) return true;
+                s.limit = t, s.u = u, s.v = v;
+                s.kind = kItemMotion;
+                s.prim = index;
+                s.found = hit = true;
+                break;
+            }
+            case kItemInstance: {
+                const IntersectInstanceGrid &inst = store_->instances[index];
+                if (!flagsVisible(inst.flags, r.required)) break;
+                TraceRay local;
+                if (!instanceRay(inst, r, local)) break;
+                TraceState ls;
+                ls.limit = s.limit;
+                if (!inst.grid->traverse<kAny>(local, ls)) break;
+                if constexpr (kAny) return true;
+                s.limit = ls.limit, s.u = ls.u, s.v = ls.v;
+                s.kind = kItemInstance;
+                s.prim = ls.prim;
+                s.inst = index;
+                s.found = hit = true;
+                break;
+            }
+            case kItemChild: {
+                if (children_[index]->traverse<kAny>(r, s)) {
+                    if constexpr (kAny) return true;
+                    hit = true;
+                }
+                break;
+            }
+            default:
+                break;
+        }
+    }
+    return hit;
+}
+
+template <bool kAny>
+bool Grid::traverse(const TraceRay &r, TraceState &s) const {
+    if (cellBegin_.empty()) return false;
+    // Clip the ray against the box (slab test); zero direction components test the slab only.
+    float t0 = 0.0f, t1 = s.limit;
+    for (int a = 0; a < 3; ++a) {
+        if (r.d[a] == 0.0f) {
+            if (r.o[a] < box_.min[a] || r.o[a] > box_.max[a]) return false;
+            continue;
+        }
+        float ta = (box_.min[a] - r.o[a]) * r.inv[a];
+        float tb = (box_.max[a] - r.o[a]) * r.inv[a];
+        if (ta > tb) std::swap(ta, tb);
+        t0 = std::max(t0, ta);
+        t1 = std::min(t1, tb);
+    }
+    if (!(t0 <= t1)) return false;
+
+    int64_t n[3] = {nx_, ny_, nz_};
+    int64_t idx[3], step[3];
+    float tNext[3];
+    for (int a = 0; a < 3; ++a) {
+        float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * t0;
+        idx[a] = cellCoord(p, a);
+        if (r.d[a] > 0.0f) {
+            step[a] = 1;
+            float plane = idx[a] + 1 == n[a] ? box_.max[a]
+                                             : box_.min[a] + float(idx[a] + 1) * cellSize_[a];
+            tNext[a] = (plane - r.o[a]) * r.inv[a];
+        } else if (r.d[a] < 0.0f) {
+            step[a] = -1;
+            float plane = box_.min[a] + float(idx[a]) * cellSize_[a];
+            tNext[a] = (plane - r.o[a]) * r.inv[a];
+        } else {
+            step[a] = 0;
+            tNext[a] = kInfiniteDistance;
+        }
+    }
+    const int64_t rowStride = nx_, sliceStride = nx_ * ny_;
+    const int64_t stride[3] = {1, rowStride, sliceStride};
+    int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
+    bool found = false;
+    // A walk visits at most nx + ny + nz cells.
+    for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
+        int axis = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2)
+                                       : (tNext[1] < tNext[2] ? 1 : 2);
+        float exit = tNext[axis];
+        uint32_t begin = cellBegin_[cell], end = cellBegin_[cell + 1];
+        if (begin != end && testItems<kAny>(r, s, begin, end)) {
+            if constexpr (kAny) return true;
+            found = true;
+        }
+        // The best hit lies inside the cells walked so far: nothing further can be closer.
+        if (exit >= s.limit) break;
+        idx[axis] += step[axis];
+        if (idx[axis] < 0 || idx[axis] >= n[axis]) break;
+        cell += step[axis] * stride[axis];
+        float plane = step[axis] > 0 ? (idx[axis] + 1 == n[axis]
+                                            ? box_.max[axis]
+                                            : box_.min[axis] + float(idx[axis] + 1) * cellSize_[axis])
+                                     : box_.min[axis] + float(idx[axis]) * cellSize_[axis];
+        tNext[axis] = (plane - r.o[axis]) * r.inv[axis];
+    }
+    return found;
+}
+
+template bool Grid::traverse<false>(const TraceRay &, TraceState &) const;
+template bool Grid::traverse<true>(const TraceRay &, TraceState &) const;
+
+}  // namespace ox

@@ -1,0 +1,190 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "core/types.h"
+#include "raytrace/intersect.h"
+
+namespace ox {
+
+class Grid;
+struct PrimitiveStore;
+
+/// Primitive kinds a grid cell refers to; the kind sits in the top three bits of an item code.
+enum ItemKind : uint32_t {
+    kItemPacket = 0,    ///< An IntersectSSETriangle of the grid itself.
+    kItemTriangle = 1,  ///< An IntersectTriangle of the store.
+    kItemMotion = 2,    ///< A MotionTriangle of the store.
+    kItemInstance = 3,  ///< An IntersectInstanceGrid of the store.
+    kItemChild = 4,     ///< A DynamicVoxel: a nested grid of the grid itself.
+};
+constexpr uint32_t kItemIndexBits = 29;
+constexpr uint32_t kItemIndexMask = (1u << kItemIndexBits) - 1u;
+/// Largest number of primitives of one kind a store can address.
+constexpr uint32_t kMaxItemIndex = kItemIndexMask;
+
+/// Item code of a primitive of a kind.
+constexpr uint32_t itemCode(ItemKind kind, uint32_t index) {
+    return (uint32_t(kind) << kItemIndexBits) | index;
+}
+
+/// A triangle whose corners move over the shutter interval: (steps + 1) * 3 corners, step-major,
+/// in the store's motion corner list.
+struct MotionTriangle {
+    uint32_t firstCorner = 0;
+    uint32_t steps = 1;
+    uint32_t flags = 0;
+    uint32_t id = 0;
+    uint32_t instance = kNoInstance;
+    BBox box;  ///< Box over every step.
+};
+
+/// An instance of a shared shape: its placement, flag word and the shape grid in object space.
+struct IntersectInstanceGrid {
+    Mtx4 objectToWorld, worldToObject;
+    uint32_t flags = 0;      ///< The instance's flag word (reported in hits).
+    uint32_t testFlags = 0;  ///< The flags its triangles are tested with (Opposite toggled when
+                             ///< the placement mirrors, so the same faces are culled as a copy).
+    uint32_t instance = kNoInstance;  ///< Scene instance index.
+    const Grid *grid = nullptr;       ///< The shape grid (owned by the complete grid).
+    const PrimitiveStore *store = nullptr;  ///< The shape grid's triangles.
+    BBox box;                         ///< World-space box.
+};
+
+/// Everything a hierarchy of grids indexes: world (or object) triangles, moving triangles and
+/// instances.
+struct PrimitiveStore {
+    std::vector<IntersectTriangle> triangles;
+    std::vector<MotionTriangle> motion;
+    std::vector<Vec3> motionCorners;
+    std::vector<IntersectInstanceGrid> instances;
+
+    /// Box of the primitive an item code names.
+    BBox bounds(uint32_t code) const;
+    /// Bytes held.
+    size_t sizeBytes() const;
+};
+
+/// Parameters shared by a grid and its nested grids.
+struct GridParams {
+    float density = 1.0f;        ///< Cells per primitive (not positive or NaN: 1).
+    uint32_t threshold = 25;     ///< Primitives per cell before refinement.
+    uint32_t maxDepth = 4;       ///< Nesting limit (clamped to 16).
+    bool sse = true;             ///< Pack triangles four to a block; four times the threshold.
+};
+
+/// Cell counts of a grid.
+struct GridResolution {
+    int64_t nx = 0, ny = 0, nz = 0;
+    int64_t total() const { return nx * ny * nz; }
+};
+
+/// Voxel statistics of a grid (its own cells; a refined cell counts one element).
+struct GridStats {
+    uint64_t voxels = 0, occupied = 0, elements = 0, maxElements = 0;
+};
+
+/// Uniform voxel grid over primitives; crowded cells are refined into nested grids.
+class Grid {
+public:
+    static constexpr uint32_t kMaxDepthLimit = 16;
+
+    Grid() = default;
+    Grid(const Grid &) = delete;
+    Grid &operator=(const Grid &) = delete;
+
+    /// Widens a box as the top-level grid does: half-extents times 1.001, plus 0.0015 when the
+    /// extent is below 0.0015.
+    static BBox widen(const BBox &box);
+    /// True when every extent is finite and not negative.
+    static bool boxUsable(const BBox &box);
+    /// Cell counts for n primitives over a box with the given extents (all positive), each axis
+    /// and the total bounded by 8 n and 2^28.
+    static GridResolution resolution(uint64_t n, double dx, double dy, double dz, float density);
+
+    /// Builds over the primitives (item codes into store) inside box; widen for top-level grids.
+    /// False (with an error message) when the box is broken; the grid is then empty.
+    bool build(const PrimitiveStore &store, const std::vector<uint32_t> &prims, const BBox &box,
+               const GridParams &params, uint32_t depth = 0, bool widenBox = true);
+
+    /// Closest hit below state.limit; updates state and returns true when one was found.
+    bool intersect(const TraceRay &ray, TraceState &state) const {
+        return traverse<false>(ray, state);
+    }
+    /// True when anything lies between 1e-6 and tmax.
+    bool occluded(const TraceRay &ray, float tmax) const {
+        TraceState s;
+        s.limit = tmax;
+        return traverse<true>(ray, s);
+    }
+    /// The walk itself; kAny stops at the first hit.
+    template <bool kAny>
+    bool traverse(const TraceRay &ray, TraceState &state) const;
+
+    bool empty() const { return cellBegin_.empty(); }
+    const BBox &box() const { return box_; }
+    GridResolution cells() const { return {nx_, ny_, nz_}; }
+    Vec3 cellSize() const { return cellSize_; }
+    /// Per-grid tolerance max(0.001, 1e-5 |cell diagonal|).
+    float tolerance() const { return tolerance_; }
+    uint32_t depth() const { return depth_; }
+    /// Voxel statistics of this grid's own cells.
+    GridStats stats() const { return stats_; }
+    /// Number of nested grids below this one (all levels).
+    size_t nestedGridCount() const;
+    /// Deepest nesting level below this grid (0 = none).
+    uint32_t nestingDepth() const;
+    /// Bytes held by this grid and its nested grids.
+    size_t sizeBytes() const;
+    /// Item codes of the cell (x, y, z) (for tests).
+    std::vector<uint32_t> cellItems(int64_t x, int64_t y, int64_t z) const;
+    /// The nested grid of a kItemChild code (for tests).
+    const Grid *child(uint32_t index) const { return children_[index].get(); }
+    /// The packet of a kItemPacket code (for tests).
+    const IntersectSSETriangle &packet(uint32_t index) const { return packets_[index]; }
+
+private:
+    bool prepare(const PrimitiveStore &store, const std::vector<uint32_t> &prims, const BBox &box,
+                 const GridParams &params, uint32_t depth, bool widenBox);
+    void insertAll(const std::vector<uint32_t> &prims);
+    bool overlaps(uint32_t code, const BBox &b, const BBox &cellBox) const;
+    BBox cellBox(int64_t x, int64_t y, int64_t z) const;
+    void refine();
+    void finalize();
+    int64_t cellCoord(float v, int axis) const;
+    template <bool kAny>
+    bool testItems(const TraceRay &ray, TraceState &state, uint32_t begin, uint32_t end) const;
+
+    const PrimitiveStore *store_ = nullptr;
+    GridParams params_;
+    uint32_t depth_ = 0;
+    uint8_t mode_ = 2;
+    int64_t nx_ = 0, ny_ = 0, nz_ = 0;
+    Vec3 cellSize_, invCellSize_;
+    float tolerance_ = 0.001f;
+    float margin_ = 0.0f;
+    BBox box_;
+    std::vector<uint32_t> cellBegin_;  // ncells + 1 offsets into items_
+    std::vector<uint32_t> items_;
+    std::vector<IntersectSSETriangle> packets_;
+    std::vector<std::unique_ptr<Grid>> children_;
+    GridStats stats_;
+    // Build-time lists, released by finalize.
+    std::vector<uint32_t> buildBegin_, buildItems_, refinedChild_;
+};
+
+/// Transforms a world ray into an instance's object space (direction not renormalised, so the
+/// distance along the ray is the same in both spaces).
+inline Vec3 affinePoint(const Mtx4 &m, const Vec3 &p) {
+    return {p.x * m.m[0][0] + p.y * m.m[1][0] + p.z * m.m[2][0] + m.m[3][0],
+            p.x * m.m[0][1] + p.y * m.m[1][1] + p.z * m.m[2][1] + m.m[3][1],
+            p.x * m.m[0][2] + p.y * m.m[1][2] + p.z * m.m[2][2] + m.m[3][2]};
+}
+
+/// Prepares the object-space ray of an instance; false when it can hit nothing.
+bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, TraceRay &local);
+
+}  // namespace ox
