@@ -98,6 +98,10 @@ public:
     size_t shapeBaseGridCount() const { return shapes_.size(); }
     /// Bytes held by the structure (grids, stores, shape grids).
     size_t sizeBytes() const;
+    /// First of the (steps + 1) * 3 corners of a moving triangle (Hit::primitive when moving).
+    const Vec3 &motionCorners(const MotionTriangle &m) const {
+        return store_.motionCorners[m.firstCorner];
+    }
     /// The top-level grid.
     const Grid &grid() const { return grid_; }
 

@@ -1,0 +1,512 @@
+#include "raytrace/grid.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <limits>
+#include <string>
+#include <vector>
+
+#include "core/message.h"
+#include "raytrace/complete_grid.h"
+#include "raytrace/motion_blur.h"
+#include "tests/raytrace/test_meshes.h"
+
+namespace ox {
+namespace {
+
+using testmesh::Mesh;
+using testmesh::Rng;
+
+constexpr uint32_t kAllFlags = 0x1 | 0x2 | 0x4 | 0x8 | 0x10 | 0x20 | 0x40 | 0x80 | 0x100 | 0x400 |
+                               0x800 | 0x2000 | 0x4000 | 0x8000 | 0x40000;
+
+InstanceInput instanceOf(const Mesh &m, uint32_t shape, const Mtx4 &placement, uint32_t flags,
+                         uint32_t index, const std::string &name = "inst") {
+    InstanceInput in;
+    in.name = name;
+    in.shape = shape;
+    in.mesh.positions = m.positions.data();
+    in.mesh.vertexCount = m.positions.size();
+    in.mesh.indices = m.indices.data();
+    in.mesh.triangleCount = m.triangleCount();
+    in.objectToWorld = placement;
+    in.flags = flags;
+    in.index = index;
+    return in;
+}
+
+Mtx4 rotationY(float a) {
+    Mtx4 m;
+    m.m[0][0] = std::cos(a), m.m[0][2] = -std::sin(a);
+    m.m[2][0] = std::sin(a), m.m[2][2] = std::cos(a);
+    return m;
+}
+
+struct Reference {
+    float t = -1.0f;
+    uint32_t id = 0, instance = kNoInstance;
+};
+
+// Brute force over every triangle of every instance with the same single-triangle test and the
+// same arithmetic the structure uses: world copies for copied instances, the object-space ray
+// for instanced ones.
+Reference bruteForce(const std::vector<InstanceInput> &ins, bool instanced, const Ray &ray,
+                     float tmax) {
+    Reference best;
+    float limit = tmax;
+    TraceRay world;
+    if (!world.prepare(ray.origin, ray.direction, rayTypeRequiredFlags(ray.type), ray.time))
+        return best;
+    for (const InstanceInput &in : ins) {
+        TraceRay local = world;
+        uint32_t flags = in.flags;
+        if (instanced) {
+            IntersectInstanceGrid ig;
+            if (!in.objectToWorld.inverse(ig.worldToObject)) continue;
+            ig.testFlags = in.objectToWorld.determinant3() < 0 ? flags ^ kFlagOpposite : flags;
+            if (!flagsVisible(flags, world.required) || !instanceRay(ig, world, local)) continue;
+            flags = ig.testFlags;
+        }
+        for (size_t i = 0; i < in.mesh.triangleCount; ++i) {
+            Vec3 p[3];
+            for (int c = 0; c < 3; ++c) {
+                p[c] = in.mesh.positions[in.mesh.indices[3 * i + c]];
+                if (!instanced) p[c] = affinePoint(in.objectToWorld, p[c]);
+            }
+            float t, u, v;
+            if (intersectTriangle(p[0], p[1] - p[0], p[2] - p[0], flags, local, limit, t, u, v)) {
+                limit = t;
+                best.t = t, best.id = uint32_t(i), best.instance = in.index;
+            }
+        }
+    }
+    return best;
+}
+
+// Distance at which the named triangle is hit (ties between triangles are legitimate).
+float hitOf(const std::vector<InstanceInput> &ins, bool instanced, const Ray &ray,
+            uint32_t instance, uint32_t id) {
+    for (const InstanceInput &in : ins)
+        if (in.index == instance) {
+            InstanceInput one = in;
+            one.mesh.indices = in.mesh.indices + 3 * id;
+            one.mesh.triangleCount = 1;
+            return bruteForce({one}, instanced, ray, kInfiniteDistance).t;
+        }
+    return -2.0f;
+}
+
+// Compares closest hits and occlusion answers on random rays from inside the scene box.
+void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSParameters &params,
+                            bool instanced, int rays, uint64_t seed) {
+    CompleteGrid grid;
+    ASSERT_TRUE(grid.build(ins, params));
+    Rng rng(seed);
+    BBox box = grid.bounds();
+    float diag = box.extent().length();
+    int hits = 0;
+    for (int i = 0; i < rays; ++i) {
+        Ray ray;
+        ray.origin = rng.inBox(box);
+        ray.direction = rng.direction();
+        ray.type = i % 3 == 0 ? kRayShadow : kRayPrimary;
+        Hit hit;
+        bool found = grid.intersect(ray, hit, kInfiniteDistance, nullptr);
+        Reference ref = bruteForce(ins, instanced, ray, kInfiniteDistance);
+        ASSERT_EQ(found, ref.t >= 0.0f) << "ray " << i;
+        if (found) {
+            ++hits;
+            ASSERT_EQ(hit.t, ref.t) << "ray " << i;
+            if (hit.id != ref.id || hit.instance != ref.instance) {
+                ASSERT_EQ(hitOf(ins, instanced, ray, hit.instance, hit.id), ref.t) << "ray " << i;
+            }
+        }
+        float tmax = diag * rng.uniform() * 0.5f;
+        bool occ = grid.occluded(ray, tmax, nullptr);
+        ASSERT_EQ(occ, bruteForce(ins, instanced, ray, tmax).t >= 0.0f) << "ray " << i;
+    }
+    EXPECT_GT(hits, rays / 4);
+}
+
+TEST(CompleteGridTest, MatchesBruteForceOnOneMeshWithAndWithoutPackingAndNesting) {
+    Mesh blob = testmesh::blob(40, 40);
+    for (bool sse : {true, false})
+        for (uint32_t depth : {0u, 4u})
+            for (uint32_t flags : {kAllFlags, kAllFlags & ~kFlagDoubleSided}) {
+                SCOPED_TRACE(::testing::Message() << "sse " << sse << " depth " << depth
+                                                  << " flags " << flags);
+                ADSParameters p;
+                p.useSSE = sse;
+                p.gridMaxDepth = depth;
+                p.gridThreshold = 2;  // crowded cells everywhere: nesting is exercised
+                p.gridDensity = 0.2f;
+                CompleteGrid g;
+                ASSERT_TRUE(g.build({instanceOf(blob, 0, Mtx4(), flags, 0)}, p));
+                EXPECT_EQ(g.grid().nestedGridCount() > 0, depth > 0);
+                checkAgainstBruteForce({instanceOf(blob, 0, Mtx4(), flags, 0)}, p, false, 1500,
+                                       depth + sse);
+            }
+}
+
+TEST(CompleteGridTest, MatchesBruteForceWithInstancesCopiedOrInstanced) {
+    Mesh blob = testmesh::blob(30, 36), coil = testmesh::coil(80, 10, 0.5f);
+    std::vector<InstanceInput> ins;
+    Mtx4 mirror = Mtx4::scale({-1.0f, 1.0f, 1.0f}) * Mtx4::translation({3.0f, 0.0f, 0.0f});
+    ins.push_back(instanceOf(blob, 0, Mtx4(), kAllFlags, 0));
+    ins.push_back(instanceOf(blob, 0, rotationY(0.7f) * Mtx4::translation({2.5f, 0.5f, 0.0f}),
+                             kAllFlags & ~kFlagDoubleSided, 1));
+    ins.push_back(instanceOf(blob, 0, mirror, kAllFlags & ~kFlagDoubleSided, 2));
+    ins.push_back(instanceOf(coil, 1, Mtx4::scale({1.0f, 0.5f, 1.0f}), kAllFlags & ~kFlagCastShadows,
+                             3));
+    ins.push_back(instanceOf(coil, 1, rotationY(1.3f) * Mtx4::translation({0.0f, 2.0f, 1.0f}),
+                             (kAllFlags & ~kFlagDoubleSided) | kFlagOpposite, 4));
+    for (int mode : {kInstancingNever, kInstancingAlways})
+        for (bool sse : {true, false}) {
+            SCOPED_TRACE(::testing::Message() << "instancing " << mode << " sse " << sse);
+            ADSParameters p;
+            p.useInstancing = mode;
+            p.useSSE = sse;
+            p.gridThreshold = 4;
+            checkAgainstBruteForce(ins, p, mode == kInstancingAlways, 1500, 7 + mode + sse);
+        }
+}
+
+TEST(CompleteGridTest, MirroredInstanceCullsTheSameFacesAsItsCopy) {
+    Mesh blob = testmesh::blob(16, 16);
+    Mtx4 mirror = Mtx4::scale({-1.0f, 1.0f, 1.0f});
+    std::vector<InstanceInput> ins = {instanceOf(blob, 0, mirror, kAllFlags & ~kFlagDoubleSided, 0),
+                                      instanceOf(blob, 0, mirror * Mtx4::translation({5, 0, 0}),
+                                                 kAllFlags & ~kFlagDoubleSided, 1)};
+    ADSParameters copied, instanced;
+    copied.useInstancing = kInstancingNever;
+    instanced.useInstancing = kInstancingAlways;
+    CompleteGrid a, b;
+    ASSERT_TRUE(a.build(ins, copied));
+    ASSERT_TRUE(b.build(ins, instanced));
+    EXPECT_EQ(b.shapeGridCount(), 2u);
+    EXPECT_EQ(b.shapeBaseGridCount(), 1u);
+    Rng rng(3);
+    int agree = 0, hits = 0;
+    for (int i = 0; i < 2000; ++i) {
+        Ray ray;
+        ray.origin = rng.inBox(a.bounds());
+        ray.direction = rng.direction();
+        Hit ha, hb;
+        bool fa = a.intersect(ray, ha, nullptr), fb = b.intersect(ray, hb, nullptr);
+        // Copy and instance differ by rounding only: grazing hits aside, the same face is hit.
+        if (fa == fb && (!fa || (ha.id == hb.id && ha.instance == hb.instance))) ++agree;
+        hits += fa;
+    }
+    EXPECT_GT(hits, 200);
+    EXPECT_GE(agree, 1990);
+}
+
+TEST(CompleteGridTest, RayTypeRulesAndCulling) {
+    // One triangle in the plane z = 0, facing +z (counter-clockwise seen from +z).
+    Mesh tri;
+    tri.positions = {{0, 0, 0}, {1, 0, 0}, {0, 1, 0}};
+    tri.indices = {0, 1, 2};
+    auto build = [&](uint32_t flags, CompleteGrid &g) {
+        return g.build({instanceOf(tri, 0, Mtx4(), flags, 0)}, ADSParameters());
+    };
+    Ray down;
+    down.origin = {0.25f, 0.25f, 1.0f};
+    down.direction = {0, 0, -1};
+    Ray up = down;
+    up.origin.z = -1.0f;
+    up.direction = {0, 0, 1};
+
+    CompleteGrid g;
+    ASSERT_TRUE(build(kAllFlags, g));
+    // The zero z-extent is widened, so the flat grid works.
+    EXPECT_GT(g.grid().box().extent().z, 0.0f);
+    Hit h;
+    EXPECT_TRUE(g.intersect(down, h, nullptr));
+    EXPECT_FLOAT_EQ(h.t, 1.0f);
+    EXPECT_FLOAT_EQ(h.u, 0.25f);
+    EXPECT_FLOAT_EQ(h.v, 0.25f);
+    EXPECT_EQ(h.flags, kAllFlags);
+    EXPECT_TRUE(g.intersect(up, h, nullptr));
+
+    // Environment rays hit nothing, and are counted.
+    RayCounter counter;
+    Ray env = down;
+    env.type = kRayEnvironment;
+    EXPECT_FALSE(g.intersect(env, h, &counter));
+    EXPECT_FALSE(g.occluded(env, 10.0f, &counter));
+    EXPECT_EQ(counter.count(kRayEnvironment), 2u);
+    EXPECT_EQ(h.t, -1.0f);
+
+    // A hit closer than 1e-6 is ignored; tmax is exclusive.
+    Ray close = down;
+    close.origin.z = 1e-7f;
+    EXPECT_FALSE(g.intersect(close, h, nullptr));
+    EXPECT_FALSE(g.intersect(down, h, 1.0f, nullptr));
+    EXPECT_TRUE(g.intersect(down, h, 1.0001f, nullptr));
+
+    // Shadow rays pass through objects that do not cast shadows.
+    CompleteGrid noShadow;
+    ASSERT_TRUE(build(kAllFlags & ~kFlagCastShadows, noShadow));
+    Ray shadow = down;
+    shadow.type = kRayShadow;
+    EXPECT_FALSE(noShadow.occluded(shadow, 10.0f, nullptr));
+    EXPECT_TRUE(noShadow.intersect(down, h, nullptr));
+    EXPECT_TRUE(g.occluded(shadow, 10.0f, nullptr));
+
+    // Single-sided: the back (seen from below) is culled; Opposite culls the front instead.
+    CompleteGrid single, opposite;
+    ASSERT_TRUE(build(kAllFlags & ~kFlagDoubleSided, single));
+    ASSERT_TRUE(build((kAllFlags & ~kFlagDoubleSided) | kFlagOpposite, opposite));
+    EXPECT_TRUE(single.intersect(down, h, nullptr));
+    EXPECT_FALSE(single.intersect(up, h, nullptr));
+    EXPECT_FALSE(opposite.intersect(down, h, nullptr));
+    EXPECT_TRUE(opposite.intersect(up, h, nullptr));
+
+    // Non-finite rays miss.
+    Ray bad = down;
+    bad.origin.x = std::numeric_limits<float>::quiet_NaN();
+    EXPECT_FALSE(g.intersect(bad, h, nullptr));
+    bad = down;
+    bad.direction = {0, 0, -std::numeric_limits<float>::infinity()};
+    EXPECT_FALSE(g.occluded(bad, 10.0f, nullptr));
+    bad.direction = {0, 0, 0};
+    EXPECT_FALSE(g.intersect(bad, h, nullptr));
+    EXPECT_FALSE(g.intersect(down, h, std::numeric_limits<float>::quiet_NaN(), nullptr));
+}
+
+TEST(CompleteGridTest, BrokenSceneBoxFailsTheBuildAndBadTrianglesAreSkipped) {
+    // Two finite triangles so far apart that the box extent overflows.
+    Mesh huge;
+    huge.positions = {{-3e38f, 0, 0}, {-3e38f, 1, 0}, {-3e38f, 0, 1},
+                      {3e38f, 0, 0},  {3e38f, 1, 0},  {3e38f, 0, 1}};
+    huge.indices = {0, 1, 2, 3, 4, 5};
+    CompleteGrid g;
+    testing::internal::CaptureStdout();
+    EXPECT_FALSE(g.build({instanceOf(huge, 0, Mtx4(), kAllFlags, 0)}, ADSParameters()));
+    std::string out = testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("Scene Bounding Box is broken, not rendering"), std::string::npos);
+    Ray r;
+    r.direction = {0, 0, -1};
+    r.origin = {0, 0.5f, 1};
+    Hit h;
+    EXPECT_FALSE(g.intersect(r, h, nullptr));
+
+    Mesh mixed;
+    float nan = std::numeric_limits<float>::quiet_NaN();
+    mixed.positions = {{0, 0, 0}, {1, 0, 0}, {0, 1, 0}, {nan, 0, 0}};
+    mixed.indices = {0, 1, 2, 0, 3, 1, 0, 7, 2};
+    CompleteGrid m;
+    testing::internal::CaptureStdout();
+    EXPECT_TRUE(m.build({instanceOf(mixed, 0, Mtx4(), kAllFlags, 0, "mixed")}, ADSParameters()));
+    out = testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("Skipped 2 triangles"), std::string::npos) << out;
+    EXPECT_EQ(m.primitiveCount(), 1u);
+    r.origin = {0.2f, 0.2f, 1.0f};
+    EXPECT_TRUE(m.intersect(r, h, nullptr));
+
+    // Singular and non-finite placements are skipped with a warning.
+    Mesh tri;
+    tri.positions = {{0, 0, 0}, {1, 0, 0}, {0, 1, 0}};
+    tri.indices = {0, 1, 2};
+    Mtx4 flat = Mtx4::scale({1, 1, 0});
+    Mtx4 inf;
+    inf.m[3][0] = std::numeric_limits<float>::infinity();
+    CompleteGrid s;
+    testing::internal::CaptureStdout();
+    EXPECT_TRUE(s.build({instanceOf(tri, 0, flat, kAllFlags, 0, "flat"),
+                         instanceOf(tri, 0, inf, kAllFlags, 1, "far"),
+                         instanceOf(tri, 0, Mtx4(), kAllFlags, 2, "good")},
+                        ADSParameters()));
+    out = testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("Instance flat has a singular"), std::string::npos);
+    EXPECT_NE(out.find("Instance far has a singular"), std::string::npos);
+    EXPECT_EQ(s.primitiveCount(), 1u);
+    EXPECT_TRUE(s.intersect(r, h, nullptr));
+    EXPECT_EQ(h.instance, 2u);
+
+    // An empty scene builds and every ray misses.
+    CompleteGrid none;
+    EXPECT_TRUE(none.build({}, ADSParameters()));
+    EXPECT_FALSE(none.intersect(r, h, nullptr));
+    EXPECT_FALSE(none.occluded(r, 1e30f, nullptr));
+}
+
+TEST(CompleteGridTest, InstancingDecisionsAndMessages) {
+    EXPECT_FALSE(CompleteGrid::choosesInstancing(kInstancingAutoDetect, 500, 10, 499));
+    EXPECT_TRUE(CompleteGrid::choosesInstancing(kInstancingAutoDetect, 500, 10, 500));
+    EXPECT_FALSE(CompleteGrid::choosesInstancing(kInstancingAutoDetect, 500, 1, 5000));
+    EXPECT_TRUE(CompleteGrid::choosesInstancing(kInstancingAlways, 500, 1, 1));
+    EXPECT_FALSE(CompleteGrid::choosesInstancing(kInstancingNever, 0, 10, 5000));
+    EXPECT_FALSE(CompleteGrid::choosesInstancing(17, 0, 10, 5000));
+
+    Mesh big = testmesh::blob(11, 25), small = big;
+    small.indices.resize(small.indices.size() - 3);
+    ASSERT_EQ(small.triangleCount(), 499u);
+    ASSERT_EQ(big.triangleCount(), 500u);
+    auto tenOf = [&](const Mesh &m) {
+        std::vector<InstanceInput> ins;
+        for (uint32_t i = 0; i < 10; ++i)
+            ins.push_back(instanceOf(m, 0, Mtx4::translation({3.0f * i, 0, 0}), kAllFlags, i));
+        return ins;
+    };
+    CompleteGrid a, b;
+    ASSERT_TRUE(a.build(tenOf(small), ADSParameters()));
+    EXPECT_EQ(a.shapeGridCount(), 0u);
+    EXPECT_EQ(a.primitiveCount(), 4990u);
+    testing::internal::CaptureStdout();
+    setTypeEnabled(kMsgVerbose, true);
+    ASSERT_TRUE(b.build(tenOf(big), ADSParameters()));
+    setTypeEnabled(kMsgVerbose, false);
+    std::string out = testing::internal::GetCapturedStdout();
+    EXPECT_EQ(b.shapeGridCount(), 10u);
+    EXPECT_EQ(b.shapeBaseGridCount(), 1u);
+    EXPECT_EQ(b.primitiveCount(), 10u);
+    for (const char *text :
+         {"Inserting Shapes into ADS", "Building ADS structure", "Building ADS: ",
+          "Built CompleteGrid with 10 primitives", "Number of shape grids      : 10",
+          "Number of shape base grids : 1", "Number of voxels                    : ",
+          "Max elements in a voxel             : "})
+        EXPECT_NE(out.find(text), std::string::npos) << text;
+
+    // Displaced or moving instances are copied even when instancing is chosen.
+    std::vector<InstanceInput> ins = tenOf(big);
+    ins[3].displaced = true;
+    ins[4].stepTransforms = {Mtx4(), Mtx4::translation({0, 1, 0})};
+    MotionBlurHandler motion(MotionBlurHandler::k3D, 1);
+    CompleteGrid c;
+    testing::internal::CaptureStdout();
+    ASSERT_TRUE(c.build(ins, ADSParameters(), &motion));
+    out = testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("Instancing and Render Time Displacement Mapping is not compatible, the "
+                       "shape will be copied (inst)"),
+              std::string::npos);
+    EXPECT_NE(out.find("Instancing and 3D Motion Blur is not compatible, the shape will be copied "
+                       "(inst)"),
+              std::string::npos);
+    EXPECT_EQ(c.shapeGridCount(), 8u);
+    EXPECT_EQ(c.primitiveCount(), 8u + 2 * 500u);
+}
+
+TEST(GridTest, ResolutionRuleAndBounds) {
+    // Near-cubic cells, about density x N of them.
+    GridResolution r = Grid::resolution(1000, 1.0, 1.0, 1.0, 1.0f);
+    EXPECT_EQ(r.nx, 10);
+    EXPECT_EQ(r.ny, 10);
+    EXPECT_EQ(r.nz, 10);
+    r = Grid::resolution(1000, 4.0, 1.0, 1.0, 1.0f);
+    EXPECT_GE(r.nx, 3 * r.ny);
+    // Density not positive or NaN is 1.
+    for (float d : {0.0f, -3.0f, std::numeric_limits<float>::quiet_NaN()}) {
+        GridResolution q = Grid::resolution(1000, 1.0, 1.0, 1.0, d);
+        EXPECT_EQ(q.total(), 1000);
+    }
+    // Huge densities and flat boxes stay within 8 N and 2^28 cells per axis and in total.
+    r = Grid::resolution(100, 1.0, 1.0, 1.0, 1e30f);
+    EXPECT_LE(r.total(), 800);
+    r = Grid::resolution(100, 1e6, 0.003, 0.003, 1.0f);
+    EXPECT_LE(r.nx, 800);
+    EXPECT_GE(r.ny, 1);
+    r = Grid::resolution(uint64_t(1) << 27, 1.0, 1.0, 1.0, 1e9f);
+    EXPECT_LE(r.total(), int64_t(1) << 28);
+    EXPECT_EQ(Grid::resolution(0, 1, 1, 1, 1).total(), 0);
+
+    BBox w = Grid::widen(BBox({0, 0, 0}, {2, 1, 0}));
+    EXPECT_FLOAT_EQ(w.max.x - w.min.x, 2.002f);
+    EXPECT_FLOAT_EQ(w.max.z - w.min.z, 0.003f);
+    EXPECT_FALSE(Grid::boxUsable(BBox({0, 0, 0}, {-1, 1, 1})));
+    EXPECT_FALSE(Grid::boxUsable(BBox({0, 0, 0}, {std::numeric_limits<float>::infinity(), 1, 1})));
+    EXPECT_TRUE(Grid::boxUsable(BBox({0, 0, 0}, {0, 0, 0})));
+}
+
+TEST(GridTest, RefinementFollowsDepthAndAcceptanceRules) {
+    // A small dense blob among scattered triangles: a few crowded cells.
+    Mesh m = testmesh::blob(40, 40, 0.05f);
+    Rng rng(5);
+    for (int i = 0; i < 300; ++i) {
+        uint32_t base = uint32_t(m.positions.size());
+        Vec3 c = rng.inBox(BBox({-5, -5, -5}, {5, 5, 5}));
+        m.positions.insert(m.positions.end(), {c, c + Vec3(0.05f, 0, 0), c + Vec3(0, 0.05f, 0)});
+        m.indices.insert(m.indices.end(), {base, base + 1, base + 2});
+    }
+    for (uint32_t depth : {0u, 1u, 4u, 99u}) {
+        ADSParameters p;
+        p.gridMaxDepth = depth;
+        CompleteGrid g;
+        ASSERT_TRUE(g.build({instanceOf(m, 0, Mtx4(), kAllFlags, 0)}, p));
+        if (depth == 0)
+            EXPECT_EQ(g.grid().nestedGridCount(), 0u);
+        else
+            EXPECT_GT(g.grid().nestedGridCount(), 0u);
+        EXPECT_LE(g.grid().nestingDepth(), std::min(depth, Grid::kMaxDepthLimit));
+    }
+    // Triangles that all cross one point cannot be separated: refinement is refused.
+    Mesh fan;
+    fan.positions.push_back({0, 0, 0});
+    for (int i = 0; i < 400; ++i) {
+        float a = 6.2831853f * i / 400.0f;
+        fan.positions.push_back({std::cos(a), std::sin(a), 0.3f * std::sin(3 * a)});
+    }
+    for (uint32_t i = 1; i <= 400; ++i) fan.indices.insert(fan.indices.end(), {0, i, i % 400 + 1});
+    ADSParameters p;
+    p.gridDensity = 0.0001f;  // one cell holding all 400
+    CompleteGrid g;
+    ASSERT_TRUE(g.build({instanceOf(fan, 0, Mtx4(), kAllFlags, 0)}, p));
+    EXPECT_EQ(g.grid().cells().total(), 1);
+    EXPECT_EQ(g.grid().nestedGridCount(), 0u);
+    EXPECT_EQ(g.grid().stats().maxElements, 400u);
+}
+
+TEST(MotionBlurTest, MovingTrianglesFollowTheRayTime) {
+    Mesh tri;
+    tri.positions = {{0, 0, 0}, {1, 0, 0}, {0, 1, 0}};
+    tri.indices = {0, 1, 2};
+    InstanceInput in = instanceOf(tri, 0, Mtx4(), kAllFlags, 0, "mover");
+    in.stepTransforms = {Mtx4(), Mtx4::translation({0, 0, 1}), Mtx4::translation({0, 0, 4})};
+    MotionBlurHandler motion(MotionBlurHandler::k3D, 2);
+    CompleteGrid g;
+    ASSERT_TRUE(g.build({in}, ADSParameters(), &motion));
+    Ray r;
+    r.origin = {0.2f, 0.2f, 10.0f};
+    r.direction = {0, 0, -1};
+    Hit h;
+    for (auto [time, z] : {std::pair{0.0f, 0.0f}, {0.25f, 0.5f}, {0.5f, 1.0f}, {0.75f, 2.5f},
+                           {1.0f, 4.0f}, {7.0f, 4.0f}, {-1.0f, 0.0f}}) {
+        r.time = time;
+        ASSERT_TRUE(g.intersect(r, h, nullptr)) << time;
+        EXPECT_FLOAT_EQ(h.t, 10.0f - z) << time;
+        EXPECT_TRUE(h.moving);
+        const MotionTriangle *mt = static_cast<const MotionTriangle *>(h.primitive);
+        Vec3 p = MotionHitInterpolator::interpolate(&g.motionCorners(*mt), mt->steps, time, h.u,
+                                                    h.v);
+        EXPECT_NEAR(p.z, z, 1e-5f);
+        EXPECT_NEAR(p.x, 0.2f, 1e-6f);
+        Vec3 mv = MotionBlurHandler::MotionVectorExtractor::extract(&g.motionCorners(*mt),
+                                                                     mt->steps, h.u, h.v);
+        EXPECT_EQ(mv, Vec3(0, 0, 4));
+    }
+    // Without the MotionBlur flag the instance stays put.
+    in.flags &= ~kFlagMotionBlur;
+    CompleteGrid still;
+    ASSERT_TRUE(still.build({in}, ADSParameters(), &motion));
+    r.time = 1.0f;
+    ASSERT_TRUE(still.intersect(r, h, nullptr));
+    EXPECT_FALSE(h.moving);
+    EXPECT_FLOAT_EQ(h.t, 10.0f);
+
+    // Step counts below 1 are 1; the ray time is clamped.
+    EXPECT_EQ(MotionBlurHandler(MotionBlurHandler::k3D, 0).steps(), 1u);
+    EXPECT_EQ(MotionBlurHandler(MotionBlurHandler::k3D, -5).steps(), 1u);
+    uint32_t k;
+    float w;
+    MotionBlurHandler::stepOf(4, 1.0f, k, w);
+    EXPECT_EQ(k, 3u);
+    EXPECT_FLOAT_EQ(w, 1.0f);
+    MotionBlurHandler::stepOf(4, 0.3f, k, w);
+    EXPECT_EQ(k, 1u);
+    EXPECT_NEAR(w, 0.2f, 1e-5f);
+    EXPECT_EQ(MotionBlurHandler::clampTime(std::numeric_limits<float>::quiet_NaN()), 0.0f);
+}
+
+}  // namespace
+}  // namespace ox
