@@ -5,7 +5,9 @@
 #include <map>
 
 #include "core/message.h"
+#include "raytrace/instance.h"
 #include "raytrace/motion_blur.h"
+#include "raytrace/shape.h"
 
 namespace ox {
 
@@ -24,14 +26,14 @@ size_t addTriangles(PrimitiveStore &store, std::vector<uint32_t> &codes, const M
                     const Mtx4 &m, bool transform, uint32_t flags, uint32_t instance) {
     size_t skipped = 0;
     for (size_t i = 0; i < mesh.triangleCount; ++i) {
-        const uint32_t *ix = mesh.indices + 3 * i;
+        uint32_t ix[3] = {mesh.corner(i, 0), mesh.corner(i, 1), mesh.corner(i, 2)};
         if (ix[0] >= mesh.vertexCount || ix[1] >= mesh.vertexCount || ix[2] >= mesh.vertexCount) {
             ++skipped;
             continue;
         }
         Vec3 p[3];
         for (int c = 0; c < 3; ++c)
-            p[c] = transform ? affinePoint(m, mesh.positions[ix[c]]) : mesh.positions[ix[c]];
+            p[c] = transform ? affinePoint(m, mesh.position(ix[c])) : mesh.position(ix[c]);
         IntersectTriangle t;
         t.p0 = p[0];
         t.e1 = p[1] - p[0];
@@ -66,8 +68,13 @@ size_t addMotionTriangles(PrimitiveStore &store, std::vector<uint32_t> &codes,
     size_t skipped = 0;
     const MeshInput &mesh = in.mesh;
     for (size_t i = 0; i < mesh.triangleCount; ++i) {
-        const uint32_t *ix = mesh.indices + 3 * i;
-        if (ix[0] >= mesh.vertexCount || ix[1] >= mesh.vertexCount || ix[2] >= mesh.vertexCount) {
+        uint32_t ix[3] = {mesh.corner(i, 0), mesh.corner(i, 1), mesh.corner(i, 2)};
+        bool bad = ix[0] >= mesh.vertexCount || ix[1] >= mesh.vertexCount ||
+                   ix[2] >= mesh.vertexCount;
+        for (const MeshInput &sm : in.stepMeshes)
+            bad = bad || !sm.usable() || sm.triangleCount != mesh.triangleCount ||
+                  sm.vertexCount != mesh.vertexCount;
+        if (bad) {
             ++skipped;
             continue;
         }
@@ -79,15 +86,15 @@ size_t addMotionTriangles(PrimitiveStore &store, std::vector<uint32_t> &codes,
         mt.instance = in.index;
         bool ok = store.motion.size() < kMaxItemIndex;
         for (uint32_t k = 0; k <= steps && ok; ++k) {
-            const Vec3 *pos = in.mesh.positions;
-            if (!in.stepPositions.empty())
-                pos = in.stepPositions[std::min<size_t>(k, in.stepPositions.size() - 1)];
+            const MeshInput *pos = &in.mesh;
+            if (!in.stepMeshes.empty())
+                pos = &in.stepMeshes[std::min<size_t>(k, in.stepMeshes.size() - 1)];
             Mtx4 m = in.objectToWorld;
             if (!in.stepTransforms.empty())
                 m = in.stepTransforms[std::min<size_t>(k, in.stepTransforms.size() - 1)];
             if (!own.empty()) m = m * own[std::min<size_t>(k, own.size() - 1)];
             for (int c = 0; c < 3; ++c) {
-                Vec3 p = affinePoint(m, pos[ix[c]]);
+                Vec3 p = affinePoint(m, pos->position(ix[c]));
                 if (!isFinite(p)) ok = false;
                 store.motionCorners.push_back(p);
                 mt.box.extend(p);
@@ -122,6 +129,24 @@ GridParams gridParams(const ADSParameters &p) {
 }  // namespace
 
 ADSInterface::~ADSInterface() = default;
+
+InstanceInput instanceInput(const Instance &instance, uint32_t index) {
+    InstanceInput in;
+    const Shape &shape = instance.shape();
+    in.name = instance.name();
+    in.shape = uint64_t(reinterpret_cast<uintptr_t>(&shape));
+    in.mesh.px = shape.vertices().px();
+    in.mesh.py = shape.vertices().py();
+    in.mesh.pz = shape.vertices().pz();
+    in.mesh.vertexCount = shape.vertices().size();
+    in.mesh.triangleCount = shape.triangleCount();
+    in.mesh.indices = shape.triangles().empty() ? nullptr : shape.triangles()[0].v;
+    in.mesh.indexStride = sizeof(Triangle) / sizeof(uint32_t);
+    in.objectToWorld = instance.objectToWorld();
+    in.flags = instance.flags();
+    in.index = index;
+    return in;
+}
 
 CompleteGrid::CompleteGrid() = default;
 CompleteGrid::~CompleteGrid() = default;
@@ -160,7 +185,7 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
     bool threeD = motion && motion->threeD();
 
     // Instancing decisions.
-    std::map<uint32_t, size_t> uses;
+    std::map<uint64_t, size_t> uses;
     for (const auto &in : instances) ++uses[in.shape];
     std::vector<char> instanced(instances.size(), 0), moving(instances.size(), 0),
         usable(instances.size(), 1);
@@ -168,15 +193,14 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
     size_t countDisplaced = 0, countMoving = 0, countPlain = 0, countInstanced = 0;
     for (size_t i = 0; i < instances.size(); ++i) {
         const InstanceInput &in = instances[i];
-        if (!matrixUsable(in.objectToWorld, inverses[i]) ||
-            (in.mesh.triangleCount > 0 && (!in.mesh.positions || !in.mesh.indices))) {
+        if (!matrixUsable(in.objectToWorld, inverses[i]) || !in.mesh.usable()) {
             message(kMsgWarning, 1, "Instance %s has a singular or non-finite placement, skipped",
                     in.name.c_str());
             usable[i] = 0;
             continue;
         }
         moving[i] = threeD && motion->instanceMoves(in.flags, !in.stepTransforms.empty(),
-                                                    !in.stepPositions.empty());
+                                                    !in.stepMeshes.empty());
         bool inst = choosesInstancing(params.useInstancing, params.instancingThreshold,
                                       uses[in.shape], in.mesh.triangleCount);
         if (inst && in.displaced) {
@@ -209,7 +233,7 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
 
     message(kMsgProgress, 1, "Inserting Shapes into ADS");
     std::vector<uint32_t> codes, secondCodes;
-    std::map<uint32_t, ShapeGrid *> shapeGrids;
+    std::map<uint64_t, ShapeGrid *> shapeGrids;
     for (size_t i = 0; i < instances.size(); ++i) {
         if (!usable[i]) continue;
         const InstanceInput &in = instances[i];

@@ -47,26 +47,46 @@ struct ADSParameters {
     uint32_t secondStructureMask = kFlagEnvelop;
 };
 
-/// Object-space triangle mesh as the grid reads it (borrowed, not copied).
+/// Object-space triangle mesh as the grid reads it (borrowed, not copied): positions either as
+/// Vec3 (positions) or as three float arrays (px, py, pz); triangle i has its corner indices at
+/// indices[i * indexStride + 0..2].
 struct MeshInput {
     const Vec3 *positions = nullptr;
+    const float *px = nullptr, *py = nullptr, *pz = nullptr;
     size_t vertexCount = 0;
-    const uint32_t *indices = nullptr;  ///< Three per triangle.
+    const uint32_t *indices = nullptr;
+    size_t indexStride = 3;
     size_t triangleCount = 0;
+
+    /// True when the position and index arrays are present (or there are no triangles).
+    bool usable() const {
+        return triangleCount == 0 || (indices && (positions || (px && py && pz)));
+    }
+    /// Position of vertex i.
+    Vec3 position(size_t i) const {
+        return positions ? positions[i] : Vec3(px[i], py[i], pz[i]);
+    }
+    /// Corner c of triangle t.
+    uint32_t corner(size_t t, int c) const { return indices[t * indexStride + c]; }
 };
 
 /// One scene instance as handed to the grid.
 struct InstanceInput {
     std::string name;
-    uint32_t shape = 0;               ///< Shape identity: instances of one shape share it.
+    uint64_t shape = 0;  ///< Shape identity: instances of one shape share it.
     MeshInput mesh;
     Mtx4 objectToWorld;
     uint32_t flags = 0;               ///< RenderStats flag word.
     uint32_t index = kNoInstance;     ///< Scene instance index reported in hits.
     bool displaced = false;           ///< Material uses render-time displacement.
     std::vector<Mtx4> stepTransforms;       ///< Per-step placements (motion), or empty.
-    std::vector<const Vec3 *> stepPositions;  ///< Per-step deformed positions, or empty.
+    std::vector<MeshInput> stepMeshes;  ///< Per-step deformed meshes (same topology), or empty.
 };
+
+class Instance;
+/// The grid's view of a scene instance: its shape's vertices and triangles, placement and flags.
+/// Instances of the same shape object share the shape identity. index: the scene instance index.
+InstanceInput instanceInput(const Instance &instance, uint32_t index);
 
 /// The acceleration structure of a scene: one top-level Grid over the scene's primitives, shape
 /// grids reached through instance grids, and a second structure.

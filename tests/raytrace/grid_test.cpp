@@ -9,6 +9,8 @@
 
 #include "core/message.h"
 #include "raytrace/complete_grid.h"
+#include "raytrace/instance.h"
+#include "raytrace/shape.h"
 #include "raytrace/motion_blur.h"
 #include "tests/raytrace/test_meshes.h"
 
@@ -506,6 +508,46 @@ TEST(MotionBlurTest, MovingTrianglesFollowTheRayTime) {
     EXPECT_EQ(k, 1u);
     EXPECT_NEAR(w, 0.2f, 1e-5f);
     EXPECT_EQ(MotionBlurHandler::clampTime(std::numeric_limits<float>::quiet_NaN()), 0.0f);
+}
+
+}  // namespace
+}  // namespace ox
+
+namespace ox {
+namespace {
+
+TEST(CompleteGridTest, BuildsFromSceneInstancesAndSharesTheirShapes) {
+    Mesh blob = testmesh::blob(11, 25);
+    Shape shape("blob");
+    shape.vertices().resize(uint32_t(blob.positions.size()), 0, false);
+    for (uint32_t i = 0; i < blob.positions.size(); ++i)
+        shape.vertices().setPosition(i, blob.positions[i]);
+    for (size_t t = 0; t < blob.triangleCount(); ++t)
+        shape.triangles().push_back(
+            {{blob.indices[3 * t], blob.indices[3 * t + 1], blob.indices[3 * t + 2]}, 0});
+    std::vector<std::unique_ptr<Instance>> owned;
+    std::vector<InstanceInput> ins;
+    for (uint32_t i = 0; i < 3; ++i) {
+        owned.push_back(Instance::create("i" + std::to_string(i),
+                                         Mtx4::translation({4.0f * i, 0, 0}), &shape, nullptr,
+                                         kAllFlags));
+        ins.push_back(instanceInput(*owned.back(), i));
+    }
+    CompleteGrid g;
+    ASSERT_TRUE(g.build(ins, ADSParameters()));
+    EXPECT_EQ(g.shapeBaseGridCount(), 1u);
+    EXPECT_EQ(g.shapeGridCount(), 3u);
+    Ray r;
+    r.origin = {8.0f, 0.05f, 10.0f};
+    r.direction = {0, 0, -1};
+    Hit h;
+    ASSERT_TRUE(g.intersect(r, h, nullptr));
+    EXPECT_EQ(h.instance, 2u);
+    Vec3 p = r.origin + r.direction * h.t;
+    Vec3 q = owned[2]->objectToWorld().transformPoint(
+        shape.corner(h.id, 0) * (1 - h.u - h.v) + shape.corner(h.id, 1) * h.u +
+        shape.corner(h.id, 2) * h.v);
+    EXPECT_NEAR((p - q).length(), 0.0f, 1e-5f);
 }
 
 }  // namespace
