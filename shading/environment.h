@@ -1,0 +1,120 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <unordered_map>
+
+#include "shading/shader.h"
+
+namespace ox {
+
+/// A constant colour for every direction (colour raised to 1 / gamma at construction).
+class ConstantEnvironmentShader : public EnvironmentShaderInterface {
+public:
+    ConstantEnvironmentShader(std::string name, const Color &color, float gamma = 1.0f);
+    Color evaluateDirection(const Vec3 &) const override { return color_; }
+    const Color &color() const { return color_; }
+
+private:
+    Color color_;
+};
+
+/// A gradient from the lower colour (straight down) to the upper colour (straight up), each
+/// raised to 1 / gamma at construction and scaled by the intensity.
+class GradientEnvironmentShader : public EnvironmentShaderInterface {
+public:
+    GradientEnvironmentShader(std::string name, const Color &upper, const Color &lower,
+                              float intensity = 1.0f, float gamma = 1.0f);
+    /// upper * (0.5 y + 0.5)^2 + lower * (0.5 - 0.5 y)^2 for the direction's y.
+    Color evaluateDirection(const Vec3 &direction) const override;
+    const Color &upper() const { return upper_; }
+    const Color &lower() const { return lower_; }
+
+private:
+    Color upper_, lower_;
+};
+
+/// A light probe image around the scene: the image, a rotation about the up axis, whether Z is
+/// up, and the blur used by GI rays. The probe lookup comes with the texture code.
+class IBLEnvironmentShader : public EnvironmentShaderInterface {
+public:
+    IBLEnvironmentShader(std::string name, std::string imageFile, float turnDomeDegrees,
+                         bool swapYZ, float giBlur);
+    Color evaluateDirection(const Vec3 &) const override { return Color(0, 0, 0, 1); }
+    const std::string &imageFile() const { return imageFile_; }
+    /// The rotation in radians.
+    float rotation() const { return rotation_; }
+    bool swapYZ() const { return swapYZ_; }
+    float giBlur() const { return giBlur_; }
+
+private:
+    std::string imageFile_;
+    float rotation_;
+    bool swapYZ_;
+    float giBlur_;
+};
+
+/// The environment types of the environment settings ("None" 0, "Camera" 1, "SkyLight" 2,
+/// "IBL" 3).
+enum class EnvironmentKind : int32_t { kNone = 0, kCamera = 1, kSkyLight = 2, kIBL = 3 };
+
+/// The values of the environment settings the scene needs.
+struct EnvironmentValues {
+    int32_t rtEnvironment = 1;
+    float rtEnvironmentIntensity = 1.0f;
+    int32_t giEnvironment = 1;
+    float giEnvironmentIntensity = 1.0f;
+    Color globalAmbientColor;
+    Color skyLightColor;
+    int32_t iblSamples = 300;
+    std::string iblImageFile = "-";
+    float iblIntensity = 1.0f;
+    float iblBandingVsNoise = 1.0f;
+    float iblTurnDome = 0.0f;
+    float iblSpecularBoost = 1.0f;
+    bool iblSwapYZ = false;
+    bool iblEmitLight = false;
+    bool iblEmitDiffuse = true;
+    bool iblEmitSpecular = false;
+    bool iblShadows = true;
+    bool iblEmitPhotons = false;
+    int32_t iblCausticsPhotons = 10000;
+    int32_t iblGlobalPhotons = 10000;
+    int32_t iblPhotonEnergy = 10000;
+    float iblGIEnvBlur = 0.05f;
+};
+
+/// The scene's environment: the shader for ray-traced rays and the one for GI rays (either may
+/// be null: rays that leave the scene see black), and the registry that owns the shaders, shared
+/// by name ("ConstantEnvShader(<colour>)", "IBLEnv_<image>").
+class Environment {
+public:
+    /// Makes the shaders the settings select. False (with the reason) when an image-based
+    /// environment names an image that cannot be read.
+    bool create(const EnvironmentValues &values, std::string &error);
+
+    const EnvironmentShaderInterface *rtShader() const { return rt_; }
+    const EnvironmentShaderInterface *giShader() const { return gi_; }
+    /// The registered shader of this name, or null.
+    const EnvironmentShaderInterface *find(const std::string &name) const;
+    /// Registers a shader unless its name is taken; returns the registered one.
+    const EnvironmentShaderInterface *add(std::unique_ptr<EnvironmentShaderInterface> shader);
+    /// Number of registered shaders.
+    size_t size() const;
+
+private:
+    const EnvironmentShaderInterface *select(int32_t kind, const EnvironmentValues &values,
+                                             std::string &error);
+
+    mutable std::mutex mutex_;
+    std::unordered_map<std::string, std::unique_ptr<EnvironmentShaderInterface>> shaders_;
+    const EnvironmentShaderInterface *rt_ = nullptr;
+    const EnvironmentShaderInterface *gi_ = nullptr;
+};
+
+/// The text of a colour as settings write it: "(r, g, b, a)" with four decimals.
+std::string colorText(const Color &c);
+
+}  // namespace ox
