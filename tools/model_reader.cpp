@@ -1,0 +1,759 @@
+#include "tools/model_reader.h"
+
+#include <assimp/DefaultIOSystem.h>
+#include <assimp/MemoryIOWrapper.h>
+#include <assimp/ProgressHandler.hpp>
+#include <assimp/config.h>
+#include <assimp/postprocess.h>
+#include <assimp/scene.h>
+
+#include <algorithm>
+#include <assimp/Importer.hpp>
+#include <cerrno>
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <map>
+#include <numbers>
+#include <string_view>
+#include <unordered_set>
+
+#include "core/message.h"
+
+namespace ox {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+std::string lowerExtension(const std::string &path) {
+    std::string ext = fs::path(path).extension().string();
+    for (char &c : ext) c = char(std::tolower(static_cast<unsigned char>(c)));
+    return ext;
+}
+
+// ---------------------------------------------------------------------------------------------
+// OBJ face filter. The OBJ reader of the library refuses a whole file for one face that names a
+// vertex that does not exist; such faces are taken out of the text before it is read.
+
+// Parses one index of a face corner ("3", "-1", "3/2/1": the position part and, when present,
+// the texture and normal parts). Returns false when any part is out of range.
+bool objCornerInRange(std::string_view corner, const uint64_t counts[3]) {
+    for (int part = 0; part < 3 && !corner.empty(); ++part) {
+        size_t slash = corner.find('/');
+        std::string_view field = corner.substr(0, slash);
+        if (!field.empty()) {
+            bool negative = field[0] == '-';
+            if (negative || field[0] == '+') field.remove_prefix(1);
+            uint64_t value = 0;
+            if (field.empty()) return false;
+            for (char c : field) {
+                if (c < '0' || c > '9') return false;
+                value = value * 10 + uint64_t(c - '0');
+                if (value > (uint64_t(1) << 40)) return false;
+            }
+            if (value == 0 || value > counts[part]) return false;
+        }
+        if (slash == std::string_view::npos) break;
+        corner.remove_prefix(slash + 1);
+    }
+    return true;
+}
+
+// Returns the number of faces removed; when it is not zero, filtered holds the cleaned text.
+uint64_t filterObjFaces(const std::string &text, std::string &filtered) {
+    // Indices may refer to vertices defined later in the file, so the totals count.
+    uint64_t totals[3] = {0, 0, 0};
+    auto forEachLine = [&](auto &&fn) {
+        size_t pos = 0;
+        while (pos < text.size()) {
+            size_t end = text.find('\n', pos);
+            if (end == std::string::npos) end = text.size();
+            fn(std::string_view(text).substr(pos, end - pos), pos, end);
+            pos = end + 1;
+        }
+    };
+    auto keyword = [](std::string_view line) {
+        size_t a = line.find_first_not_of(" \t");
+        if (a == std::string_view::npos) return std::string_view();
+        size_t b = line.find_first_of(" \t\r", a);
+        return line.substr(a, b == std::string_view::npos ? line.size() - a : b - a);
+    };
+    forEachLine([&](std::string_view line, size_t, size_t) {
+        std::string_view k = keyword(line);
+        if (k == "v") ++totals[0];
+        else if (k == "vt") ++totals[1];
+        else if (k == "vn") ++totals[2];
+    });
+    uint64_t dropped = 0;
+    uint64_t seen[3] = {0, 0, 0};
+    std::vector<std::pair<size_t, size_t>> cut;
+    forEachLine([&](std::string_view line, size_t begin, size_t end) {
+        std::string_view k = keyword(line);
+        if (k == "v") ++seen[0];
+        else if (k == "vt") ++seen[1];
+        else if (k == "vn") ++seen[2];
+        if (k != "f" && k != "l" && k != "p") return;
+        std::string_view rest = line.substr(line.find(k) + k.size());
+        bool ok = true;
+        size_t pos = 0;
+        while (ok) {
+            pos = rest.find_first_not_of(" \t\r", pos);
+            if (pos == std::string_view::npos) break;
+            size_t stop = rest.find_first_of(" \t\r", pos);
+            std::string_view corner = rest.substr(pos, stop == std::string_view::npos
+                                                            ? std::string_view::npos
+                                                            : stop - pos);
+            // Relative indices count back from the vertices defined so far.
+            uint64_t limit[3] = {totals[0], totals[1], totals[2]};
+            if (corner.find('-') != std::string_view::npos)
+                limit[0] = seen[0], limit[1] = seen[1], limit[2] = seen[2];
+            ok = objCornerInRange(corner, limit);
+            if (stop == std::string_view::npos) break;
+            pos = stop;
+        }
+        if (!ok) {
+            ++dropped;
+            cut.emplace_back(begin, end);
+        }
+    });
+    if (dropped == 0) return 0;
+    filtered.clear();
+    filtered.reserve(text.size());
+    size_t from = 0;
+    for (auto [b, e] : cut) {
+        filtered.append(text, from, b - from);
+        from = e;  // keeps the line break, so line numbers in later messages stay right
+    }
+    filtered.append(text, from, std::string::npos);
+    return dropped;
+}
+
+// Serves one file from memory and every other (materials, textures) from the disk.
+class FilteredIOSystem : public Assimp::DefaultIOSystem {
+public:
+    FilteredIOSystem(std::string path, std::string text)
+        : path_(std::move(path)), text_(std::move(text)) {}
+    bool Exists(const char *file) const override {
+        return isMain(file) || Assimp::DefaultIOSystem::Exists(file);
+    }
+    Assimp::IOStream *Open(const char *file, const char *mode) override {
+        if (isMain(file))
+            return new Assimp::MemoryIOStream(reinterpret_cast<const uint8_t *>(text_.data()),
+                                              text_.size(), false);
+        return Assimp::DefaultIOSystem::Open(file, mode);
+    }
+
+private:
+    bool isMain(const char *file) const {
+        std::error_code ec;
+        return file && (path_ == file || fs::equivalent(path_, file, ec));
+    }
+    std::string path_;
+    std::string text_;
+};
+
+class ProgressRelay : public Assimp::ProgressHandler {
+public:
+    explicit ProgressRelay(std::function<void(float)> fn) : fn_(std::move(fn)) {}
+    bool Update(float percentage) override {
+        if (fn_ && percentage >= 0.0f) fn_(std::min(percentage, 1.0f));
+        return true;
+    }
+
+private:
+    std::function<void(float)> fn_;
+};
+
+// ---------------------------------------------------------------------------------------------
+// Conversions between the library's types and the scene's.
+
+// The library's matrices act on column vectors; the scene's on row vectors.
+Mtx4 toRowMatrix(const aiMatrix4x4 &a) {
+    Mtx4 m;
+    const float src[4][4] = {{a.a1, a.a2, a.a3, a.a4},
+                             {a.b1, a.b2, a.b3, a.b4},
+                             {a.c1, a.c2, a.c3, a.c4},
+                             {a.d1, a.d2, a.d3, a.d4}};
+    for (int i = 0; i < 4; ++i)
+        for (int j = 0; j < 4; ++j) m.m[i][j] = src[j][i];
+    return m;
+}
+
+Vec3 toVec3(const aiVector3D &v) { return {v.x, v.y, v.z}; }
+
+Mtx4 linearPart(const Mtx4 &m) {
+    Mtx4 r = m;
+    r.m[3][0] = r.m[3][1] = r.m[3][2] = 0.0f;
+    return r;
+}
+
+// A right-handed frame whose -z axis is forward and whose y axis is as close to up as it can.
+void frameFromForward(Vec3 forward, Vec3 up, Vec3 &x, Vec3 &y, Vec3 &z) {
+    if (forward.lengthSquared() == 0.0f || !isFinite(forward)) forward = Vec3(0, 0, -1);
+    z = (-forward).normalize();
+    y = up - z * dot(z, up);
+    if (y.lengthSquared() < 1e-12f || !isFinite(y)) {
+        Vec3 alt = std::fabs(z.y) < 0.9f ? Vec3(0, 1, 0) : Vec3(1, 0, 0);
+        y = alt - z * dot(z, alt);
+    }
+    y.normalize();
+    x = cross(y, z).normalize();
+}
+
+Mtx4 rowsMatrix(const Vec3 &x, const Vec3 &y, const Vec3 &z, const Vec3 &p) {
+    Mtx4 m;
+    const Vec3 rows[4] = {x, y, z, p};
+    for (int i = 0; i < 4; ++i) m.m[i][0] = rows[i].x, m.m[i][1] = rows[i].y, m.m[i][2] = rows[i].z;
+    return m;
+}
+
+Color toColor(const aiColor3D &c) { return Color(c.r, c.g, c.b, 1.0f); }
+
+bool isValidUtf8(const std::string &s) {
+    size_t i = 0;
+    while (i < s.size()) {
+        unsigned char c = static_cast<unsigned char>(s[i]);
+        int extra = c < 0x80 ? 0 : (c >> 5) == 6 ? 1 : (c >> 4) == 14 ? 2 : (c >> 3) == 30 ? 3 : -1;
+        if (extra < 0 || i + size_t(extra) >= s.size() + (extra == 0 ? 1 : 0)) return false;
+        for (int k = 1; k <= extra; ++k)
+            if ((static_cast<unsigned char>(s[i + k]) >> 6) != 2) return false;
+        if (c < 0x20 && extra == 0) return false;
+        i += size_t(extra) + 1;
+    }
+    return true;
+}
+
+// ---------------------------------------------------------------------------------------------
+
+class ModelWalker {
+public:
+    ModelWalker(const aiScene &scene, const ImportOptions &options, const std::string &path,
+                ImportStats &stats)
+        : scene_(scene),
+          options_(options),
+          stats_(stats),
+          modelDir_(fs::path(path).parent_path()),
+          stem_(sanitizeName(fs::path(path).stem().string(), "model")) {
+        const std::string ext = lowerExtension(path);
+        gltf_ = ext == ".gltf" || ext == ".glb";
+        convert_ = conversionMatrix(options);
+        convertLinear_ = linearPart(convert_);
+        Mtx4 inv;
+        if (convert_.inverse(inv)) convertInverse_ = inv;
+        mirror_ = convert_.determinant3() < 0.0f;
+        float s = std::cbrt(std::fabs(convert_.determinant3()));
+        normalMatrix_ = linearPart(convert_);
+        if (s > 0.0f)
+            for (int i = 0; i < 3; ++i)
+                for (int j = 0; j < 3; ++j) normalMatrix_.m[i][j] /= s;
+    }
+
+    bool walk(ImportedModel &model) {
+        materialIndex_.assign(scene_.mNumMaterials, -1);
+        if (scene_.mRootNode) walkNode(*scene_.mRootNode, Mtx4(), model);
+        for (unsigned i = 0; i < scene_.mNumCameras; ++i) addCamera(*scene_.mCameras[i], model);
+        for (unsigned i = 0; i < scene_.mNumLights; ++i) addLight(*scene_.mLights[i], model);
+        return true;
+    }
+
+private:
+    std::string prefixed(const std::string &name, const std::string &fallback) {
+        return options_.namePrefix + sanitizeName(name, fallback);
+    }
+
+    // The glTF reader also copies a camera's or light's node translation into its own position,
+    // which would apply it twice.
+    Vec3 ownPosition(const aiString &name, const aiVector3D &position) const {
+        Vec3 p = toVec3(position);
+        const aiNode *node = scene_.mRootNode ? scene_.mRootNode->FindNode(name) : nullptr;
+        if (gltf_ && node && p == Vec3(node->mTransformation.a4, node->mTransformation.b4,
+                                       node->mTransformation.c4))
+            return Vec3();
+        return p;
+    }
+
+    Mtx4 nodeWorld(const aiString &name) const {
+        const aiNode *node = scene_.mRootNode ? scene_.mRootNode->FindNode(name) : nullptr;
+        Mtx4 world;
+        for (; node; node = node->mParent) world = world * toRowMatrix(node->mTransformation);
+        return world;
+    }
+
+    void walkNode(const aiNode &node, const Mtx4 &parent, ImportedModel &model) {
+        const Mtx4 world = toRowMatrix(node.mTransformation) * parent;
+        std::vector<unsigned> meshes;
+        for (unsigned i = 0; i < node.mNumMeshes; ++i) {
+            unsigned m = node.mMeshes[i];
+            if (m < scene_.mNumMeshes && scene_.mMeshes[m]->mNumFaces > 0 &&
+                (scene_.mMeshes[m]->mPrimitiveTypes & aiPrimitiveType_TRIANGLE))
+                meshes.push_back(m);
+        }
+        if (!meshes.empty()) {
+            auto found = shapeOf_.find(meshes);
+            size_t shapeIndex;
+            if (found != shapeOf_.end()) {
+                shapeIndex = found->second;
+            } else {
+                shapeIndex = model.shapes.size();
+                std::string base = node.mName.length ? node.mName.C_Str()
+                                                      : scene_.mMeshes[meshes[0]]->mName.C_Str();
+                model.shapes.push_back(
+                    buildShape(uniqueName(prefixed(base, stem_), shapeNames_), meshes, model));
+                shapeOf_.emplace(meshes, shapeIndex);
+            }
+            ImportedInstance instance;
+            instance.name = uniqueName(prefixed(node.mName.C_Str(), stem_), instanceNames_);
+            instance.shape = model.shapes[shapeIndex].name;
+            // Shapes are stored converted, so the placement is conjugated by the conversion.
+            instance.objectToWorld = convertInverse_ * world * convert_;
+            model.instances.push_back(std::move(instance));
+        }
+        for (unsigned i = 0; i < node.mNumChildren; ++i)
+            if (node.mChildren[i]) walkNode(*node.mChildren[i], world, model);
+    }
+
+    ImportedShape buildShape(const std::string &name, const std::vector<unsigned> &meshes,
+                             ImportedModel &model) {
+        ImportedShape shape;
+        shape.name = name;
+        // The union of the meshes' UV channels and colours; a mesh lacking one gets zeros
+        // (UVs) or white (colours).
+        unsigned uvCount = 0;
+        bool colors = false;
+        for (unsigned m : meshes) {
+            const aiMesh &mesh = *scene_.mMeshes[m];
+            for (unsigned c = 0; c < AI_MAX_NUMBER_OF_TEXTURECOORDS; ++c)
+                if (mesh.mTextureCoords[c]) uvCount = std::max(uvCount, c + 1);
+            colors = colors || mesh.mColors[0] != nullptr;
+        }
+        shape.uvSets.resize(uvCount);
+        shape.uvSetNames.resize(uvCount);
+        std::unordered_set<std::string> setNames;
+        for (unsigned c = 0; c < uvCount; ++c) {
+            std::string setName;
+            for (unsigned m : meshes)
+                if (scene_.mMeshes[m]->HasTextureCoordsName(c)) {
+                    setName = sanitizeName(scene_.mMeshes[m]->GetTextureCoordsName(c)->C_Str(), "");
+                    break;
+                }
+            if (setName.empty()) setName = "uv" + std::to_string(c);
+            shape.uvSetNames[c] = uniqueName(setName, setNames);
+        }
+
+        for (unsigned m : meshes) {
+            const aiMesh &mesh = *scene_.mMeshes[m];
+            const uint32_t base = uint32_t(shape.positions.size());
+            for (unsigned v = 0; v < mesh.mNumVertices; ++v) {
+                shape.positions.push_back(convert_.transformPoint(toVec3(mesh.mVertices[v])));
+                Vec3 n = mesh.mNormals ? toVec3(mesh.mNormals[v]) : Vec3();
+                shape.normals.push_back(normalMatrix_.transformVector(n).normalize());
+                Vec3 t, b;
+                if (mesh.mTangents && mesh.mBitangents) {
+                    t = convertLinear_.transformVector(toVec3(mesh.mTangents[v])).normalize();
+                    b = convertLinear_.transformVector(toVec3(mesh.mBitangents[v])).normalize();
+                    if (!isFinite(t) || !isFinite(b)) t = b = Vec3();
+                }
+                shape.tangents.push_back(t);
+                shape.bitangents.push_back(b);
+                if (colors) {
+                    const aiColor4D *c = mesh.mColors[0];
+                    shape.colors.push_back(c ? Color(c[v].r, c[v].g, c[v].b, c[v].a)
+                                             : Color::white());
+                }
+                for (unsigned c = 0; c < uvCount; ++c) {
+                    const aiVector3D *uv = mesh.mTextureCoords[c];
+                    shape.uvSets[c].push_back(uv ? Vec2(uv[v].x, uv[v].y) : Vec2());
+                }
+            }
+            ImportedGroup group;
+            group.material = materialName(mesh.mMaterialIndex, mesh.mColors[0] != nullptr, model);
+            group.indices.reserve(size_t(mesh.mNumFaces) * 3);
+            for (unsigned f = 0; f < mesh.mNumFaces; ++f) {
+                const aiFace &face = mesh.mFaces[f];
+                if (face.mNumIndices != 3) continue;
+                uint32_t i0 = base + face.mIndices[0], i1 = base + face.mIndices[1],
+                         i2 = base + face.mIndices[2];
+                group.indices.insert(group.indices.end(), {i0, mirror_ ? i2 : i1, mirror_ ? i1 : i2});
+            }
+            // Meshes of one material are kept in one group.
+            auto same = std::find_if(shape.groups.begin(), shape.groups.end(),
+                                     [&](const ImportedGroup &g) { return g.material == group.material; });
+            if (same != shape.groups.end())
+                same->indices.insert(same->indices.end(), group.indices.begin(), group.indices.end());
+            else
+                shape.groups.push_back(std::move(group));
+        }
+        completeTangentFrames(shape);
+        return shape;
+    }
+
+    std::string materialName(unsigned index, bool vertexColors, ImportedModel &model) {
+        if (index >= scene_.mNumMaterials) index = 0;
+        if (scene_.mNumMaterials == 0) {
+            if (defaultMaterial_.empty()) {
+                ImportedMaterial mat;
+                mat.name = uniqueName(prefixed("default", "default"), materialNames_);
+                mat.diffuse.color = Color(0.8f, 0.8f, 0.8f, 1.0f);
+                mat.diffuse.scale = 1.0f;
+                mat.diffuse.useVertexColor = vertexColors;
+                defaultMaterial_ = mat.name;
+                model.materials.push_back(std::move(mat));
+            }
+            return defaultMaterial_;
+        }
+        if (materialIndex_[index] < 0) {
+            materialIndex_[index] = int(model.materials.size());
+            model.materials.push_back(convertMaterial(*scene_.mMaterials[index], vertexColors));
+        }
+        return model.materials[size_t(materialIndex_[index])].name;
+    }
+
+    // Reads one texture channel: the file of the first texture of the type, if any.
+    bool readTexture(const aiMaterial &mat, aiTextureType type, ImportedChannel &channel) {
+        if (mat.GetTextureCount(type) == 0) return false;
+        aiString file;
+        unsigned uvIndex = 0;
+        if (mat.GetTexture(type, 0, &file, nullptr, &uvIndex) != AI_SUCCESS) return false;
+        std::string name = file.C_Str();
+        if (name.empty()) return false;
+        if (name[0] == '*' || scene_.GetEmbeddedTexture(file.C_Str())) {
+            ++stats_.embeddedTextures;
+            message(kMsgWarning, 6, "Texture %s is stored inside the model and is not carried over",
+                    name.c_str());
+            return false;
+        }
+        if (!isValidUtf8(name)) {
+            ++stats_.missingTextures;
+            message(kMsgWarning, 6, "Texture file name is not valid text, skipping it");
+            return false;
+        }
+        std::replace(name.begin(), name.end(), '\\', '/');
+        fs::path p(name);
+        if (p.is_relative()) p = modelDir_ / p;
+        std::error_code ec;
+        if (fs::exists(p, ec)) {
+            fs::path abs = fs::absolute(p, ec);
+            channel.fileTexture = (ec ? p : abs).lexically_normal().string();
+        } else {
+            ++stats_.missingTextures;
+            message(kMsgWarning, 6, "Texture file %s not found; the material keeps the name",
+                    p.string().c_str());
+            channel.fileTexture = p.lexically_normal().string();
+        }
+        if (uvIndex > 0) channel.uvLayerOverride = "uv" + std::to_string(uvIndex);
+        channel.scale = 1.0f;
+        channel.color = Color::white();
+        return true;
+    }
+
+    ImportedMaterial convertMaterial(const aiMaterial &mat, bool vertexColors) {
+        ImportedMaterial out;
+        aiString name;
+        mat.Get(AI_MATKEY_NAME, name);
+        out.name = uniqueName(prefixed(name.C_Str(), "material"), materialNames_);
+        aiColor3D c;
+        int twosided = 0;
+        if (mat.Get(AI_MATKEY_TWOSIDED, twosided) == AI_SUCCESS) out.twosided = twosided != 0;
+        float shininess = 0.0f;
+        if (mat.Get(AI_MATKEY_SHININESS, shininess) == AI_SUCCESS && shininess > 0.0f &&
+            std::isfinite(shininess))
+            out.shininess = shininess;
+
+        out.diffuse.color = Color(0.8f, 0.8f, 0.8f, 1.0f);
+        if (mat.Get(AI_MATKEY_COLOR_DIFFUSE, c) == AI_SUCCESS) out.diffuse.color = toColor(c);
+        out.diffuse.scale = 1.0f;
+        if (!readTexture(mat, aiTextureType_DIFFUSE, out.diffuse))
+            if (!readTexture(mat, aiTextureType_BASE_COLOR, out.diffuse))
+                out.diffuse.useVertexColor = vertexColors;
+
+        // Ambient colours of exchange formats are mostly left-overs of fixed-function
+        // pipelines (often white); only an ambient texture is carried over.
+        readTexture(mat, aiTextureType_AMBIENT, out.ambient);
+
+        float opacity = 1.0f;
+        if (mat.Get(AI_MATKEY_OPACITY, opacity) == AI_SUCCESS && opacity < 1.0f && opacity >= 0.0f) {
+            float t = 1.0f - opacity;
+            out.transparency.color = Color(t, t, t, 1.0f);
+            out.transparency.scale = 1.0f;
+        }
+        readTexture(mat, aiTextureType_OPACITY, out.transparency);
+
+        if (mat.Get(AI_MATKEY_COLOR_EMISSIVE, c) == AI_SUCCESS && (c.r > 0 || c.g > 0 || c.b > 0))
+            out.emissive.color = toColor(c), out.emissive.scale = 1.0f;
+        readTexture(mat, aiTextureType_EMISSIVE, out.emissive);
+
+        // A specular colour without an exponent is a reader's default, not a highlight.
+        if (shininess > 0.0f && mat.Get(AI_MATKEY_COLOR_SPECULAR, c) == AI_SUCCESS &&
+            (c.r > 0 || c.g > 0 || c.b > 0)) {
+            out.specular.color = toColor(c);
+            float strength = 1.0f;
+            mat.Get(AI_MATKEY_SHININESS_STRENGTH, strength);
+            out.specular.scale = std::isfinite(strength) && strength > 0.0f ? strength : 1.0f;
+        }
+        readTexture(mat, aiTextureType_SPECULAR, out.specular);
+
+        if (mat.Get(AI_MATKEY_COLOR_REFLECTIVE, c) == AI_SUCCESS && (c.r > 0 || c.g > 0 || c.b > 0))
+            out.reflection.color = toColor(c), out.reflection.scale = 1.0f;
+        readTexture(mat, aiTextureType_REFLECTION, out.reflection);
+
+        readTexture(mat, aiTextureType_NORMALS, out.normal);
+        return out;
+    }
+
+    void addCamera(const aiCamera &cam, ImportedModel &model) {
+        const Mtx4 world = nodeWorld(cam.mName) * convert_;
+        const Mtx4 linear = linearPart(world);
+        Vec3 p = world.transformPoint(ownPosition(cam.mName, cam.mPosition));
+        Vec3 forward = linear.transformVector(toVec3(cam.mLookAt));
+        Vec3 up = linear.transformVector(toVec3(cam.mUp));
+        Vec3 x, y, z;
+        frameFromForward(forward, up, x, y, z);
+        ImportedCamera out;
+        out.name = uniqueName(prefixed(cam.mName.C_Str(), "camera"), cameraNames_);
+        out.objectToWorld = rowsMatrix(x, y, z, p);
+        if (cam.mOrthographicWidth > 0.0f) {
+            out.type = ImportedCameraType::kOrtho;
+            float scale = std::cbrt(std::fabs(convert_.determinant3()));
+            float w = 2.0f * cam.mOrthographicWidth * scale;
+            out.imagePlaneSize = Vec2(w, cam.mAspect > 0.0f ? w / cam.mAspect : w);
+        } else {
+            // The readers store the full horizontal angle here.
+            float h = cam.mHorizontalFOV;
+            if (!(h > 0.0f && h < std::numbers::pi_v<float>)) h = std::numbers::pi_v<float> / 3.0f;
+            float v = cam.mAspect > 0.0f ? 2.0f * std::atan(std::tan(h * 0.5f) / cam.mAspect) : h;
+            out.fov = Vec2(h, v);
+        }
+        model.cameras.push_back(std::move(out));
+    }
+
+    void addLight(const aiLight &light, ImportedModel &model) {
+        const Mtx4 world = nodeWorld(light.mName) * convert_;
+        const Mtx4 linear = linearPart(world);
+        Vec3 p = world.transformPoint(ownPosition(light.mName, light.mPosition));
+        Vec3 dir = linear.transformVector(toVec3(light.mDirection));
+        Vec3 up = linear.transformVector(toVec3(light.mUp));
+        if (up.lengthSquared() == 0.0f) up = Vec3(0, 1, 0);
+        ImportedLight out;
+        out.name = uniqueName(prefixed(light.mName.C_Str(), "light"), lightNames_);
+        out.color = toColor(light.mColorDiffuse);
+        if (light.mAttenuationQuadratic > 0.0f) out.falloffExponent = 2.0f;
+        else if (light.mAttenuationLinear > 0.0f) out.falloffExponent = 1.0f;
+        Vec3 x, y, z;
+        switch (light.mType) {
+            case aiLightSource_POINT:
+                out.type = ImportedLightType::kPoint;
+                out.objectToWorld = Mtx4::translation(p);
+                break;
+            case aiLightSource_DIRECTIONAL: {
+                // Directional lights shine along local -y: y is the negated direction.
+                out.type = ImportedLightType::kDirectional;
+                out.falloffExponent = 0.0f;
+                frameFromForward(dir, up, x, y, z);
+                out.objectToWorld = rowsMatrix(x, -z, y, p);
+                break;
+            }
+            case aiLightSource_SPOT: {
+                out.type = ImportedLightType::kSpot;
+                frameFromForward(dir, up, x, y, z);
+                out.objectToWorld = rowsMatrix(x, y, z, p);
+                // glTF files give the angle from the axis to the edge; the others the full cone.
+                const float factor = gltf_ ? 2.0f : 1.0f;
+                float inner = light.mAngleInnerCone * factor, outer = light.mAngleOuterCone * factor;
+                if (!(outer > 0.0f) || !std::isfinite(outer)) outer = std::numbers::pi_v<float> / 4;
+                if (!(inner >= 0.0f) || inner > outer) inner = outer;
+                const float toDegrees = 180.0f / std::numbers::pi_v<float>;
+                out.coneAngleDegrees = inner * toDegrees;
+                out.penumbraAngleDegrees = (outer - inner) * 0.5f * toDegrees;
+                break;
+            }
+            case aiLightSource_AREA: {
+                out.type = ImportedLightType::kArea;
+                frameFromForward(dir, up, x, y, z);
+                float scale = std::cbrt(std::fabs(convert_.determinant3()));
+                float w = light.mSize.x > 0.0f ? light.mSize.x * scale : scale;
+                float h = light.mSize.y > 0.0f ? light.mSize.y * scale : scale;
+                out.objectToWorld = rowsMatrix(x * (0.5f * w), y * (0.5f * h), z, p);
+                break;
+            }
+            case aiLightSource_AMBIENT:
+                out.type = ImportedLightType::kEnvironment;
+                out.color = toColor(light.mColorAmbient);
+                out.falloffExponent = 0.0f;
+                break;
+            default:
+                ++stats_.unsupportedLights;
+                message(kMsgWarning, 6, "Light %s is of a kind the scene cannot show, skipping it",
+                        light.mName.C_Str());
+                return;
+        }
+        model.lights.push_back(std::move(out));
+    }
+
+    const aiScene &scene_;
+    const ImportOptions &options_;
+    ImportStats &stats_;
+    fs::path modelDir_;
+    std::string stem_;
+    bool gltf_ = false;
+    Mtx4 convert_, convertInverse_, convertLinear_, normalMatrix_;
+    bool mirror_ = false;
+    std::map<std::vector<unsigned>, size_t> shapeOf_;
+    std::vector<int> materialIndex_;
+    std::string defaultMaterial_;
+    std::unordered_set<std::string> shapeNames_, instanceNames_, materialNames_, cameraNames_,
+        lightNames_;
+};
+
+// Drops faces the later steps cannot take: corners that do not exist, corners at NaN or
+// infinite positions, and points and lines; counts the polygons that will be triangulated.
+void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
+    for (unsigned m = 0; m < scene.mNumMeshes; ++m) {
+        aiMesh *mesh = scene.mMeshes[m];
+        if (!mesh) continue;
+        if (!mesh->mVertices) mesh->mNumVertices = 0;
+        std::vector<uint8_t> finite(mesh->mNumVertices);
+        for (unsigned v = 0; v < mesh->mNumVertices; ++v) {
+            const aiVector3D &p = mesh->mVertices[v];
+            finite[v] = std::isfinite(p.x) && std::isfinite(p.y) && std::isfinite(p.z);
+        }
+        unsigned kept = 0;
+        for (unsigned f = 0; f < mesh->mNumFaces; ++f) {
+            aiFace &face = mesh->mFaces[f];
+            bool drop = false;
+            if (face.mNumIndices < 3 || !face.mIndices) {
+                ++stats.pointsAndLines;
+                drop = true;
+            } else {
+                bool bad = false, nonFinite = false;
+                for (unsigned k = 0; k < face.mNumIndices; ++k) {
+                    unsigned i = face.mIndices[k];
+                    if (i >= mesh->mNumVertices) bad = true;
+                    else if (!finite[i]) nonFinite = true;
+                }
+                if (bad) ++stats.badIndexFaces, drop = true;
+                else if (nonFinite) ++stats.nonFiniteFaces, drop = true;
+                else if (face.mNumIndices > 3) ++stats.polygonsTriangulated;
+            }
+            if (drop) continue;
+            // Swapping keeps every index array owned by exactly one face of the array.
+            if (kept != f) {
+                std::swap(mesh->mFaces[kept].mIndices, face.mIndices);
+                std::swap(mesh->mFaces[kept].mNumIndices, face.mNumIndices);
+            }
+            ++kept;
+        }
+        mesh->mNumFaces = kept;
+        // Positions no face uses may still be NaN; they must not reach the later steps.
+        for (unsigned v = 0; v < mesh->mNumVertices; ++v)
+            if (!finite[v]) mesh->mVertices[v] = aiVector3D(0, 0, 0);
+        if (kept == 0) {
+            ++stats.emptyMeshes;
+            mesh->mPrimitiveTypes = 0;
+        } else {
+            mesh->mPrimitiveTypes &= ~unsigned(aiPrimitiveType_POINT | aiPrimitiveType_LINE);
+            mesh->mPrimitiveTypes |= aiPrimitiveType_TRIANGLE;
+        }
+        if (scene.mNumMaterials > 0 && mesh->mMaterialIndex >= scene.mNumMaterials)
+            mesh->mMaterialIndex = 0;
+    }
+}
+
+}  // namespace
+
+Mtx4 conversionMatrix(const ImportOptions &options) {
+    Mtx4 axes;
+    if (options.upAxis == UpAxis::kZ) {
+        // x stays, y becomes -z, z becomes y.
+        axes = rowsMatrix(Vec3(1, 0, 0), Vec3(0, 0, -1), Vec3(0, 1, 0), Vec3());
+    } else if (options.upAxis == UpAxis::kX) {
+        // x becomes y, y becomes -x, z stays.
+        axes = rowsMatrix(Vec3(0, 1, 0), Vec3(-1, 0, 0), Vec3(0, 0, 1), Vec3());
+    }
+    Mtx4 mirror;
+    if (options.flipHandedness) mirror.m[2][2] = -1.0f;
+    return mirror * axes * Mtx4::scale(Vec3(options.unitScale, options.unitScale, options.unitScale));
+}
+
+std::string sanitizeName(const std::string &name, const std::string &fallback) {
+    std::string out;
+    out.reserve(name.size());
+    for (char ch : name) {
+        unsigned char c = static_cast<unsigned char>(ch);
+        bool ok = c > 0x20 && c < 0x7f && c != '/' && c != '\\' && c != ':' && c != '*' &&
+                  c != '?' && c != '"' && c != '<' && c != '>' && c != '|';
+        out.push_back(ok ? ch : '_');
+    }
+    if (out.empty() || out == "." || out == "..") out = fallback;
+    if (out.size() > 200) out.resize(200);
+    return out;
+}
+
+bool readModel(const std::string &path, const ImportOptions &options, ImportedModel &model,
+               ImportStats &stats) {
+    if (!(options.unitScale > 0.0f) || !std::isfinite(options.unitScale)) {
+        message(kMsgError, 6, "Unit scale must be a positive number");
+        return false;
+    }
+    std::error_code ec;
+    if (!fs::is_regular_file(path, ec)) {
+        message(kMsgError, 6, "Cannot read model %s: no such file", path.c_str());
+        return false;
+    }
+    FILE *probe = std::fopen(path.c_str(), "rb");
+    if (!probe) {
+        message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), std::strerror(errno));
+        return false;
+    }
+    std::fclose(probe);
+
+    try {
+        Assimp::Importer importer;
+        importer.SetPropertyFloat(AI_CONFIG_PP_GSN_MAX_SMOOTHING_ANGLE,
+                                  std::clamp(options.smoothingAngleDegrees, 0.0f, 175.0f));
+        if (options.progress) importer.SetProgressHandler(new ProgressRelay(options.progress));
+
+        if (lowerExtension(path) == ".obj") {
+            std::string text, filtered;
+            if (FILE *f = std::fopen(path.c_str(), "rb")) {
+                char buffer[1 << 16];
+                size_t n;
+                while ((n = std::fread(buffer, 1, sizeof buffer, f)) > 0) text.append(buffer, n);
+                std::fclose(f);
+            }
+            uint64_t dropped = filterObjFaces(text, filtered);
+            if (dropped > 0) {
+                stats.badIndexFaces += dropped;
+                importer.SetIOHandler(new FilteredIOSystem(path, std::move(filtered)));
+            }
+        }
+
+        const aiScene *read = importer.ReadFile(path, 0);
+        if (!read) {
+            message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(),
+                    importer.GetErrorString());
+            return false;
+        }
+        sanitizeMeshes(*const_cast<aiScene *>(read), stats);
+        unsigned flags = aiProcess_Triangulate | aiProcess_GenSmoothNormals |
+                         aiProcess_CalcTangentSpace | aiProcess_SortByPType;
+        if (options.weld) flags |= aiProcess_JoinIdenticalVertices;
+        const aiScene *scene = importer.ApplyPostProcessing(flags);
+        if (!scene) {
+            message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(),
+                    importer.GetErrorString());
+            return false;
+        }
+        ImportedModel result;
+        ModelWalker walker(*scene, options, path, stats);
+        walker.walk(result);
+        model = std::move(result);
+    } catch (const std::exception &e) {
+        message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), e.what());
+        return false;
+    }
+    return true;
+}
+
+}  // namespace ox
