@@ -25,7 +25,8 @@ endif()
 function(ox_library folder)
     cmake_parse_arguments(ARG "" "" "PUBLIC;PRIVATE" ${ARGN})
     file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp")
-    list(FILTER sources EXCLUDE REGEX ".*/main[^/]*\\.cpp$")
+    # Program entry files (main.cpp, <program>_main.cpp) belong to executables, not libraries.
+    list(FILTER sources EXCLUDE REGEX ".*/([^/]*_)?main[^/]*\\.cpp$")
     if(NOT sources)
         # A folder whose first code has not arrived yet: a placeholder that passes on its
         # dependencies, so the chain of libraries stays whole.

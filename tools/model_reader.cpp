@@ -648,13 +648,11 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
         // Positions no face uses may still be NaN; they must not reach the later steps.
         for (unsigned v = 0; v < mesh->mNumVertices; ++v)
             if (!finite[v]) mesh->mVertices[v] = aiVector3D(0, 0, 0);
-        if (kept == 0) {
-            ++stats.emptyMeshes;
-            mesh->mPrimitiveTypes = 0;
-        } else {
-            mesh->mPrimitiveTypes &= ~unsigned(aiPrimitiveType_POINT | aiPrimitiveType_LINE);
-            mesh->mPrimitiveTypes |= aiPrimitiveType_TRIANGLE;
-        }
+        // An emptied mesh still claims triangles, which the later steps expect of every mesh;
+        // the walk skips meshes without faces.
+        if (kept == 0) ++stats.emptyMeshes;
+        mesh->mPrimitiveTypes &= ~unsigned(aiPrimitiveType_POINT | aiPrimitiveType_LINE);
+        mesh->mPrimitiveTypes |= aiPrimitiveType_TRIANGLE;
         if (scene.mNumMaterials > 0 && mesh->mMaterialIndex >= scene.mNumMaterials)
             mesh->mMaterialIndex = 0;
     }

@@ -1,0 +1,483 @@
+#include <assimp/postprocess.h>
+#include <assimp/scene.h>
+#include <gtest/gtest.h>
+#include <libxml/parser.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <assimp/Importer.hpp>
+#include <fstream>
+#include <map>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "scene/vtm.h"
+#include "tools/import_command.h"
+#include "tools/model_reader.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+
+const std::string kImport = std::string(OX_BINARY_DIR) + "/tools/thevorn-import";
+
+struct RunResult {
+    int status = -1;
+    std::string output;
+};
+
+// Runs thevorn-import with the arguments; stdout and stderr together.
+RunResult runImport(const std::string &args) {
+    RunResult r;
+    std::string cmd = kImport + " " + args + " 2>&1";
+    FILE *p = popen(cmd.c_str(), "r");
+    if (!p) return r;
+    char buf[4096];
+    size_t n;
+    while ((n = fread(buf, 1, sizeof buf, p)) > 0) r.output.append(buf, n);
+    int st = pclose(p);
+    r.status = WIFEXITED(st) ? WEXITSTATUS(st) : -1;
+    return r;
+}
+
+std::string readBytes(const fs::path &p) {
+    std::ifstream f(p, std::ios::binary);
+    std::stringstream s;
+    s << f.rdbuf();
+    return s.str();
+}
+
+void writeText(const fs::path &p, const std::string &text) {
+    std::ofstream f(p, std::ios::binary);
+    f << text;
+}
+
+size_t countOf(const std::string &text, const std::string &what) {
+    size_t n = 0;
+    for (size_t pos = text.find(what); pos != std::string::npos; pos = text.find(what, pos + 1)) ++n;
+    return n;
+}
+
+class ImportTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        dir_ = fs::temp_directory_path() /
+               ("thevorn_import_" + std::to_string(getpid()) + "_" +
+                ::testing::UnitTest::GetInstance()->current_test_info()->name());
+        fs::remove_all(dir_);
+        fs::create_directories(dir_);
+    }
+    void TearDown() override { fs::remove_all(dir_); }
+    std::string path(const std::string &name) const { return (dir_ / name).string(); }
+
+    fs::path dir_;
+};
+
+// Little-endian byte image of a mesh file, built field by field as the format lays it out.
+struct Bytes {
+    std::string s;
+    void str(const std::string &v) { s += v, s.push_back('\0'); }
+    void u32(uint32_t v) {
+        for (int i = 0; i < 4; ++i) s.push_back(char((v >> (8 * i)) & 0xff));
+    }
+    void f32(float v) {
+        uint32_t b;
+        std::memcpy(&b, &v, 4);
+        u32(b);
+    }
+    void f32s(std::initializer_list<float> vs) {
+        for (float v : vs) f32(v);
+    }
+};
+
+// The same little glTF scene in every test that needs two UV sets: one quad with normals, two
+// UV sets, vertex colours and a base colour texture, a camera and a spot light.
+std::string gltfQuad() {
+    const float pos[] = {0, 0, 0, 2, 0, 0, 2, 1, 0, 0, 1, 0};
+    const float nrm[] = {0, 0, 1, 0, 0, 1, 0, 0, 1, 0, 0, 1};
+    const float uv0[] = {0, 0, 1, 0, 1, 1, 0, 1};
+    const float uv1[] = {0.1f, 0.1f, 0.4f, 0.1f, 0.4f, 0.4f, 0.1f, 0.4f};
+    const float col[] = {1, 0, 0, 1, 0, 1, 0, 1, 0, 0, 1, 1, 1, 1, 1, 0.5f};
+    const uint16_t idx[] = {0, 1, 2, 0, 2, 3};
+    std::string bin;
+    auto add = [&](const void *d, size_t n) { bin.append(static_cast<const char *>(d), n); };
+    add(pos, sizeof pos), add(nrm, sizeof nrm), add(uv0, sizeof uv0), add(uv1, sizeof uv1);
+    add(col, sizeof col), add(idx, sizeof idx);
+    static const char *kB64 = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+    std::string b64;
+    for (size_t i = 0; i < bin.size(); i += 3) {
+        uint32_t v = uint32_t(uint8_t(bin[i])) << 16;
+        if (i + 1 < bin.size()) v |= uint32_t(uint8_t(bin[i + 1])) << 8;
+        if (i + 2 < bin.size()) v |= uint8_t(bin[i + 2]);
+        b64 += kB64[(v >> 18) & 63], b64 += kB64[(v >> 12) & 63];
+        b64 += i + 1 < bin.size() ? kB64[(v >> 6) & 63] : '=';
+        b64 += i + 2 < bin.size() ? kB64[v & 63] : '=';
+    }
+    std::ostringstream g;
+    g << R"({"asset":{"version":"2.0"},"scene":0,"scenes":[{"nodes":[0,1,2]}],
+"nodes":[{"name":"Quad","mesh":0,"translation":[1,2,3]},
+ {"name":"Cam","camera":0,"translation":[0,1,5]},
+ {"name":"Spot","extensions":{"KHR_lights_punctual":{"light":0}},"translation":[0,4,0],
+  "rotation":[-0.70710678,0,0,0.70710678]}],
+"extensionsUsed":["KHR_lights_punctual"],
+"extensions":{"KHR_lights_punctual":{"lights":[{"type":"spot","color":[1,0.5,0.25],
+ "intensity":2,"spot":{"innerConeAngle":0.25,"outerConeAngle":0.5}}]}},
+"cameras":[{"type":"perspective","perspective":{"yfov":0.8,"aspectRatio":1.0,"znear":0.1}}],
+"meshes":[{"name":"QuadMesh","primitives":[{"attributes":{"POSITION":0,"NORMAL":1,
+ "TEXCOORD_0":2,"TEXCOORD_1":3,"COLOR_0":4},"indices":5,"material":0}]}],
+"materials":[{"name":"Tiles","pbrMetallicRoughness":{"baseColorFactor":[0.5,0.6,0.7,1],
+ "baseColorTexture":{"index":0}},"emissiveFactor":[0.25,0,0]}],
+"textures":[{"source":0}],"images":[{"uri":"tiles.png"}],
+"buffers":[{"byteLength":)"
+      << bin.size() << R"(,"uri":"data:application/octet-stream;base64,)" << b64 << R"("}],
+"bufferViews":[{"buffer":0,"byteOffset":0,"byteLength":48},{"buffer":0,"byteOffset":48,"byteLength":48},
+ {"buffer":0,"byteOffset":96,"byteLength":32},{"buffer":0,"byteOffset":128,"byteLength":32},
+ {"buffer":0,"byteOffset":160,"byteLength":64},{"buffer":0,"byteOffset":224,"byteLength":12}],
+"accessors":[{"bufferView":0,"componentType":5126,"count":4,"type":"VEC3","min":[0,0,0],"max":[2,1,0]},
+ {"bufferView":1,"componentType":5126,"count":4,"type":"VEC3"},
+ {"bufferView":2,"componentType":5126,"count":4,"type":"VEC2"},
+ {"bufferView":3,"componentType":5126,"count":4,"type":"VEC2"},
+ {"bufferView":4,"componentType":5126,"count":4,"type":"VEC4"},
+ {"bufferView":5,"componentType":5123,"count":6,"type":"SCALAR"}]})";
+    return g.str();
+}
+
+// Instance name -> placement, read from a scene file with libxml2.
+std::map<std::string, ox::Mtx4> instancePlacements(const std::string &file) {
+    std::map<std::string, ox::Mtx4> out;
+    xmlDocPtr doc = xmlReadFile(file.c_str(), nullptr, 0);
+    if (!doc) return out;
+    auto text = [](xmlNodePtr n) {
+        xmlChar *c = xmlNodeGetContent(n);
+        std::string s = c ? reinterpret_cast<const char *>(c) : "";
+        xmlFree(c);
+        return s;
+    };
+    auto named = [](xmlNodePtr n, const char *name) {
+        return n->type == XML_ELEMENT_NODE && std::strcmp((const char *)n->name, name) == 0;
+    };
+    for (xmlNodePtr e = xmlDocGetRootElement(doc)->children; e; e = e->next) {
+        if (!named(e, "Instance")) continue;
+        std::string shape;
+        ox::Mtx4 m;
+        for (xmlNodePtr c = e->children; c; c = c->next) {
+            if (named(c, "Shape")) shape = text(c);
+            if (!named(c, "ObjectToWorld")) continue;
+            int i = 0;
+            for (xmlNodePtr row = c->children; row; row = row->next) {
+                if (!named(row, "r")) continue;
+                int j = 0;
+                for (xmlNodePtr col = row->children; col; col = col->next)
+                    if (named(col, "c") && i < 4 && j < 4) m.m[i][j++] = std::stof(text(col));
+                ++i;
+            }
+        }
+        out[shape] = m;
+    }
+    xmlFreeDoc(doc);
+    return out;
+}
+
+}  // namespace
+
+// One triangle with a UV set and a normal: the mesh file is checked byte for byte.
+TEST_F(ImportTest, WritesTheMeshFileByteForByte) {
+    writeText(path("tri.obj"),
+              "o tri\nv 0 0 0\nv 2 0 0\nv 0 1 0\nvt 0 0\nvt 1 0\nvt 0 1\nvn 0 0 1\n"
+              "f 1/1/1 2/2/1 3/3/1\n");
+    RunResult r = runImport(path("tri.obj") + " -o " + path("out"));
+    ASSERT_EQ(r.status, 0) << r.output;
+
+    Bytes b;
+    b.str("VTM");
+    b.u32(1);
+    b.str("tri");
+    b.u32(3);
+    b.u32(1);
+    b.str("uv0");
+    b.u32(1);
+    b.str("DefaultMaterial");
+    b.u32(1);
+    b.f32s({0, 0, 0, 2, 1, 0});
+    // position, normal, tangent (along u), bitangent (along v), then the UV pair.
+    b.f32s({0, 0, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0, 0, 0});
+    b.f32s({2, 0, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0, 1, 0});
+    b.f32s({0, 1, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0, 0, 1});
+    b.u32(0), b.u32(1), b.u32(2);
+    EXPECT_EQ(readBytes(path("out/tri.vtm")), b.s);
+
+    // The scene file: the instance places the shape with the identity.
+    std::string xml = readBytes(path("out/tri.xml"));
+    EXPECT_EQ(xml.rfind("<?xml version=\"1.0\" encoding=\"ISO-8859-1\"?>\n<OXScene>\n", 0), 0u);
+    EXPECT_NE(xml.find("\t<Instance>\n\t\t<Name>tri</Name>\n\t\t<Shape>tri</Shape>\n"
+                       "\t\t<ObjectToWorld>\n\t\t\t<r>\n\t\t\t\t<c>1</c>\n"),
+              std::string::npos)
+        << xml;
+    EXPECT_NE(xml.find("<MaterialOverrides/>"), std::string::npos);
+    EXPECT_EQ(countOf(xml, "<Material>"), 1u);
+}
+
+// Two UV sets in order, vertex colours (version 2 file), a texture reference, node placement,
+// a camera and a spot light from a glTF scene.
+TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
+    writeText(path("quad.gltf"), gltfQuad());
+    writeText(path("tiles.png"), "not really an image");
+    RunResult r = runImport(path("quad.gltf") + " -o " + path("out") + " --prefix lvl_");
+    ASSERT_EQ(r.status, 0) << r.output;
+
+    vtm::TempMesh mesh;
+    std::string error;
+    ASSERT_TRUE(vtm::readTempMesh(path("out/lvl_Quad.vtm"), mesh, &error)) << error;
+    auto reader = vtm::TempMeshReaderFactory::instance().open(path("out/lvl_Quad.vtm"));
+    ASSERT_TRUE(reader);
+    EXPECT_EQ(reader->version(), 2u);
+    EXPECT_TRUE(mesh.colors);
+    EXPECT_EQ(mesh.name, "lvl_Quad");
+    EXPECT_EQ(mesh.uvSetNames, (std::vector<std::string>{"uv0", "uv1"}));
+    ASSERT_EQ(mesh.groups.size(), 1u);
+    EXPECT_EQ(mesh.groups[0].name, "lvl_Tiles");
+    EXPECT_EQ(mesh.groups[0].triangleCount, 2u);
+    ASSERT_EQ(mesh.vertexCount(), 4u);
+    EXPECT_EQ(mesh.bounds, ox::BBox(ox::Vec3(0, 0, 0), ox::Vec3(2, 1, 0)));
+    // Every vertex keeps its colour and both UV pairs together (glTF's v runs downwards, the
+    // reader turns it over).
+    for (uint32_t v = 0; v < 4; ++v) {
+        const float *f = &mesh.vertices[v * 16];
+        const float *uv = &mesh.uvs[v * 4];
+        const float x = f[0], y = f[1];
+        EXPECT_FLOAT_EQ(uv[0], x / 2) << v;
+        EXPECT_FLOAT_EQ(uv[1], 1 - y) << v;
+        EXPECT_FLOAT_EQ(uv[2], 0.1f + 0.3f * x / 2) << v;
+        EXPECT_FLOAT_EQ(uv[3], 1 - (0.1f + 0.3f * y)) << v;
+        const float expectRed = (x == 0 && y == 0) ? 1.0f : (x == 0 && y == 1) ? 1.0f : 0.0f;
+        EXPECT_FLOAT_EQ(f[12], expectRed) << v;
+        EXPECT_FLOAT_EQ(f[15], (x == 0 && y == 1) ? 0.5f : 1.0f) << v;
+        // The normal is +z; the tangent frame was computed and is perpendicular to it.
+        EXPECT_FLOAT_EQ(f[5], 1.0f);
+        EXPECT_NEAR(f[6] * f[3] + f[7] * f[4] + f[8] * f[5], 0.0f, 1e-5f);
+        EXPECT_NEAR(f[6] * f[6] + f[7] * f[7] + f[8] * f[8], 1.0f, 1e-4f);
+    }
+
+    std::string xml = readBytes(path("out/quad.xml"));
+    EXPECT_NE(xml.find("<Name>lvl_Tiles</Name>"), std::string::npos);
+    EXPECT_NE(xml.find("<FileTexture>" + fs::canonical(path("tiles.png")).string() +
+                       "</FileTexture>"),
+              std::string::npos)
+        << xml;
+    EXPECT_NE(xml.find("<UseVertexColor>false</UseVertexColor>"), std::string::npos);
+    // Translation (1, 2, 3) in the last row of the instance matrix.
+    EXPECT_NE(xml.find("<r>\n\t\t\t\t<c>1</c>\n\t\t\t\t<c>2</c>\n\t\t\t\t<c>3</c>\n\t\t\t\t<c>1</c>"),
+              std::string::npos);
+    EXPECT_NE(xml.find("<Name>lvl_Cam</Name>"), std::string::npos);
+    EXPECT_NE(xml.find("<Type>SPOT</Type>"), std::string::npos);
+
+    // The library view of the same file, in scene terms.
+    ox::ImportedModel model;
+    ox::ImportStats stats;
+    ASSERT_TRUE(ox::readModel(path("quad.gltf"), ox::ImportOptions(), model, stats));
+    ASSERT_EQ(model.cameras.size(), 1u);
+    const ox::Mtx4 &cam = model.cameras[0].objectToWorld;
+    EXPECT_FLOAT_EQ(cam.m[3][1], 1.0f);  // at (0, 1, 5), looking along -z
+    EXPECT_FLOAT_EQ(cam.m[3][2], 5.0f);
+    EXPECT_FLOAT_EQ(cam.m[2][2], 1.0f);
+    ASSERT_EQ(model.lights.size(), 1u);
+    const ox::ImportedLight &spot = model.lights[0];
+    EXPECT_EQ(spot.type, ox::ImportedLightType::kSpot);
+    EXPECT_FLOAT_EQ(spot.color.g, 1.0f);  // colour times intensity
+    // Turned to shine down: local -z maps to -y. Cone angles are full angles in degrees.
+    EXPECT_NEAR(spot.objectToWorld.m[2][1], 1.0f, 1e-5f);
+    EXPECT_NEAR(spot.objectToWorld.m[3][1], 4.0f, 1e-5f);
+    EXPECT_NEAR(spot.coneAngleDegrees, 28.6479f, 1e-3f);
+    EXPECT_NEAR(spot.penumbraAngleDegrees, 14.3239f, 1e-3f);
+    EXPECT_FLOAT_EQ(model.materials[0].emissive.color.r, 0.25f);
+    EXPECT_EQ(model.materials[0].emissive.scale, 1.0f);
+}
+
+// Vertex colours of a PLY scan give a version 2 file and a material that uses them.
+TEST_F(ImportTest, PlyVertexColours) {
+    writeText(path("scan.ply"),
+              "ply\nformat ascii 1.0\nelement vertex 3\nproperty float x\nproperty float y\n"
+              "property float z\nproperty uchar red\nproperty uchar green\nproperty uchar blue\n"
+              "element face 1\nproperty list uchar int vertex_indices\nend_header\n"
+              "0 0 0 255 0 0\n1 0 0 0 255 0\n0 1 0 0 0 51\n3 0 1 2\n");
+    RunResult r = runImport(path("scan.ply") + " -o " + path("out"));
+    ASSERT_EQ(r.status, 0) << r.output;
+    vtm::TempMesh mesh;
+    ASSERT_TRUE(vtm::readTempMesh(path("out/scan.vtm"), mesh));
+    ASSERT_TRUE(mesh.colors);
+    ASSERT_EQ(mesh.vertexCount(), 3u);
+    EXPECT_FLOAT_EQ(mesh.vertices[12], 1.0f);
+    EXPECT_FLOAT_EQ(mesh.vertices[16 + 13], 1.0f);
+    EXPECT_FLOAT_EQ(mesh.vertices[32 + 14], 0.2f);
+    EXPECT_TRUE(mesh.uvSetNames.empty());
+    EXPECT_NE(readBytes(path("out/scan.xml")).find("<UseVertexColor>true</UseVertexColor>"),
+              std::string::npos);
+}
+
+// Bad faces are dropped or triangulated with counts; the rest of the model comes through.
+TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
+    writeText(path("bad.obj"),
+              "v 0 0 0\nv 1 0 0\nv 1 1 0\nv 0 1 0\nv nan 0 1\n"
+              "f 1 2 3 4\n"    // a quad: two triangles
+              "f 1 2 9\n"      // index out of range
+              "f 1 -9 2\n"     // relative index out of range
+              "f 1 2 5\n"      // NaN corner
+              "l 1 3\n"        // a line
+              "f 2 3 4\n");
+    RunResult r = runImport(path("bad.obj") + " --list");
+    ASSERT_EQ(r.status, 0) << r.output;
+    EXPECT_NE(r.output.find("Dropped 2 faces with vertex indices out of range"), std::string::npos)
+        << r.output;
+    EXPECT_NE(r.output.find("Dropped 1 faces with NaN or infinite positions"), std::string::npos);
+    EXPECT_NE(r.output.find("Dropped 1 points and lines"), std::string::npos);
+    EXPECT_NE(r.output.find("Triangulated 1 polygons"), std::string::npos);
+    EXPECT_NE(r.output.find("Shapes: 1 (3 triangles)"), std::string::npos);
+
+    // Nothing usable at all: a warning, no crash, an empty scene.
+    writeText(path("none.obj"), "v 0 0 0\nv 1 0 0\nf 1 2 7\n");
+    r = runImport(path("none.obj") + " --list");
+    EXPECT_EQ(r.status, 0) << r.output;
+    EXPECT_NE(r.output.find("Shapes: 0"), std::string::npos) << r.output;
+}
+
+// A file that is no model: one error, a non-zero status, nothing written.
+TEST_F(ImportTest, UnreadableModelGivesOneError) {
+    writeText(path("junk.fbx"), std::string(300, '\x17') + "not a model");
+    RunResult r = runImport(path("junk.fbx") + " -o " + path("out"));
+    EXPECT_EQ(r.status, ox::kImportFailed);
+    EXPECT_EQ(countOf(r.output, "[ERROR]"), 1u) << r.output;
+    EXPECT_NE(r.output.find("Cannot read model"), std::string::npos);
+    EXPECT_FALSE(fs::exists(path("out")));
+
+    r = runImport(path("missing.obj") + " -o " + path("out"));
+    EXPECT_EQ(r.status, ox::kImportFailed);
+    EXPECT_EQ(countOf(r.output, "[ERROR]"), 1u) << r.output;
+
+    r = runImport(path("junk.fbx") + " --scale -2 -o " + path("out"));
+    EXPECT_EQ(r.status, ox::kImportUsage);
+    EXPECT_NE(r.output.find("Usage: thevorn-import"), std::string::npos);
+    r = runImport(path("junk.fbx"));
+    EXPECT_EQ(r.status, ox::kImportUsage);
+}
+
+// Existing files are kept unless --force is given; a refusal writes nothing at all.
+TEST_F(ImportTest, RefusesToOverwrite) {
+    writeText(path("a.obj"), "o a\nv 0 0 0\nv 1 0 0\nv 0 1 0\nf 1 2 3\no b\nv 0 0 1\nv 1 0 1\n"
+                             "v 0 1 1\nf 4 5 6\n");
+    ASSERT_EQ(runImport(path("a.obj") + " -o " + path("out")).status, 0);
+    writeText(path("out/b.vtm"), "mine");
+    const std::string sceneBefore = readBytes(path("out/a.xml"));
+    fs::remove(path("out/a.vtm"));
+    RunResult r = runImport(path("a.obj") + " -o " + path("out") + " --scale 2");
+    EXPECT_EQ(r.status, ox::kImportWouldOverwrite) << r.output;
+    EXPECT_NE(r.output.find("Refusing to overwrite"), std::string::npos);
+    EXPECT_FALSE(fs::exists(path("out/a.vtm")));
+    EXPECT_EQ(readBytes(path("out/b.vtm")), "mine");
+
+    r = runImport(path("a.obj") + " -o " + path("out") + " --scale 2 --force");
+    EXPECT_EQ(r.status, 0) << r.output;
+    vtm::TempMesh mesh;
+    ASSERT_TRUE(vtm::readTempMesh(path("out/b.vtm"), mesh));
+    EXPECT_EQ(mesh.bounds.max, ox::Vec3(2, 2, 2));
+    EXPECT_EQ(readBytes(path("out/a.xml")), sceneBefore);
+    // No temporary files stay behind.
+    for (const auto &e : fs::directory_iterator(path("out")))
+        EXPECT_NE(e.path().filename().string()[0], '.') << e.path();
+}
+
+// Unit scale, up axis, handedness and welding change the geometry as a user expects.
+TEST_F(ImportTest, UnitsAxesHandednessAndWelding) {
+    writeText(path("m.obj"), "o m\nv 0 0 0\nv 10 0 0\nv 10 20 30\nv 0 20 30\nf 1 2 3\nf 1 3 4\n");
+    ox::ImportOptions o;
+    ox::ImportedModel model;
+    ox::ImportStats stats;
+    o.unitScale = 0.1f;
+    o.upAxis = ox::UpAxis::kZ;
+    ASSERT_TRUE(ox::readModel(path("m.obj"), o, model, stats));
+    ASSERT_EQ(model.shapes.size(), 1u);
+    ox::BBox b = model.shapes[0].bounds();
+    // z up becomes y up: (x, y, z) -> (x, z, -y), then scaled.
+    EXPECT_NEAR(b.min.x, 0, 1e-6); EXPECT_NEAR(b.max.x, 1, 1e-6);
+    EXPECT_NEAR(b.min.y, 0, 1e-6); EXPECT_NEAR(b.max.y, 3, 1e-6);
+    EXPECT_NEAR(b.min.z, -2, 1e-6); EXPECT_NEAR(b.max.z, 0, 1e-6);
+    EXPECT_EQ(model.shapes[0].positions.size(), 4u);
+
+    // Mirrored: z is negated and the winding turns, so the face normal and the stored vertex
+    // normal still agree.
+    o = ox::ImportOptions();
+    o.flipHandedness = true;
+    o.weld = false;
+    ASSERT_TRUE(ox::readModel(path("m.obj"), o, model, stats));
+    const ox::ImportedShape &s = model.shapes[0];
+    EXPECT_EQ(s.positions.size(), 6u);  // no welding: three vertices per triangle
+    EXPECT_NEAR(s.bounds().min.z, -30, 1e-5);
+    const auto &idx = s.groups[0].indices;
+    ox::Vec3 n = ox::cross(s.positions[idx[1]] - s.positions[idx[0]],
+                           s.positions[idx[2]] - s.positions[idx[0]]);
+    EXPECT_GT(ox::dot(n, s.normals[idx[0]]), 0.0f);
+}
+
+// Round trip: the written files hold as many triangles, the same box and the same UV sets as
+// the asset library reports for the model itself.
+TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
+    writeText(path("quad.gltf"), gltfQuad());
+    writeText(path("tiles.png"), "x");
+    writeText(path("boxes.obj"),
+              "o box\nv -1 -1 -1\nv 1 -1 -1\nv 1 1 -1\nv -1 1 -1\nv -1 -1 1\nv 1 -1 1\nv 1 1 1\n"
+              "v -1 1 1\nf 1 4 3 2\nf 5 6 7 8\nf 1 2 6 5\nf 3 4 8 7\nf 2 3 7 6\nf 1 5 8 4\n"
+              "o plane\nv -5 -1 -5\nv 5 -1 -5\nv 5 -1 5\nv -5 -1 5\nf 9 12 11 10\n");
+    for (const std::string file : {"quad.gltf", "boxes.obj"}) {
+        // What the library reports, with every node's placement applied.
+        Assimp::Importer importer;
+        const aiScene *scene =
+            importer.ReadFile(path(file), aiProcess_Triangulate | aiProcess_PreTransformVertices);
+        ASSERT_TRUE(scene) << importer.GetErrorString();
+        size_t libTriangles = 0;
+        ox::BBox libBox;
+        unsigned libUvSets = 0;
+        for (unsigned m = 0; m < scene->mNumMeshes; ++m) {
+            const aiMesh *mesh = scene->mMeshes[m];
+            libTriangles += mesh->mNumFaces;
+            libUvSets = std::max(libUvSets, mesh->GetNumUVChannels());
+            for (unsigned v = 0; v < mesh->mNumVertices; ++v)
+                libBox.extend(ox::Vec3(mesh->mVertices[v].x, mesh->mVertices[v].y,
+                                       mesh->mVertices[v].z));
+        }
+        const bool lightmap = libUvSets < 2;
+
+        const std::string out = path("out_" + file);
+        RunResult r = runImport(path(file) + " -o " + out + (lightmap ? " --lightmap-uv 64" : ""));
+        ASSERT_EQ(r.status, 0) << r.output;
+        std::map<std::string, ox::Mtx4> placement = instancePlacements(
+            (fs::path(out) / (fs::path(file).stem().string() + ".xml")).string());
+        size_t triangles = 0;
+        ox::BBox box;
+        for (const auto &e : fs::directory_iterator(out)) {
+            if (e.path().extension() != ".vtm") continue;
+            vtm::TempMesh mesh;
+            ASSERT_TRUE(vtm::readTempMesh(e.path().string(), mesh)) << e.path();
+            ASSERT_EQ(placement.count(mesh.name), 1u) << mesh.name;
+            triangles += mesh.indices.size() / 3;
+            EXPECT_EQ(mesh.uvSetNames.size(), lightmap ? 2u : libUvSets) << e.path();
+            for (uint32_t i : mesh.indices) ASSERT_LT(i, mesh.vertexCount());
+            for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
+                const float *p = &mesh.vertices[v * (mesh.colors ? 16 : 12)];
+                box.extend(placement[mesh.name].transformPoint(ox::Vec3(p[0], p[1], p[2])));
+            }
+            if (!lightmap) continue;
+            // The generated light-map set lies inside the unit square.
+            EXPECT_EQ(mesh.uvSetNames[1], "lightmap");
+            for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
+                float u = mesh.uvs[v * 4 + 2], w = mesh.uvs[v * 4 + 3];
+                EXPECT_TRUE(u > 0 && u < 1 && w > 0 && w < 1) << u << " " << w;
+            }
+        }
+        EXPECT_EQ(triangles, libTriangles) << file;
+        EXPECT_EQ(box, libBox) << file;
+    }
+}
