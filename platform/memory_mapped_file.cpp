@@ -1,0 +1,109 @@
+#include "platform/memory_mapped_file.h"
+
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+
+#include "core/message.h"
+
+namespace ox {
+namespace {
+
+std::string tempDirectory() {
+    const char *dir = std::getenv("TMPDIR");
+    std::string d = (dir && *dir) ? dir : "/tmp";
+    if (d.back() != '/') d += '/';
+    return d;
+}
+
+}  // namespace
+
+MemoryMappedFile::MemoryMappedFile(uint64_t size, uint64_t memoryLimit) : size_(size) {
+    if (size == 0) return;
+    if (size <= memoryLimit) {
+        if (size > SIZE_MAX) {
+            fail("Cannot allocate memory block", ENOMEM);
+            return;
+        }
+        base_ = static_cast<unsigned char *>(std::calloc(size_t(size), 1));
+        if (!base_) fail("Cannot allocate memory block", ENOMEM);
+        return;
+    }
+    message(kMsgInfo, 6, "Mapping memory to file");
+    std::string path = tempDirectory() + kFilePrefix + "XXXXXX";
+    fd_ = mkostemp(path.data(), O_CLOEXEC);
+    if (fd_ < 0) {
+        fail("Cannot create temporary file", errno);
+        return;
+    }
+    // The name goes at once: the open descriptor keeps the data, and the file disappears
+    // with the last descriptor, whether the block is released or the process dies.
+    unlink(path.c_str());
+    // Reserving the blocks now turns a full disk into a clean failure here instead of a
+    // fault at the first write through the mapping.
+    int err = posix_fallocate(fd_, 0, off_t(size));
+    if (err == EOPNOTSUPP || err == EINVAL) err = ftruncate(fd_, off_t(size)) == 0 ? 0 : errno;
+    if (err != 0) {
+        fail("Cannot size temporary file", err);
+        return;
+    }
+    void *p = mmap(nullptr, size_t(size), PROT_READ | PROT_WRITE, MAP_SHARED, fd_, 0);
+    if (p == MAP_FAILED) {
+        fail("Cannot map temporary file", errno);
+        return;
+    }
+    base_ = static_cast<unsigned char *>(p);
+}
+
+MemoryMappedFile::~MemoryMappedFile() {
+    if (fd_ >= 0) {
+        if (base_) munmap(base_, size_t(size_));
+        close(fd_);
+    } else {
+        std::free(base_);
+    }
+}
+
+void MemoryMappedFile::fail(const char *what, int error) {
+    // One line: the system's text is cut at its first line break.
+    std::string text = std::strerror(error);
+    text = text.substr(0, text.find_first_of("\r\n"));
+    message(kMsgError, 6, "%s (%llu bytes): %s", what, (unsigned long long)size_, text.c_str());
+    if (fd_ >= 0) {
+        close(fd_);
+        fd_ = -1;
+    }
+    base_ = nullptr;  // every failure happens before the block exists
+    failed_ = true;
+}
+
+void *MemoryMappedFile::map(uint64_t offset, uint64_t size) {
+    if (!base_ || !inRange(offset, size)) return nullptr;
+    return base_ + offset;
+}
+
+uint64_t MemoryMappedFile::allocationGranularity() {
+    long page = sysconf(_SC_PAGESIZE);
+    return page > 0 ? uint64_t(page) : 4096;
+}
+
+bool MemoryMappedFile::read(uint64_t offset, void *destination, uint64_t size) const {
+    if (size == 0) return inRange(offset, 0);
+    if (!base_ || !inRange(offset, size)) return false;
+    std::memcpy(destination, base_ + offset, size_t(size));
+    return true;
+}
+
+bool MemoryMappedFile::write(uint64_t offset, const void *source, uint64_t size) {
+    if (size == 0) return inRange(offset, 0);
+    if (!base_ || !inRange(offset, size)) return false;
+    std::memcpy(base_ + offset, source, size_t(size));
+    return true;
+}
+
+}  // namespace ox

@@ -1,0 +1,121 @@
+#include "platform/memory_mapped_file.h"
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
+
+namespace fs = std::filesystem;
+
+namespace {
+
+/// Points TMPDIR at a fresh directory for one test and removes it afterwards.
+class TempDirScope {
+public:
+    TempDirScope() {
+        dir_ = fs::temp_directory_path() / ("oxmmf_test_" + std::to_string(getpid()));
+        fs::create_directories(dir_);
+        const char *old = std::getenv("TMPDIR");
+        if (old) old_ = old, hadOld_ = true;
+        setenv("TMPDIR", dir_.c_str(), 1);
+    }
+    ~TempDirScope() {
+        if (hadOld_)
+            setenv("TMPDIR", old_.c_str(), 1);
+        else
+            unsetenv("TMPDIR");
+        std::error_code ec;
+        fs::remove_all(dir_, ec);
+    }
+    const fs::path &dir() const { return dir_; }
+    /// Files in the directory whose name starts with "OXR".
+    int spillFiles() const {
+        int n = 0;
+        for (auto &e : fs::directory_iterator(dir_))
+            if (e.path().filename().string().rfind("OXR", 0) == 0) ++n;
+        return n;
+    }
+
+private:
+    fs::path dir_;
+    std::string old_;
+    bool hadOld_ = false;
+};
+
+uint64_t pattern(uint64_t i) { return i * 0x9E3779B97F4A7C15ull ^ (i >> 7); }
+
+TEST(MemoryMappedFileTest, SmallBlockLivesInMemory) {
+    ox::MemoryMappedFile block(4096);
+    ASSERT_TRUE(block.ok());
+    EXPECT_FALSE(block.isFileBacked());
+    std::vector<unsigned char> bytes(4096, 0xFF);
+    ASSERT_TRUE(block.read(0, bytes.data(), 4096));
+    for (unsigned char b : bytes) ASSERT_EQ(b, 0);  // zero-filled like a new file
+    const char text[] = "tile";
+    EXPECT_TRUE(block.write(4092, text, 4));
+    EXPECT_FALSE(block.write(4093, text, 4));                   // past the end
+    EXPECT_FALSE(block.read(UINT64_MAX - 1, bytes.data(), 4));  // offset + size overflows
+    EXPECT_EQ(block.map(4096, 1), nullptr);
+    EXPECT_EQ(std::string(static_cast<char *>(block.map(4092, 4)), 4), "tile");
+    ox::MemoryMappedFile empty(0);
+    EXPECT_TRUE(empty.ok());
+}
+
+TEST(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
+    TempDirScope temp;
+    const uint64_t size = 300ull << 20;
+    {
+        testing::internal::CaptureStdout();
+        ox::MemoryMappedFile block(size);
+        std::string out = testing::internal::GetCapturedStdout();
+        ASSERT_TRUE(block.ok());
+        EXPECT_TRUE(block.isFileBacked());
+        EXPECT_NE(out.find("Mapping memory to file"), std::string::npos);
+        // The name is gone from the directory while the block is alive.
+        EXPECT_EQ(temp.spillFiles(), 0);
+        // Written in 1 MiB pieces, one range crossing every piece boundary.
+        std::vector<uint64_t> chunk((1 << 20) / 8);
+        for (uint64_t off = 0; off < size; off += 1 << 20) {
+            for (size_t i = 0; i < chunk.size(); ++i) chunk[i] = pattern(off / 8 + i);
+            ASSERT_TRUE(block.write(off, chunk.data(), 1 << 20));
+        }
+        for (uint64_t mib = 1; mib < 300; mib += 37) {
+            const uint64_t off = (mib << 20) - 24;  // straddles a piece boundary
+            std::vector<uint64_t> back(chunk.size());
+            ASSERT_TRUE(block.read(off, back.data(), 1 << 20));
+            for (size_t i = 0; i < back.size(); ++i) ASSERT_EQ(back[i], pattern(off / 8 + i));
+        }
+        const uint64_t *all = static_cast<const uint64_t *>(block.map(0, size));
+        ASSERT_NE(all, nullptr);
+        for (uint64_t i = 0; i < size / 8; i += 4099) ASSERT_EQ(all[i], pattern(i)) << i;
+        EXPECT_EQ(all[size / 8 - 1], pattern(size / 8 - 1));
+    }
+    EXPECT_EQ(temp.spillFiles(), 0);
+}
+
+TEST(MemoryMappedFileTest, SpillFailureReportsAndIsNotOk) {
+    const char *old = std::getenv("TMPDIR");
+    std::string saved = old ? old : "";
+    setenv("TMPDIR", "/nonexistent/ox-no-such-dir", 1);
+    testing::internal::CaptureStdout();
+    ox::MemoryMappedFile block(2 << 20, 1 << 20);
+    std::string out = testing::internal::GetCapturedStdout();
+    if (old)
+        setenv("TMPDIR", saved.c_str(), 1);
+    else
+        unsetenv("TMPDIR");
+    EXPECT_FALSE(block.ok());
+    EXPECT_NE(out.find("[ERROR]    Cannot create temporary file"), std::string::npos) << out;
+    // The info line of the spill and exactly one error line.
+    EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 2) << out;
+    char c = 0;
+    EXPECT_FALSE(block.read(0, &c, 1));
+    EXPECT_FALSE(block.write(0, &c, 1));
+}
+
+}  // namespace
