@@ -6,6 +6,7 @@
 #include <system_error>
 
 #include "core/message.h"
+#include "platform/system.h"
 
 namespace ox {
 namespace {
@@ -49,6 +50,8 @@ void StdThread::bindThreadLocal() { OXThread::setCurrent(owner_); }
 
 void StdThread::entry() {
     if (!name_.empty()) pthread_setname_np(pthread_self(), name_.substr(0, 15).c_str());
+    // The floating-point modes are per thread; every thread computes like the main thread.
+    setFlushDenormalsToZero();
     bindThreadLocal();
     runnable_->run();
     running_.store(false, std::memory_order_release);
