@@ -16,7 +16,10 @@
 #include <string>
 #include <vector>
 
+#include "raytrace/instance.h"
+#include "scene/temp_shape.h"
 #include "scene/vtm.h"
+#include "shading/material.h"
 #include "tools/import_command.h"
 #include "tools/model_reader.h"
 
@@ -182,6 +185,22 @@ std::map<std::string, ox::Mtx4> instancePlacements(const std::string &file) {
     xmlFreeDoc(doc);
     return out;
 }
+
+// Resolves only the materials the scene file defines.
+class SceneMaterials : public ox::ShapeMaterialResolverInterface {
+public:
+    explicit SceneMaterials(const std::string &xml) : xml_(xml) {}
+    const ox::Material *resolve(const std::string &name,
+                                const std::vector<std::string> &) override {
+        return xml_.find("<Material>\n\t\t<Name>" + name + "</Name>") != std::string::npos
+                   ? &material_
+                   : nullptr;
+    }
+
+private:
+    std::string xml_;
+    ox::Material material_{nullptr, nullptr};
+};
 
 }  // namespace
 
@@ -453,30 +472,47 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
         const std::string out = path("out_" + file);
         RunResult r = runImport(path(file) + " -o " + out + (lightmap ? " --lightmap-uv 64" : ""));
         ASSERT_EQ(r.status, 0) << r.output;
-        std::map<std::string, ox::Mtx4> placement = instancePlacements(
-            (fs::path(out) / (fs::path(file).stem().string() + ".xml")).string());
-        size_t triangles = 0;
-        ox::BBox box;
+        const std::string scenePath =
+            (fs::path(out) / (fs::path(file).stem().string() + ".xml")).string();
+        std::map<std::string, ox::Mtx4> placement = instancePlacements(scenePath);
+        SceneMaterials materials(readBytes(scenePath));
+        size_t triangles = 0, builtTriangles = 0;
+        ox::BBox box, builtBox;
         for (const auto &e : fs::directory_iterator(out)) {
             if (e.path().extension() != ".vtm") continue;
             vtm::TempMesh mesh;
             ASSERT_TRUE(vtm::readTempMesh(e.path().string(), mesh)) << e.path();
             ASSERT_EQ(placement.count(mesh.name), 1u) << mesh.name;
+            const ox::Mtx4 &m = placement[mesh.name];
             triangles += mesh.indices.size() / 3;
             EXPECT_EQ(mesh.uvSetNames.size(), lightmap ? 2u : libUvSets) << e.path();
             for (uint32_t i : mesh.indices) ASSERT_LT(i, mesh.vertexCount());
             for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
                 const float *p = &mesh.vertices[v * (mesh.colors ? 16 : 12)];
-                box.extend(placement[mesh.name].transformPoint(ox::Vec3(p[0], p[1], p[2])));
+                box.extend(m.transformPoint(ox::Vec3(p[0], p[1], p[2])));
             }
-            if (!lightmap) continue;
-            // The generated light-map set lies inside the unit square.
-            EXPECT_EQ(mesh.uvSetNames[1], "lightmap");
-            for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
-                float u = mesh.uvs[v * 4 + 2], w = mesh.uvs[v * 4 + 3];
-                EXPECT_TRUE(u > 0 && u < 1 && w > 0 && w < 1) << u << " " << w;
+            if (lightmap) {
+                // The generated light-map set lies inside the unit square.
+                EXPECT_EQ(mesh.uvSetNames[1], "lightmap");
+                for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
+                    float u = mesh.uvs[v * 4 + 2], w = mesh.uvs[v * 4 + 3];
+                    EXPECT_TRUE(u > 0 && u < 1 && w > 0 && w < 1) << u << " " << w;
+                }
             }
+            // The scene's own shape building takes the file as it stands.
+            auto reader = vtm::TempMeshReaderFactory::instance().open(e.path().string());
+            ASSERT_TRUE(reader);
+            std::unique_ptr<ox::Shape> shape;
+            std::string failure;
+            ASSERT_EQ(ox::buildTempShape(*reader, materials, ox::MeshBuildOptions(), shape, failure),
+                      ox::ShapeBuildStatus::kBuilt)
+                << failure;
+            builtTriangles += shape->triangles().size();
+            EXPECT_EQ(shape->vertices().uvSetNames(), mesh.uvSetNames);
+            builtBox.extend(ox::transformBox(shape->bounds(), m));
         }
+        EXPECT_EQ(builtTriangles, libTriangles) << file;
+        EXPECT_EQ(builtBox, libBox) << file;
         EXPECT_EQ(triangles, libTriangles) << file;
         EXPECT_EQ(box, libBox) << file;
     }
