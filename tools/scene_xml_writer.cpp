@@ -2,8 +2,7 @@
 
 #include <libxml/xmlwriter.h>
 
-#include <sstream>
-
+#include "config/value_text.h"
 #include "core/message.h"
 #include "platform/file_system.h"
 
@@ -11,8 +10,9 @@ namespace ox {
 
 namespace {
 
-// The element forms of the settings writer: numbers in default stream formatting, colours as
-// r g b a, matrices as four "r" rows of four "c", string lists as "element" entries.
+// The element forms of the settings writer: numbers as the shortest text that reads back the
+// same float, colours as r g b a, matrices as four "r" rows of four "c", string lists as
+// "element" entries.
 class SceneWriter {
 public:
     explicit SceneWriter(xmlTextWriterPtr w) : w_(w) {}
@@ -24,9 +24,9 @@ public:
         check(xmlTextWriterWriteElement(w_, bx(name), bx(value.c_str())));
     }
     void number(const char *name, double value) {
-        std::ostringstream s;
-        s << float(value);
-        text(name, s.str());
+        std::string s;
+        appendFloatText(float(value), s);
+        text(name, s);
     }
     void integer(const char *name, long long value) { text(name, std::to_string(value)); }
     void boolean(const char *name, bool value) { text(name, value ? "true" : "false"); }
