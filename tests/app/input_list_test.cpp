@@ -1,4 +1,6 @@
 // The -i, -pi and -ri list files expand through the configuration reader, in option order.
+#include "config/input_list.h"
+
 #include <gtest/gtest.h>
 #include <unistd.h>
 
@@ -6,7 +8,6 @@
 #include <fstream>
 
 #include "app/command_line.h"
-#include "config/input_list.h"
 
 namespace fs = std::filesystem;
 
@@ -35,16 +36,16 @@ TEST(InputLists, ExpandAfterDirectArgumentsInOptionOrder) {
     ASSERT_TRUE(ox::parseCommandLine({"thevorn", "-i", b, "direct.xml", "-i", a, "-pi", pc, "-ri",
                                       img, "-rm", "target", "i0.exr"},
                                      ox::loadInputList, o));
-    EXPECT_EQ(o.inputFiles, (std::vector<std::string>{"direct.xml", "scene2.xml", "scene1.xml",
-                                                      "mesh1.vtm"}));
+    EXPECT_EQ(o.inputFiles,
+              (std::vector<std::string>{"direct.xml", "scene2.xml", "scene1.xml", "mesh1.vtm"}));
     EXPECT_EQ(o.pointCloudInputs, (std::vector<std::string>{"p1.pc", "p2.pc"}));
     EXPECT_EQ(o.imageInputs, (std::vector<std::string>{"i0.exr", "i1.exr"}));
 
     // A list that cannot be read fails the command line with both lines.
     ox::CommandLineOptions bad;
     testing::internal::CaptureStdout();
-    EXPECT_FALSE(ox::parseCommandLine(
-        {"thevorn", "s.xml", "-i", (dir / "missing.xml").string()}, ox::loadInputList, bad));
+    EXPECT_FALSE(ox::parseCommandLine({"thevorn", "s.xml", "-i", (dir / "missing.xml").string()},
+                                      ox::loadInputList, bad));
     std::string out = testing::internal::GetCapturedStdout();
     EXPECT_NE(out.find("Unable to load input file list from file: "), std::string::npos);
     EXPECT_NE(out.find("Unable to build list of input files."), std::string::npos);
