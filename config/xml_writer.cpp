@@ -55,12 +55,41 @@ int sinkWrite(void *context, const char *buffer, int len) {
 
 int sinkClose(void *) { return 0; }
 
+/// True for valid UTF-8 without the control characters XML 1.0 cannot carry.
+bool isXmlText(std::string_view s) {
+    const auto *p = reinterpret_cast<const unsigned char *>(s.data());
+    const auto *end = p + s.size();
+    while (p < end) {
+        unsigned c = *p;
+        if (c < 0x80) {
+            if (c < 0x20 && c != '\t' && c != '\n' && c != '\r') return false;
+            ++p;
+            continue;
+        }
+        int n = c >= 0xF0 ? 3 : c >= 0xE0 ? 2 : c >= 0xC2 ? 1 : -1;
+        if (n < 0 || c > 0xF4 || end - p <= n) return false;
+        uint32_t cp = c & (0x3F >> n);
+        for (int i = 1; i <= n; ++i) {
+            if ((p[i] & 0xC0) != 0x80) return false;
+            cp = (cp << 6) | (p[i] & 0x3F);
+        }
+        static constexpr uint32_t kMin[] = {0, 0x80, 0x800, 0x10000};
+        if (cp < kMin[n] || cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF) || cp == 0xFFFE ||
+            cp == 0xFFFF)
+            return false;
+        p += n + 1;
+    }
+    return true;
+}
+
 /// Writes the element forms of the value types; stops at the first failing writer call.
 class XMLWriterVisitor final : public OXCTypeVisitorConst {
 public:
     explicit XMLWriterVisitor(xmlTextWriterPtr w) : w_(w) {}
 
     bool ok() const { return ok_; }
+    /// Why writing stopped, when the cause was a value (empty otherwise).
+    const std::string &problem() const { return problem_; }
     /// Writes `value` as an element named `name`.
     void write(const OXCTypeBase &value, std::string_view name) {
         if (!ok_) return;
@@ -126,7 +155,15 @@ public:
         floatElement("a", v.get().a);
         end();
     }
-    void visit(const OXCType<std::string> &v) override { element(name_.c_str(), v.get()); }
+    void visit(const OXCType<std::string> &v) override {
+        if (!isXmlText(v.get())) {
+            // The file could not be read back: refuse it rather than write it.
+            problem_ = "the value of " + name_ + " is not UTF-8 text that XML can hold";
+            ok_ = false;
+            return;
+        }
+        element(name_.c_str(), v.get());
+    }
     void visit(const OXCType<float> &v) override { floatElement(name_.c_str(), v.get()); }
     void visit(const OXCType<bool> &v) override {
         element(name_.c_str(), v.get() ? "true" : "false");
@@ -166,6 +203,7 @@ private:
     bool ok_ = true;
     std::string name_;
     std::string text_;
+    std::string problem_;
 };
 
 /// Writes the schema of the value types; stops at the first failing writer call.
@@ -319,7 +357,7 @@ private:
 /// Runs one writer over a sink: document start, indentation, the body, document end, flush.
 /// Reports one error message and returns false on the first failing call.
 bool writeDocument(Sink &sink, const char *encoding, const std::string &displayName,
-                   const std::function<bool(xmlTextWriterPtr)> &body) {
+                   const std::function<bool(xmlTextWriterPtr, std::string &)> &body) {
     xmldetail::XmlErrorCapture errors;
     xmlOutputBufferPtr out = xmlOutputBufferCreateIO(sinkWrite, sinkClose, &sink, nullptr);
     xmlTextWriterPtr w = out ? xmlNewTextWriter(out) : nullptr;
@@ -335,8 +373,12 @@ bool writeDocument(Sink &sink, const char *encoding, const std::string &displayN
     } else if (xmlTextWriterSetIndent(w, 1) < 0 || xmlTextWriterSetIndentString(w, X("\t")) < 0) {
         message(kMsgError, 1, "Error creating xml writer");
         ok = false;
-    } else if (!body(w)) {
-        message(kMsgError, 1, "Error writing xml file %s", displayName.c_str());
+    } else if (std::string why; !body(w, why)) {
+        if (why.empty())
+            message(kMsgError, 1, "Error writing xml file %s", displayName.c_str());
+        else
+            message(kMsgError, 1, "Error writing xml file %s: %s", displayName.c_str(),
+                    why.c_str());
         ok = false;
     } else if (xmlTextWriterEndDocument(w) < 0 || xmlTextWriterFlush(w) < 0) {
         message(kMsgError, 1, "Error ending xml document");
@@ -356,7 +398,7 @@ std::atomic<unsigned> gTempCounter{0};
 /// Writes a file through a temporary name in the target directory and renames it into place.
 /// On failure the temporary file is removed and errno holds the cause (0 if none).
 bool writeFileAtomically(const std::string &fileName, const char *encoding,
-                         const std::function<bool(xmlTextWriterPtr)> &body) {
+                         const std::function<bool(xmlTextWriterPtr, std::string &)> &body) {
     size_t slash = fileName.find_last_of('/');
     std::string dir = slash == std::string::npos ? std::string() : fileName.substr(0, slash + 1);
     std::string base = slash == std::string::npos ? fileName : fileName.substr(slash + 1);
@@ -403,13 +445,14 @@ bool writeFileAtomically(const std::string &fileName, const char *encoding,
     return ok;
 }
 
-bool writeSettingsBody(xmlTextWriterPtr w, const OXCTypeBase &root) {
+bool writeSettingsBody(xmlTextWriterPtr w, const OXCTypeBase &root, std::string &why) {
     XMLWriterVisitor v(w);
     v.write(root, root.name());
+    why = v.problem();
     return v.ok();
 }
 
-bool writeSchemaBody(xmlTextWriterPtr w, const OXCTypeBase &root) {
+bool writeSchemaBody(xmlTextWriterPtr w, const OXCTypeBase &root, std::string &) {
     if (xmlTextWriterStartElement(w, X("xsd:schema")) < 0 ||
         xmlTextWriterWriteAttribute(w, X("xmlns:xsd"), X("http://www.w3.org/2001/XMLSchema")) < 0)
         return false;
@@ -421,21 +464,24 @@ bool writeSchemaBody(xmlTextWriterPtr w, const OXCTypeBase &root) {
 }  // namespace
 
 bool writeSettings(const std::string &fileName, const OXCTypeBase &root, const char *encoding) {
-    return writeFileAtomically(fileName, encoding,
-                               [&](xmlTextWriterPtr w) { return writeSettingsBody(w, root); });
+    return writeFileAtomically(fileName, encoding, [&](xmlTextWriterPtr w, std::string &why) {
+        return writeSettingsBody(w, root, why);
+    });
 }
 
 bool writeSchema(const std::string &fileName, const OXCTypeBase &root) {
-    return writeFileAtomically(fileName, nullptr,
-                               [&](xmlTextWriterPtr w) { return writeSchemaBody(w, root); });
+    return writeFileAtomically(fileName, nullptr, [&](xmlTextWriterPtr w, std::string &why) {
+        return writeSchemaBody(w, root, why);
+    });
 }
 
 bool writeSettingsToString(std::string &out, const OXCTypeBase &root, const char *encoding) {
     out.clear();
     Sink sink;
     sink.text = &out;
-    return writeDocument(sink, encoding, "(memory)",
-                         [&](xmlTextWriterPtr w) { return writeSettingsBody(w, root); });
+    return writeDocument(sink, encoding, "(memory)", [&](xmlTextWriterPtr w, std::string &why) {
+        return writeSettingsBody(w, root, why);
+    });
 }
 
 }  // namespace ox

@@ -314,8 +314,22 @@ TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
     GetCapturedStdout();
     EXPECT_TRUE(fs::is_directory("target_is_dir"));
 
+    // Text that XML cannot carry is refused, not written into an unreadable file.
+    for (const char *text : {"a\x01z", "bad \xff utf8", "\xc0\x80", "\xed\xa0\x80"}) {
+        r.all.camera = text;
+        CaptureStdout();
+        EXPECT_FALSE(ox::writeSettings("keep.xml", r));
+        EXPECT_NE(GetCapturedStdout().find("the value of camera is not UTF-8 text"),
+                  std::string::npos);
+        EXPECT_EQ(readFile("keep.xml"), "precious");
+    }
+    r.all.camera =
+        "\xe6\x97\xa5\xe6\x9c\xac \xf0\x9f\x98\x80";  // beyond Latin-1: character references
     ASSERT_TRUE(ox::writeSettings("keep.xml", r));
     EXPECT_NE(readFile("keep.xml").find("<OXConfig>"), std::string::npos);
+    Root back;
+    ASSERT_TRUE(ox::loadSettings("keep.xml", back));
+    EXPECT_EQ(back.all.camera.get(), r.all.camera.get());
     for (const auto &e : fs::directory_iterator(".")) {  // no temporary files left behind
         EXPECT_EQ(e.path().filename().string().find(".tmp"), std::string::npos);
     }
