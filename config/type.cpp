@@ -250,11 +250,14 @@ int checkDocumentation(const OXCComplexType &complex) {
 OXCTypeVector::OXCTypeVector(OXCComplexType *owner, std::string name,
                              std::unique_ptr<OXCTypeBase> prototype, const char *description)
     : OXCTypeBase(OXCKind::Vector, std::move(name)), prototype_(std::move(prototype)) {
+    OX_CHECK(prototype_ != nullptr && owner != nullptr);
     owner->addMember(this, {}, description);
 }
 
 OXCTypeVector::OXCTypeVector(std::string name, std::unique_ptr<OXCTypeBase> prototype)
-    : OXCTypeBase(OXCKind::Vector, std::move(name)), prototype_(std::move(prototype)) {}
+    : OXCTypeBase(OXCKind::Vector, std::move(name)), prototype_(std::move(prototype)) {
+    OX_CHECK(prototype_ != nullptr);
+}
 
 bool OXCTypeVector::add(const OXCTypeBase &entry) {
     if (!accepts(entry)) {

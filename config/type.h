@@ -8,6 +8,7 @@
 #include <string_view>
 #include <vector>
 
+#include "core/check.h"
 #include "core/types.h"
 
 /// Typed, self-describing settings values: scalars, enumerations, settings objects (complex
@@ -299,7 +300,10 @@ public:
     /// The value as an integer.
     int32_t value() const { return value_; }
     /// Sets the value as an integer (never -1).
-    void setValue(int32_t v) { value_ = v; }
+    void setValue(int32_t v) {
+        OX_CHECK(v != -1);
+        value_ = v;
+    }
     /// The shared table of names.
     const OXCEnumTable &table() const { return *table_; }
     /// Sets the value from a name (case folded when the table asks); false keeps the value.
@@ -312,7 +316,9 @@ public:
 
 protected:
     OXCEnumBase(std::string name, const OXCEnumTable &table, int32_t value)
-        : OXCTypeBase(OXCKind::Enum, std::move(name)), table_(&table), value_(value) {}
+        : OXCTypeBase(OXCKind::Enum, std::move(name)), table_(&table), value_(value) {
+        OX_CHECK(value != -1);
+    }
 
 private:
     const OXCEnumTable *table_;
@@ -464,6 +470,7 @@ class OXCNested final : public OXCComplexTypeInstantiator<T> {
 public:
     /// Registers the nested object in `owner` under `key` with a description.
     OXCNested(OXCComplexType *owner, std::string_view key, const char *description) {
+        OX_CHECK(owner != nullptr);
         owner->addMember(this, key, description);
     }
 };
@@ -617,6 +624,7 @@ template <typename T>
 OXCType<T>::OXCType(OXCComplexType *owner, std::string name, T defaultValue,
                     const char *description)
     : OXCTypeBase(OXCKindOf<T>::kKind, std::move(name)), value_(std::move(defaultValue)) {
+    OX_CHECK(owner != nullptr);
     owner->addMember(this, {}, description);
 }
 
@@ -625,6 +633,7 @@ OXCEnum<E>::OXCEnum(OXCComplexType *owner, std::string name, E defaultValue,
                     const char *description)
     : OXCEnumBase(std::move(name), oxcEnumTable(static_cast<E *>(nullptr)),
                   static_cast<int32_t>(defaultValue)) {
+    OX_CHECK(owner != nullptr);
     owner->addMember(this, {}, description);
 }
 
