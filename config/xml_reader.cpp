@@ -376,14 +376,20 @@ xmlParserInputPtr checkedEntityLoader(const char *url, const char *id, xmlParser
     return gPreviousLoader ? gPreviousLoader(url, id, ctxt) : nullptr;
 }
 
-/// Installs the checked loader for the duration of one load.
+/// Installs the checked loader for the duration of one load. The loader is process-wide in
+/// the XML library, so loads on several threads take turns.
+std::mutex gLoaderMutex;
+
 class LoaderGuard {
 public:
-    LoaderGuard() {
+    LoaderGuard() : lock_(gLoaderMutex) {
         gPreviousLoader = xmlGetExternalEntityLoader();
         xmlSetExternalEntityLoader(checkedEntityLoader);
     }
     ~LoaderGuard() { xmlSetExternalEntityLoader(gPreviousLoader); }
+
+private:
+    std::lock_guard<std::mutex> lock_;
 };
 
 /// Feeds a parsed element tree to the value reader without recursion.

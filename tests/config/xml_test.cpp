@@ -5,14 +5,17 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
+#include <thread>
 
 #include "config/input_list.h"
 #include "config/type.h"
+#include "core/message.h"
 #include "tests/config/test_settings.h"
 
 using namespace cfgtest;
@@ -465,4 +468,26 @@ TEST_F(ConfigXml, InputListsAppendTheirEntries) {
     EXPECT_FALSE(ox::loadInputList("missing.xml", files));
     GetCapturedStdout();
     EXPECT_EQ(files.size(), 4u);
+}
+
+TEST_F(ConfigXml, LoadsOnSeveralThreadsAtOnce) {
+    writeFile("part.xml", "<inner><gamma>3.5</gamma></inner>");
+    writeFile("main.xml",
+              "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>7</count>"
+              "<xi:include href=\"part.xml\"/></All></OXConfig>");
+    std::atomic<int> good{0};
+    std::vector<std::thread> threads;
+    ox::setTypeEnabled(ox::kMsgInfo, false);
+    for (int t = 0; t < 4; ++t)
+        threads.emplace_back([&] {
+            for (int i = 0; i < 25; ++i) {
+                Root r;
+                if (ox::loadSettings("main.xml", r) && r.all.count.get() == 7 &&
+                    r.all.inner.gamma.get() == 3.5f)
+                    ++good;
+            }
+        });
+    for (auto &t : threads) t.join();
+    ox::setTypeEnabled(ox::kMsgInfo, true);
+    EXPECT_EQ(good.load(), 100);
 }
