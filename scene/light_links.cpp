@@ -34,7 +34,7 @@ void LightLinkTable::build(const std::vector<LightLinkEntry> &instances,
 
     for (uint32_t i = 0; i < instances_; ++i) {
         const LightLinkEntry &inst = instances[i];
-        if (inst.mode != LightLinkMode::kInclusive && inst.mode != LightLinkMode::kExclusive)
+        if (inst.mode != LinkMode::kInclusive && inst.mode != LinkMode::kExclusive)
             continue;
         for (const std::string &name : inst.links) {
             auto it = lightIndex.find(name);
@@ -43,15 +43,15 @@ void LightLinkTable::build(const std::vector<LightLinkEntry> &instances,
             else
                 set(i, it->second);
         }
-        if (inst.mode == LightLinkMode::kExclusive && lights_ > 0) invertRow(i);
+        if (inst.mode == LinkMode::kExclusive && lights_ > 0) invertRow(i);
     }
 
     for (uint32_t l = 0; l < lights_; ++l) {
         const LightLinkEntry &light = lights[l];
         switch (light.mode) {
-            case LightLinkMode::kInclusive:
-            case LightLinkMode::kExclusive: {
-                const bool exclusive = light.mode == LightLinkMode::kExclusive;
+            case LinkMode::kInclusive:
+            case LinkMode::kExclusive: {
+                const bool exclusive = light.mode == LinkMode::kExclusive;
                 if (exclusive)
                     for (uint32_t i = 0; i < instances_; ++i) flip(i, l);
                 for (const std::string &name : light.links) {
@@ -66,10 +66,10 @@ void LightLinkTable::build(const std::vector<LightLinkEntry> &instances,
                     for (uint32_t i = 0; i < instances_; ++i) flip(i, l);
                 break;
             }
-            case LightLinkMode::kNone:
+            case LinkMode::kNone:
             default:
                 for (uint32_t i = 0; i < instances_; ++i)
-                    if (instances[i].mode == LightLinkMode::kNone) set(i, l);
+                    if (instances[i].mode == LinkMode::kNone) set(i, l);
                 break;
         }
     }

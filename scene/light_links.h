@@ -6,13 +6,13 @@
 
 namespace ox {
 
-/// How an instance or a light restricts light linking ("INCLUSIVE" 0, "EXCLUSIVE" 1, "NONE" 2).
-enum class LightLinkMode : int32_t { kInclusive = 0, kExclusive = 1, kNone = 2 };
+/// How an instance or a light restricts light linking (the scene's LightLinkMode) ("INCLUSIVE" 0, "EXCLUSIVE" 1, "NONE" 2).
+enum class LinkMode : int32_t { kInclusive = 0, kExclusive = 1, kNone = 2 };
 
 /// The link settings of one instance (its light names) or one light (its instance names).
 struct LightLinkEntry {
     std::string name;
-    LightLinkMode mode = LightLinkMode::kNone;
+    LinkMode mode = LinkMode::kNone;
     std::vector<std::string> links;
 };
 

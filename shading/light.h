@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "core/types.h"
+#include "raytrace/ray.h"
 #include "shading/environment.h"
 
 namespace ox {
@@ -137,9 +138,6 @@ struct LightParameters {
 /// Light flag bits (the shading component bits a light feeds).
 constexpr uint32_t kLightDiffuse = 0x1, kLightSpecular = 0x2, kLightAmbient = 0x4,
                    kLightShadows = 0x40, kLightIndirect = 0x100;
-
-/// Number of ray types that index a light's intensity scales.
-constexpr int kRayTypeCount = 11;
 
 /// A light of the scene: name, flags, world box of its influence, intensity scale per ray type
 /// and photon emission. The illumination operations come with the light code.

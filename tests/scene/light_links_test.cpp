@@ -7,7 +7,7 @@
 namespace ox {
 namespace {
 
-using M = LightLinkMode;
+using M = LinkMode;
 
 TEST(LightLinks, EveryModeCombination) {
     // One instance and one light per pair of modes and list contents; the light reaches the
