@@ -1,0 +1,81 @@
+#include "scene/scene.h"
+
+#include <gtest/gtest.h>
+
+#include "scene/material_converter.h"
+#include "scene_test_util.h"
+
+namespace ox {
+namespace {
+
+std::unique_ptr<Shape> boxShape(const std::string &name, Vec3 lo, Vec3 hi) {
+    auto s = std::make_unique<Shape>(name);
+    s->setBounds(BBox(lo, hi));
+    return s;
+}
+
+TEST(Scene, FirstNameWinsPerKind) {
+    Scene scene;
+    std::string out = test::captureMessages([&] {
+        EXPECT_TRUE(scene.addShape(boxShape("s", {0, 0, 0}, {1, 1, 1})));
+        EXPECT_FALSE(scene.addShape(boxShape("s", {5, 5, 5}, {6, 6, 6})));
+        const Shape *s = scene.findShape("s");
+        EXPECT_TRUE(scene.addInstance(Instance::create("i", Mtx4(), s, nullptr, 1),
+                                      LinkMode::kNone, {}));
+        EXPECT_FALSE(scene.addInstance(Instance::create("i", Mtx4::translation({9, 9, 9}), s,
+                                                        nullptr, 1),
+                                       LinkMode::kNone, {}));
+        EXPECT_TRUE(scene.addLight(std::make_unique<SimpleAmbientLight>("l", Color(1, 1, 1, 1)),
+                                   LinkMode::kNone, {}));
+        EXPECT_FALSE(scene.addLight(std::make_unique<SimpleAmbientLight>("l", Color()),
+                                    LinkMode::kNone, {}));
+        EXPECT_TRUE(scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr,
+                                                                  Vec2(1, 1))));
+        EXPECT_FALSE(scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr,
+                                                                   Vec2(2, 2))));
+    });
+    EXPECT_NE(out.find("[WARNING]  Duplicate shape name s, keeping the first one"),
+              std::string::npos);
+    EXPECT_NE(out.find("Duplicate instance name i"), std::string::npos);
+    EXPECT_NE(out.find("Duplicate light name l"), std::string::npos);
+    EXPECT_NE(out.find("Duplicate camera name c"), std::string::npos);
+    EXPECT_EQ(scene.shapes().size(), 1u);
+    EXPECT_EQ(scene.findShape("s")->bounds().max, Vec3(1, 1, 1));
+    EXPECT_EQ(scene.instances().size(), 1u);
+    EXPECT_EQ(scene.lights().size(), 1u);
+    EXPECT_EQ(static_cast<const SimpleAmbientLight *>(scene.findLight("l"))->color(),
+              Color(1, 1, 1, 1));
+    EXPECT_EQ(scene.cameras().size(), 1u);
+    EXPECT_EQ(scene.instanceBounds(), BBox(Vec3(0, 0, 0), Vec3(1, 1, 1)));
+    EXPECT_TRUE(scene.instanceBounds(0x2).isEmpty());
+    scene.buildLightLinks();
+    EXPECT_TRUE(scene.lightReaches(0, 0));
+}
+
+TEST(Scene, ResolverMakesOneVariantPerUvLayout) {
+    MaterialTable table;
+    XMLMaterialCompact record;
+    record.name = "m";
+    record.channels[0].uvLayerOverride = "lightmap";
+    record.channels[0].fileTexture = "t.tga";
+    ZPXMaterialConverter converter(BBox{});
+    table.insert(converter.convert(record));
+    record.name = "plain";
+    record.channels[0].uvLayerOverride.clear();
+    table.insert(converter.convert(record));
+    SceneMaterialResolver resolver(table);
+    const Material *a = resolver.resolve("m", {"map1", "lightmap"});
+    const Material *b = resolver.resolve("m", {"uv", "lightmap"});
+    const Material *c = resolver.resolve("m", {"lightmap"});
+    ASSERT_TRUE(a && c);
+    EXPECT_EQ(a, b);  // the same layout shares one variant
+    EXPECT_NE(a, c);
+    EXPECT_EQ(a->name(), "m|uv:1,-1,-1,-1,-1,-1,-1");
+    EXPECT_EQ(a->photon()->name(), "m|uv:1,-1,-1,-1,-1,-1,-1_photon");
+    EXPECT_EQ(resolver.resolve("plain", {"x"}), table.find("plain"));
+    EXPECT_EQ(resolver.resolve("none", {}), nullptr);
+    EXPECT_EQ(table.size(), 4u);
+}
+
+}  // namespace
+}  // namespace ox
