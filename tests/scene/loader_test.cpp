@@ -1,0 +1,327 @@
+#include "scene/loader.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <cmath>
+#include <fstream>
+
+#include "scene_test_util.h"
+#include "shading/phong.h"
+
+namespace ox {
+namespace {
+
+using test::captureMessages;
+using test::MeshMaker;
+using test::TempDir;
+
+// A scene on disk: mesh files and one scene document.
+struct SceneFiles {
+    TempDir dir;
+    std::vector<std::string> inputs;
+
+    void mesh(const std::string &file, const vtm::TempMesh &m) {
+        std::string path = dir.file(file);
+        ASSERT_TRUE(vtm::writeTempMesh(path, m, 2));
+        inputs.push_back(path);
+    }
+    // A unit quad (two triangles) from (-1, -1, 0) to (1, 1, 0) with one group.
+    void quad(const std::string &file, const std::string &shape, const std::string &material,
+              std::vector<std::string> uvSets = {"map1"}) {
+        MeshMaker m(shape, uint32_t(uvSets.size()));
+        m.mesh.uvSetNames = uvSets;
+        m.vertex({-1, -1, 0});
+        m.vertex({1, -1, 0});
+        m.vertex({1, 1, 0});
+        m.vertex({-1, 1, 0});
+        m.group(material, {0, 1, 2, 0, 2, 3});
+        mesh(file, m.mesh);
+    }
+    void xml(const std::string &file, const std::string &body) {
+        std::string path = dir.file(file);
+        std::ofstream(path) << "<?xml version=\"1.0\"?>\n<OXScene>\n" << body << "</OXScene>\n";
+        inputs.push_back(path);
+    }
+};
+
+std::string material(const std::string &name, const std::string &extra = "") {
+    return "<Material><Name>" + name + "</Name>" + extra + "</Material>\n";
+}
+std::string instance(const std::string &name, const std::string &shape,
+                     const std::string &extra = "") {
+    return "<Instance><Name>" + name + "</Name><Shape>" + shape + "</Shape>" + extra +
+           "</Instance>\n";
+}
+std::string light(const std::string &name, const std::string &type,
+                  const std::string &extra = "") {
+    return "<LightSource><Name>" + name + "</Name><Type>" + type + "</Type>" + extra +
+           "</LightSource>\n";
+}
+
+SceneLoadSettings settings(float bias = 0.005f) {
+    SceneLoadSettings s;
+    s.bias = bias;
+    s.threadCount = 2;
+    return s;
+}
+
+struct LoadResult {
+    bool ok = false;
+    std::string error, out;
+};
+
+LoadResult load(const std::vector<std::string> &inputs, Scene &scene,
+                const SceneLoadSettings &s = settings()) {
+    LoadResult r;
+    ZPXLoader loader;
+    r.out = captureMessages([&] { r.ok = loader.load(inputs, s, scene, r.error); });
+    return r;
+}
+
+TEST(ZPXLoader, LoadsAWholeScene) {
+    SceneFiles f;
+    f.quad("a.vtm", "plane", "red");
+    f.quad("b.vtm", "wall", "blue");
+    f.xml("scene.xml",
+          material("red") + material("blue") + material("green") +
+              instance("floor", "plane") + instance("wall1", "wall",
+                                                    "<MaterialOverrides><element>green</element>"
+                                                    "<element>red</element></MaterialOverrides>") +
+              instance("wall2", "wall",
+                       "<MaterialOverrides><element>nope</element></MaterialOverrides>"
+                       "<RenderStats><CastShadows>false</CastShadows></RenderStats>") +
+              light("sun", "DIRECTIONAL") + light("sky", "ENVIRONMENT") +
+              light("lamp", "POINT",
+                    "<LightLinkMode>INCLUSIVE</LightLinkMode><LightLinkedInstances>"
+                    "<element>floor</element><element>ghost</element></LightLinkedInstances>"));
+    Scene scene;
+    SceneLoadSettings s = settings();
+    s.environment.globalAmbientColor = Color(0.5f, 0.5f, 0.5f, 1);
+    LoadResult r = load(f.inputs, scene, s);
+    ASSERT_TRUE(r.ok) << r.error << r.out;
+    const std::string &out = r.out;
+    EXPECT_NE(out.find("[PROGRESS] Loading Scene File"), std::string::npos);
+    EXPECT_NE(out.find("[BENCH]    ZPX Loading time: "), std::string::npos);
+    EXPECT_NE(out.find("[BENCH]    Scene bounding box time: "), std::string::npos);
+    EXPECT_NE(out.find("[PROGRESS] Progress Title: Creating Temp Shapes"), std::string::npos);
+    EXPECT_NE(out.find("[INFO]     Adding fake camera"), std::string::npos);
+    EXPECT_NE(out.find("[PROGRESS] Successfully loaded ZPX-File"), std::string::npos);
+    EXPECT_EQ(test::countOf(out, "Provided more than one material override for instance wall1, "
+                                 "using only the first for the entire shape"),
+              1u);
+    EXPECT_NE(out.find("Failed to find override material nope on instance wall2, using default"),
+              std::string::npos);
+    EXPECT_NE(out.find("Light linked instance ghost not present"), std::string::npos);
+    EXPECT_NE(out.find("[INFO]     Ray tracing bias: 0.005000"), std::string::npos);
+
+    ASSERT_EQ(scene.shapes().size(), 2u);
+    EXPECT_EQ(scene.shapes()[0]->name(), "plane");  // in the order of the inputs
+    ASSERT_EQ(scene.instances().size(), 3u);
+    const Instance &wall1 = *scene.instances()[1];
+    EXPECT_EQ(wall1.overrideMaterial()->name(), "green");
+    EXPECT_EQ(wall1.material(0)->name(), "green");
+    EXPECT_EQ(scene.instances()[2]->overrideMaterial(), nullptr);
+    EXPECT_EQ(scene.instances()[2]->material(0)->name(), "blue");
+    EXPECT_FALSE(scene.instances()[2]->hasFlag(0x2));
+    ASSERT_NE(scene.instances()[0]->vertexBakeSamplingOptions(), nullptr);
+    EXPECT_EQ(scene.materials().find("red")->photon()->name(), "red_photon");
+
+    // Lights: sun, sky (an environment light that casts shadows), lamp, globalAmbientLight.
+    ASSERT_EQ(scene.lights().size(), 4u);
+    EXPECT_EQ(scene.lights()[3]->name(), "globalAmbientLight");
+    EXPECT_EQ(scene.shadowedEnvironmentLights(), std::vector<uint32_t>{1});
+    EXPECT_TRUE(scene.lightReaches(0, 2));
+    EXPECT_FALSE(scene.lightReaches(1, 2));
+    EXPECT_TRUE(scene.lightReaches(1, 0));
+
+    // The default camera.
+    ASSERT_EQ(scene.cameras().size(), 1u);
+    const Camera &cam = *scene.cameras()[0];
+    EXPECT_EQ(cam.name(), "camera1");
+    EXPECT_EQ(cam.position(), Vec3(0, 2, 10));
+    EXPECT_FLOAT_EQ(cam.fovX(), 1.0471976f);
+    EXPECT_FLOAT_EQ(cam.fovY(), 1.0471976f);
+}
+
+TEST(ZPXLoader, CamerasByType) {
+    SceneFiles f;
+    f.xml("cams.xml",
+          "<Camera><Name>p</Name><Fov><x>0.5</x><y>0.25</y></Fov></Camera>"
+          "<Camera><Name>o</Name><Type>ORTHO</Type></Camera>"
+          "<Camera><Name>e</Name><Type>ENVIRONMENT</Type><EnvironmentType>CUBEMAP</EnvironmentType>"
+          "</Camera><Camera><Name>p</Name></Camera>");
+    Scene scene;
+    SceneLoadSettings s = settings();
+    LoadResult r = load(f.inputs, scene, s);
+    ASSERT_TRUE(r.ok) << r.error;
+    EXPECT_NE(r.out.find("[INFO]     Creating camera: o"), std::string::npos);
+    EXPECT_NE(r.out.find("Duplicate camera name p"), std::string::npos);
+    EXPECT_EQ(r.out.find("Adding fake camera"), std::string::npos);
+    ASSERT_EQ(scene.cameras().size(), 3u);
+    EXPECT_FLOAT_EQ(scene.findCamera("p")->fovY(), 0.25f);
+    EXPECT_TRUE(dynamic_cast<const OrthoCamera *>(scene.findCamera("o")));
+    auto *env = dynamic_cast<const EnvCamera *>(scene.findCamera("e"));
+    ASSERT_TRUE(env);
+    EXPECT_EQ(env->projection(), EnvCamera::kCubeMap);
+}
+
+TEST(ZPXLoader, FileKindsByExtension) {
+    SceneFiles f;
+    mkdir(f.dir.file("dir.xml").c_str(), 0755);
+    std::vector<std::string> inputs = {f.dir.file("upper.XML"), f.dir.file("noext"),
+                                       f.dir.file("dir.xml/noext"), f.dir.file("mesh.vtm.bak")};
+    Scene scene;
+    SceneLoadSettings s = settings();
+    s.jobKind = 1;  // a texture bake: the default camera comes without the message
+    LoadResult r = load(inputs, scene, s);
+    ASSERT_TRUE(r.ok) << r.error;
+    for (const auto &p : inputs)
+        EXPECT_NE(r.out.find("[WARNING]  Don't know what to do with file: " + p),
+                  std::string::npos)
+            << p;
+    EXPECT_EQ(r.out.find("Adding fake camera"), std::string::npos);
+    EXPECT_EQ(fileExtension("a/b.c/d"), "");
+    EXPECT_EQ(fileExtension("a/b.c/d.e"), "e");
+    EXPECT_EQ(fileExtension("d."), "");
+    EXPECT_EQ(fileExtension(".vtm"), "vtm");
+}
+
+TEST(ZPXLoader, AutomaticBias) {
+    SceneFiles f;
+    f.quad("a.vtm", "cube", "m");
+    // The quad spans -1..1 in x and y; scaling z by 1 after a translation of (0, 0, -1) and a
+    // second instance at z = +1 give the box (-1, -1, -1) .. (1, 1, 1).
+    f.xml("s.xml", material("m") +
+                       instance("low", "cube",
+                                "<ObjectToWorld><r><c>1</c></r><r><c>0</c><c>1</c></r><r><c>0</c>"
+                                "<c>0</c><c>1</c></r><r><c>0</c><c>0</c><c>-1</c><c>1</c></r>"
+                                "</ObjectToWorld>") +
+                       instance("high", "cube",
+                                "<ObjectToWorld><r><c>1</c></r><r><c>0</c><c>1</c></r><r><c>0</c>"
+                                "<c>0</c><c>1</c></r><r><c>0</c><c>0</c><c>1</c><c>1</c></r>"
+                                "</ObjectToWorld>"));
+    Scene scene;
+    LoadResult r = load(f.inputs, scene, settings(0.0f));
+    ASSERT_TRUE(r.ok) << r.error << r.out;
+    EXPECT_NEAR(scene.bias(), 3.4641e-5f, 1e-8f);
+    EXPECT_NE(r.out.find("Ray tracing bias: 0.000035"), std::string::npos);
+
+    // No instances: no box for the automatic bias.
+    Scene empty;
+    r = load({}, empty, settings(0.0f));
+    ASSERT_TRUE(r.ok);
+    EXPECT_EQ(empty.bias(), 0.005f);
+    EXPECT_NE(r.out.find("[WARNING]  The scene has no usable bounding box"), std::string::npos);
+    for (float bad : {-1.0f, NAN, INFINITY}) {
+        Scene other;
+        r = load({}, other, settings(bad));
+        ASSERT_TRUE(r.ok);
+        EXPECT_EQ(other.bias(), 0.005f);
+        EXPECT_NE(r.out.find("[WARNING]  Invalid ray tracing bias"), std::string::npos);
+    }
+    EXPECT_EQ(automaticBias(BBox(Vec3(0, 0, 0), Vec3(NAN, 1, 1))), 0.0f);
+}
+
+TEST(ZPXLoader, FailuresStopTheLoad) {
+    {
+        // A mesh file that cannot be pre-opened.
+        SceneFiles f;
+        test::writeBytes(f.dir.file("bad.vtm"), {'V', 'T', 'M', 'X', 0});
+        f.inputs.push_back(f.dir.file("bad.vtm"));
+        Scene scene;
+        LoadResult r = load(f.inputs, scene);
+        EXPECT_FALSE(r.ok);
+        EXPECT_EQ(r.error, "Failed to preopen file " + f.dir.file("bad.vtm"));
+        EXPECT_NE(r.out.find("[ERROR]    Failed to preopen file "), std::string::npos);
+    }
+    {
+        // An instance of a shape that no mesh file gives.
+        SceneFiles f;
+        f.xml("s.xml", instance("i", "ghost"));
+        Scene scene;
+        LoadResult r = load(f.inputs, scene);
+        EXPECT_FALSE(r.ok);
+        EXPECT_EQ(r.error, "Missing shapes");
+        EXPECT_NE(r.out.find("[WARNING]  Base shape ghost not found for instance i"),
+                  std::string::npos);
+        EXPECT_NE(r.out.find("[ERROR]    Instance refering to non existing shape ghost"),
+                  std::string::npos);
+    }
+    {
+        // A mesh whose material the scene does not define.
+        SceneFiles f;
+        f.quad("a.vtm", "s", "nope");
+        f.xml("s.xml", material("m"));
+        Scene scene;
+        LoadResult r = load(f.inputs, scene);
+        EXPECT_FALSE(r.ok);
+        EXPECT_EQ(r.error,
+                  "Error creating temp shapes: Material nope not defined when loading shape s");
+        EXPECT_NE(r.out.find("[ERROR]    Material nope not defined when loading shape s"),
+                  std::string::npos);
+    }
+    {
+        // A scene document with another root, and one that is not well-formed.
+        SceneFiles f;
+        f.inputs.push_back(f.dir.file("other.xml"));
+        std::ofstream(f.inputs.back()) << "<Scene><Instance/></Scene>";
+        Scene scene;
+        LoadResult r = load(f.inputs, scene);
+        EXPECT_FALSE(r.ok);
+        EXPECT_NE(r.error.find("instead of OXScene"), std::string::npos);
+        std::ofstream(f.inputs.back()) << "<OXScene><Instance>";
+        Scene scene2;
+        r = load(f.inputs, scene2);
+        EXPECT_FALSE(r.ok);
+        Scene scene3;
+        r = load({f.dir.file("missing.xml")}, scene3);
+        EXPECT_FALSE(r.ok);
+    }
+    {
+        // An image-based environment whose image is missing.
+        Scene scene;
+        SceneLoadSettings s = settings();
+        s.environment.rtEnvironment = 3;
+        s.environment.iblImageFile = "/no/such/probe.hdr";
+        LoadResult r = load({}, scene, s);
+        EXPECT_FALSE(r.ok);
+        EXPECT_EQ(r.error, "Unable to create environment");
+    }
+}
+
+TEST(ZPXLoader, ShapesEdgeCases) {
+    SceneFiles f;
+    f.quad("a.vtm", "s", "m", {"map1", "lightmap"});
+    f.quad("b.vtm", "s", "m");  // the same shape name again: the first wins
+    MeshMaker empty("nothing", 0);
+    empty.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(0, 0, 0));
+    f.mesh("e.vtm", empty.mesh);
+    for (int i = 0; i < 6; ++i)
+        f.quad("v" + std::to_string(i) + ".vtm", "v" + std::to_string(i), "uvm",
+               {"x", "lightmap"});
+    f.xml("s.xml", material("m") +
+                       material("uvm", "<Diffuse><UVLayerOverride>lightmap</UVLayerOverride>"
+                                       "<FileTexture>t.tga</FileTexture></Diffuse>") +
+                       material("m", "<Shininess>99</Shininess>") + instance("i", "s"));
+    Scene scene;
+    LoadResult r = load(f.inputs, scene);
+    ASSERT_TRUE(r.ok) << r.error << r.out;
+    EXPECT_NE(r.out.find("Duplicate shape name s"), std::string::npos);
+    EXPECT_NE(r.out.find("Empty mesh '" + f.dir.file("e.vtm") + "' added."), std::string::npos);
+    EXPECT_EQ(scene.findShape("s")->vertices().uvSetCount(), 2u);
+    EXPECT_EQ(scene.findShape("nothing"), nullptr);
+    // The second "m" record does not replace the first.
+    auto *phong = dynamic_cast<const PhongShader *>(&scene.materials().find("m")->surface());
+    ASSERT_TRUE(phong);
+    EXPECT_EQ(phong->parameters().shininess, 1.0f);
+    // Six shapes built in parallel share one variant of "uvm".
+    const Material *variant = scene.findShape("v0")->material(0);
+    EXPECT_EQ(variant->name(), "uvm|uv:1,-1,-1,-1,-1,-1,-1");
+    for (int i = 1; i < 6; ++i)
+        EXPECT_EQ(scene.findShape("v" + std::to_string(i))->material(0), variant);
+    EXPECT_EQ(scene.materials().size(), 3u);
+}
+
+}  // namespace
+}  // namespace ox
