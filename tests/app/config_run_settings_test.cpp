@@ -1,0 +1,266 @@
+// The run on the real configuration tree: what it reads, writes back and corrects.
+#include "app/config_run_settings.h"
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "app/command_line.h"
+#include "app/run.h"
+#include "config/settings_checks.h"
+#include "config/xml.h"
+#include "core/message.h"
+
+namespace fs = std::filesystem;
+using testing::internal::CaptureStdout;
+using testing::internal::GetCapturedStdout;
+
+namespace {
+
+class ConfigRun : public ::testing::Test {
+protected:
+    void SetUp() override {
+        old_ = fs::current_path();
+        dir_ = fs::temp_directory_path() /
+               ("ox_cfgrun_test_" + std::to_string(::getpid()) + "_" +
+                ::testing::UnitTest::GetInstance()->current_test_info()->name());
+        fs::remove_all(dir_);
+        fs::create_directories(dir_);
+        fs::current_path(dir_);
+        ox::resetMessageFilters();
+    }
+    void TearDown() override {
+        ox::resetMessageFilters();
+        fs::current_path(old_);
+        fs::remove_all(dir_);
+    }
+    static void write(const std::string &name, const std::string &text) {
+        std::ofstream(name, std::ios::binary) << text;
+    }
+    static std::string read(const fs::path &p) {
+        std::ifstream in(p, std::ios::binary);
+        std::stringstream s;
+        s << in.rdbuf();
+        return s.str();
+    }
+    fs::path old_, dir_;
+};
+
+/// Remembers what the run handed over and the tree behind it.
+struct Recorder : ox::RunDriverInterface {
+    int32_t run(int32_t a, ox::RunContext &c) override {
+        action = a;
+        format = c.format;
+        threads = c.renderThreads;
+        config = ox::configurationOf(c.settings);
+        if (config) {
+            fgFile = config->GISettings.fgFile();
+            fgUseLegacy = config->GISettings.fgUseLegacy();
+            renderThreads = config->FrameSettings.renderThreads();
+            tileSize = config->FrameSettings.tileSize();
+        }
+        return 0;
+    }
+    int32_t action = -1, format = -1;
+    int64_t threads = -1;
+    const ox::OXConfig *config = nullptr;
+    std::string fgFile;
+    bool fgUseLegacy = false;
+    uint32_t renderThreads = 0;
+    ox::Vec2i tileSize;
+};
+
+}  // namespace
+
+TEST_F(ConfigRun, TheRunReadsWritesBackAndCorrectsTheLoadedFile) {
+    write("cfg.xml", R"(<OXConfig><FrameSettings>
+  <renderType>VertexBake</renderType><imageFormat>PPM</imageFormat>
+  <autoThreads>false</autoThreads><renderThreads>3</renderThreads>
+  <tileSize><x>0</x><y>32</y></tileSize>
+  <outputVerbosity><debugFile>true</debugFile><verbosePrint>true</verbosePrint>
+  </outputVerbosity></FrameSettings>
+  <GISettings><fgFile>cache</fgFile><ptFile></ptFile></GISettings>
+  <AOSettings><aoFile>occ</aoFile></AOSettings></OXConfig>)");
+    auto driver = std::make_shared<Recorder>();
+    ox::RunEnvironment env = ox::defaultRunEnvironment();
+    env.drivers.set(ox::kActionVertexBake, driver);
+    CaptureStdout();
+    const int32_t status = ox::runThevorn({"thevorn", "s.xml", "-x", "cfg.xml", "-od", "out"}, env);
+    const std::string out = GetCapturedStdout();
+    EXPECT_EQ(status, 0) << out;
+    EXPECT_EQ(driver->action, ox::kActionVertexBake);  // from renderType
+    EXPECT_EQ(driver->format, ox::kFormatExr);         // PPM without a format option
+    EXPECT_EQ(driver->threads, 3);                     // autoThreads off
+    ASSERT_NE(driver->config, nullptr);
+    EXPECT_EQ(driver->renderThreads, 3u);
+    EXPECT_EQ(driver->fgFile, "out/GI/fgMaps/cache");
+    EXPECT_TRUE(driver->fgUseLegacy);
+    EXPECT_EQ(driver->tileSize, ox::Vec2i(32, 32));
+    EXPECT_NE(out.find("[WARNING]  FrameSettings tileSize is (0, 32), it must be positive; "
+                       "using the default (32, 32)\n"),
+              std::string::npos)
+        << out;
+    // The configuration's filters and debug file are in force from the output tree on.
+    EXPECT_TRUE(ox::isTypeEnabled(ox::kMsgVerbose));
+    const std::string debug = read("out/debug.out");
+    EXPECT_NE(debug.find("KESTRIN RENDERER DEBUG MESSAGES"), std::string::npos);
+
+    // An action option wins and is written back; -rt overrides the configured count.
+    driver->config = nullptr;
+    env.drivers.set(ox::kActionTextureBake, driver);
+    CaptureStdout();
+    EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-x", "cfg.xml", "-b", "-rt", "5", "-j"}, env),
+              0);
+    GetCapturedStdout();
+    EXPECT_EQ(driver->action, ox::kActionTextureBake);
+    EXPECT_EQ(driver->format, ox::kFormatJpeg);
+    EXPECT_EQ(driver->renderThreads, 5u);
+    ASSERT_NE(driver->config, nullptr);
+}
+
+TEST_F(ConfigRun, DefaultsWrittenByTheProgramValidateAndReadBackUnchanged) {
+    const std::string program = OX_BINARY_DIR "/app/thevorn";
+    ASSERT_EQ(std::system((program + " -c > c.txt && " + program + " -xs > xs.txt").c_str()), 0);
+    ASSERT_EQ(std::system("xmllint --noout --schema config.xsd config.xml > lint.txt 2>&1"), 0)
+        << read("lint.txt");
+    EXPECT_EQ(read("c.txt").find("[WARNING]"), std::string::npos);
+
+    ox::ConfigRunSettings settings;
+    CaptureStdout();
+    ASSERT_TRUE(settings.load("config.xml"));
+    EXPECT_EQ(GetCapturedStdout(), "");
+    std::string again;
+    ASSERT_TRUE(ox::writeSettingsToString(again, settings.config()));
+    EXPECT_EQ(again, read("config.xml"));
+    EXPECT_EQ(settings.config().RenderSettings.maxShadowRays(), 4294967295u);
+    EXPECT_EQ(settings.renderType(), 0);
+    EXPECT_EQ(settings.imageFormat(), 0);
+    EXPECT_EQ(ox::resolveFileFormat(ox::kFormatNone, settings.imageFormat()), ox::kFormatTga);
+    EXPECT_EQ(settings.renderThreads(), 2);
+    EXPECT_TRUE(settings.autoThreads());
+    const ox::OutputVerbosityFlags flags = settings.outputVerbosity();
+    EXPECT_TRUE(flags.errorPrint && flags.warningPrint && flags.progressPrint && flags.infoPrint);
+    EXPECT_FALSE(flags.benchmarkPrint || flags.verbosePrint || flags.debugPrint || flags.debugFile);
+}
+
+TEST_F(ConfigRun, NumbersThatWouldBreakARunAreReset) {
+    ox::ConfigRunSettings settings;
+    write("bad.xml", R"(<OXConfig>
+  <FrameSettings><resolution><x>-1</x><y>480</y></resolution>
+    <outputCorrection><gamma>0</gamma></outputCorrection></FrameSettings>
+  <AASettings><filterSize><x>1</x><y>0</y></filterSize></AASettings>
+  <RenderSettings><bias>-0.5</bias><motionSteps>0</motionSteps></RenderSettings>
+  <ADSSettings><gridDensity>0</gridDensity><gridMaxDepth>17</gridMaxDepth></ADSSettings>
+</OXConfig>)");
+    CaptureStdout();
+    ASSERT_TRUE(settings.load("bad.xml"));
+    const std::string out = GetCapturedStdout();
+    const ox::OXConfig &c = settings.config();
+    EXPECT_EQ(c.FrameSettings.resolution(), ox::Vec2i(640, 480));
+    EXPECT_EQ(c.FrameSettings.outputCorrection.gamma(), 1.0f);
+    EXPECT_EQ(c.AASettings.filterSize(), ox::Vec2(1, 1));
+    EXPECT_EQ(c.RenderSettings.bias(), 0.005f);
+    EXPECT_EQ(c.RenderSettings.motionSteps(), 1u);
+    EXPECT_EQ(c.ADSSettings.gridDensity(), 1.0f);
+    EXPECT_EQ(c.ADSSettings.gridMaxDepth(), 4u);
+    for (const char *line :
+         {"[WARNING]  FrameSettings resolution is (-1, 480), it must be positive; using the "
+          "default (640, 480)\n",
+          "[WARNING]  RenderSettings bias is -0.5, it must be zero or positive; using the "
+          "default 0.005\n",
+          "[WARNING]  RenderSettings motionSteps is 0, it must be at least 1; using the "
+          "default 1\n",
+          "[WARNING]  ADSSettings gridMaxDepth is 17, it must be at most 16; using the "
+          "default 4\n",
+          "[WARNING]  ADSSettings gridDensity is 0, it must be positive; using the default 1\n"})
+        EXPECT_NE(out.find(line), std::string::npos) << line << out;
+
+    // Values at the edge of the rules stay.
+    ox::OXConfig edge;
+    edge.RenderSettings.bias = 0.0f;
+    edge.ADSSettings.gridMaxDepth = 16u;
+    edge.FrameSettings.tileSize = ox::Vec2i(1, 1);
+    EXPECT_EQ(ox::checkLoadedSettings(edge), 0);
+}
+
+TEST_F(ConfigRun, RenderRegionIsClippedToTheResolution) {
+    ox::OXConfig c;
+    ox::FrameSettingsBase &f = c.FrameSettings;
+    EXPECT_EQ(ox::renderRegion(f), ox::Region(0, 0, 640, 480));
+    f.regionRender = true;  // the default region is the whole default frame
+    EXPECT_EQ(ox::renderRegion(f), ox::Region(0, 0, 640, 480));
+    f.regionLowerLeft = ox::Vec2i(-20, 100);
+    f.regionTopRight = ox::Vec2i(300, 900);
+    EXPECT_EQ(ox::renderRegion(f), ox::Region(0, 100, 300, 480));
+    f.regionLowerLeft = ox::Vec2i(700, 0);  // right of the frame
+    EXPECT_TRUE(ox::renderRegion(f).isEmpty());
+    f.regionLowerLeft = ox::Vec2i(10, 10);
+    f.regionTopRight = ox::Vec2i(10, 400);  // no width
+    EXPECT_TRUE(ox::renderRegion(f).isEmpty());
+    f.regionRender = false;
+    EXPECT_EQ(ox::renderRegion(f), ox::Region(0, 0, 640, 480));
+}
+
+TEST_F(ConfigRun, InputCheckValuesAndCacheFiles) {
+    ox::ConfigRunSettings settings;
+    write("in.xml", R"(<OXConfig>
+  <TextureBakeSettings><resolutionScale>0.5</resolutionScale>
+    <targets><element><textureName>wall</textureName>
+      <hasResolutionOverride>true</hasResolutionOverride>
+      <resolutionOverride><x>512</x><y>1</y></resolutionOverride></element></targets>
+    <RenderComponents><lua>true</lua><LUASettings><scriptFile>bake.lua</scriptFile>
+    </LUASettings></RenderComponents></TextureBakeSettings>
+  <SurfaceTransferSettings><targets><element><textureName>hull</textureName></element>
+  </targets></SurfaceTransferSettings>
+  <VertexBakeSettings><VertexBakeComponents><lightPass><element/><element/></lightPass>
+  </VertexBakeComponents></VertexBakeSettings>
+  <EnvironmentSettings><giEnvironment>IBL</giEnvironment><iblImageFile>sky.hdr</iblImageFile>
+  </EnvironmentSettings>
+  <GISettings><enableGI>true</enableGI><secondaryIntegrator>GlobalPhotonMap</secondaryIntegrator>
+    <fgUseCache>RadianceSH</fgUseCache><fgUseFile>Reuse</fgUseFile>
+    <globalPhotonMapUseFile>ReuseAndAppend</globalPhotonMapUseFile></GISettings>
+</OXConfig>)");
+    CaptureStdout();
+    ASSERT_TRUE(settings.load("in.xml"));
+    EXPECT_EQ(GetCapturedStdout(), "");
+    const ox::InputCheckSettings s = settings.inputCheckSettings();
+    EXPECT_EQ(s.vertexBakeLightPasses, 2);
+    ASSERT_TRUE(s.firstTextureBakeTarget.has_value());
+    EXPECT_EQ(s.firstTextureBakeTarget->name, "wall");
+    EXPECT_EQ(s.firstTextureBakeTarget->width, 256);
+    EXPECT_EQ(s.firstTextureBakeTarget->height, 0);  // 1 x 0.5 truncates to nothing
+    ASSERT_TRUE(s.firstSurfaceTransferTarget.has_value());
+    EXPECT_EQ(s.firstSurfaceTransferTarget->name, "hull");
+    EXPECT_EQ(s.firstSurfaceTransferTarget->width, 640);  // the frame resolution
+    EXPECT_TRUE(s.imageBasedEnvironment);
+    EXPECT_EQ(s.environmentImageFile, "sky.hdr");
+    EXPECT_TRUE(s.enableGI);
+    EXPECT_EQ(s.primaryIntegrator, ox::kIntegratorFinalGather);
+    EXPECT_EQ(s.secondaryIntegrator, ox::kIntegratorGlobalPhotonMap);
+    EXPECT_EQ(s.finalGatherCacheKind, 2);
+    EXPECT_EQ(s.finalGatherCacheMode, 2);
+    EXPECT_EQ(s.globalPhotonMapMode, 3);
+    EXPECT_EQ(s.pathTracerCacheMode, 0);
+    EXPECT_TRUE(s.textureBakeUsesLua);
+    EXPECT_EQ(s.textureBakeLuaFile, "bake.lua");
+    EXPECT_FALSE(s.vertexBakeUsesLua || s.pointCloudBakeUsesLua);
+
+    const std::pair<ox::CacheFile, std::string> keys[] = {
+        {ox::CacheFile::kFinalGather, "fgFile"},
+        {ox::CacheFile::kPathTracer, "ptFile"},
+        {ox::CacheFile::kGlobalPhotonMap, "globalPhotonMapFile"},
+        {ox::CacheFile::kCausticsPhotonMap, "causticsPhotonMapFile"},
+        {ox::CacheFile::kDynamicPhotonMap, "dynamicPhotonMapFile"},
+        {ox::CacheFile::kOcclusionMap, "aoFile"}};
+    for (const auto &[which, key] : keys) {
+        settings.setCacheFile(which, key + ".bin");
+        EXPECT_EQ(settings.cacheFile(which), key + ".bin");
+    }
+    std::string xml;
+    ASSERT_TRUE(ox::writeSettingsToString(xml, settings.config()));
+    for (const auto &[which, key] : keys)
+        EXPECT_NE(xml.find("<" + key + ">" + key + ".bin</" + key + ">"), std::string::npos) << key;
+}
