@@ -87,9 +87,7 @@ void ConfigRunSettings::setRenderType(int32_t value) {
     config_.FrameSettings.renderType.setValue(value);
 }
 
-int32_t ConfigRunSettings::imageFormat() const {
-    return config_.FrameSettings.imageFormat.value();
-}
+int32_t ConfigRunSettings::imageFormat() const { return config_.FrameSettings.imageFormat.value(); }
 
 bool ConfigRunSettings::autoThreads() const { return config_.FrameSettings.autoThreads(); }
 
@@ -128,15 +126,15 @@ InputCheckSettings ConfigRunSettings::inputCheckSettings() const {
     s.vertexBakeLightPasses = int32_t(vertex.VertexBakeComponents.lightPass.size());
     if (bake.targets.size() > 0) {
         const BakeTextureTargetBase &t = bake.targets[0];
-        s.firstTextureBakeTarget = targetSize(t.textureName(), t.hasResolutionOverride(),
-                                              t.resolutionOverride(), bake.resolutionScale(),
-                                              frame.resolution());
+        s.firstTextureBakeTarget =
+            targetSize(t.textureName(), t.hasResolutionOverride(), t.resolutionOverride(),
+                       bake.resolutionScale(), frame.resolution());
     }
     if (transfer.targets.size() > 0) {
         const SurfaceTransferTextureBase &t = transfer.targets[0];
-        s.firstSurfaceTransferTarget = targetSize(t.textureName(), t.hasResolutionOverride(),
-                                                  t.resolutionOverride(), bake.resolutionScale(),
-                                                  frame.resolution());
+        s.firstSurfaceTransferTarget =
+            targetSize(t.textureName(), t.hasResolutionOverride(), t.resolutionOverride(),
+                       bake.resolutionScale(), frame.resolution());
     }
     s.imageBasedEnvironment =
         env.rtEnvironment() == EnvironmentType::IBL || env.giEnvironment() == EnvironmentType::IBL;

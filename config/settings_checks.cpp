@@ -28,8 +28,8 @@ bool resetVec2(OXCType<Vec2> &value, const OXCType<Vec2> &fallback, const char *
 }
 
 /// `ok` tells whether the current value is usable.
-bool resetFloat(OXCType<float> &value, const OXCType<float> &fallback, const char *type,
-                bool ok, const char *rule) {
+bool resetFloat(OXCType<float> &value, const OXCType<float> &fallback, const char *type, bool ok,
+                const char *rule) {
     if (ok) return false;
     message(kMsgWarning, 6, "%s %s is %g, it must be %s; using the default %g", type,
             value.name().c_str(), double(value.get()), rule, double(fallback.get()));
@@ -66,15 +66,15 @@ int checkLoadedSettings(OXConfigBase &config) {
                         "outputCorrection", gamma > 0.0f && gamma < 3.0e38f, "positive");
     reset += resetVec2(config.AASettings.filterSize, kDefaults.AASettings.filterSize, "AASettings");
     const float bias = render.bias();
-    reset += resetFloat(render.bias, render0.bias, "RenderSettings",
-                        bias >= 0.0f && bias < 3.0e38f, "zero or positive");
+    reset += resetFloat(render.bias, render0.bias, "RenderSettings", bias >= 0.0f && bias < 3.0e38f,
+                        "zero or positive");
     reset += resetUInt(render.motionSteps, render0.motionSteps, "RenderSettings",
                        render.motionSteps() > 0, "at least 1");
     const float density = ads.gridDensity();
     reset += resetFloat(ads.gridDensity, ads0.gridDensity, "ADSSettings",
                         density > 0.0f && density < 3.0e38f, "positive");
-    reset += resetUInt(ads.gridMaxDepth, ads0.gridMaxDepth, "ADSSettings",
-                       ads.gridMaxDepth() <= 16, "at most 16");
+    reset += resetUInt(ads.gridMaxDepth, ads0.gridMaxDepth, "ADSSettings", ads.gridMaxDepth() <= 16,
+                       "at most 16");
     return reset;
 }
 

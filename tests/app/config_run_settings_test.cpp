@@ -10,6 +10,7 @@
 
 #include "app/command_line.h"
 #include "app/run.h"
+#include "app/settings_adapters.h"
 #include "config/settings_checks.h"
 #include "config/xml.h"
 #include "core/message.h"
@@ -263,4 +264,46 @@ TEST_F(ConfigRun, InputCheckValuesAndCacheFiles) {
     ASSERT_TRUE(ox::writeSettingsToString(xml, settings.config()));
     for (const auto &[which, key] : keys)
         EXPECT_NE(xml.find("<" + key + ">" + key + ".bin</" + key + ">"), std::string::npos) << key;
+}
+
+TEST_F(ConfigRun, SceneAndTracerRecordsFollowTheSettings) {
+    ox::OXConfig config;
+    // The defaults of the records and of the settings agree.
+    const ox::SceneLoadSettings d = ox::sceneLoadSettings(config, 4);
+    const ox::SceneLoadSettings plain;
+    EXPECT_EQ(d.mesh.mergeThreshold, plain.mesh.mergeThreshold);
+    EXPECT_EQ(d.bias, plain.bias);
+    EXPECT_EQ(d.threadCount, 4);
+    EXPECT_EQ(d.environment.rtEnvironment, plain.environment.rtEnvironment);
+    EXPECT_EQ(d.environment.iblImageFile, plain.environment.iblImageFile);
+    EXPECT_EQ(d.environment.iblGIEnvBlur, plain.environment.iblGIEnvBlur);
+
+    write("s.xml", R"(<OXConfig><FrameSettings><renderType>PointCloudBake</renderType>
+  </FrameSettings><RenderSettings><vertexMergeThreshold>0.25</vertexMergeThreshold>
+  <tsOddUVFlipping>false</tsOddUVFlipping><tsVertexNormalization>false</tsVertexNormalization>
+  <bias>0</bias><motionBlur>3D</motionBlur><motionSteps>4</motionSteps>
+  <shutterOpen>0.25</shutterOpen></RenderSettings>
+  <EnvironmentSettings><rtEnvironment>SkyLight</rtEnvironment>
+  <skyLightColor><r>0.5</r><g>0.25</g><b>1</b><a>1</a></skyLightColor>
+  <iblTurnDome>90</iblTurnDome><iblEmitPhotons>true</iblEmitPhotons></EnvironmentSettings>
+</OXConfig>)");
+    CaptureStdout();
+    ASSERT_TRUE(ox::loadSettings("s.xml", config));
+    EXPECT_EQ(GetCapturedStdout(), "");
+    const ox::SceneLoadSettings s = ox::sceneLoadSettings(config, 0);
+    EXPECT_EQ(s.threadCount, 1);
+    EXPECT_EQ(s.jobKind, 5);
+    EXPECT_EQ(s.mesh.mergeThreshold, 0.25f);
+    EXPECT_FALSE(s.mesh.tangentSpace.oddUVFlipping);
+    EXPECT_TRUE(s.mesh.tangentSpace.orthogonalize);
+    EXPECT_FALSE(s.mesh.tangentSpace.normalize);
+    EXPECT_EQ(s.bias, 0.0f);  // the loader picks a bias from the scene
+    EXPECT_EQ(s.environment.rtEnvironment, 2);
+    EXPECT_EQ(s.environment.skyLightColor, ox::Color(0.5f, 0.25f, 1.0f, 1.0f));
+    EXPECT_EQ(s.environment.iblTurnDome, 90.0f);
+    EXPECT_TRUE(s.environment.iblEmitPhotons);
+    const ox::MotionBlurHandler motion = ox::motionBlurHandler(config.RenderSettings);
+    EXPECT_TRUE(motion.threeD());
+    EXPECT_EQ(motion.steps(), 4u);
+    EXPECT_EQ(motion.shutterOpen(), 0.25f);
 }

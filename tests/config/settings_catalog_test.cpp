@@ -115,10 +115,11 @@ TEST_F(Catalog, WrittenDefaultsReadBackToTheSameFileWithoutAWord) {
 
     // A clone is a deep, equal copy of every class of the tree.
     ox::OXConfig changed;
-    load("<OXConfig><TextureBakeSettings><targets><element><textureName>wall</textureName>"
-         "<targetSurfaces><element><target>wallShape</target></element></targetSurfaces>"
-         "</element></targets></TextureBakeSettings></OXConfig>",
-         changed);
+    load(
+        "<OXConfig><TextureBakeSettings><targets><element><textureName>wall</textureName>"
+        "<targetSurfaces><element><target>wallShape</target></element></targetSurfaces>"
+        "</element></targets></TextureBakeSettings></OXConfig>",
+        changed);
     const auto copy = changed.clone();
     EXPECT_EQ(written(*copy), written(changed));
     EXPECT_NE(written(*copy), text);
@@ -176,12 +177,12 @@ TEST_F(Catalog, OneKeyInEachObjectChangesExactlyThoseKeys) {
 
 TEST_F(Catalog, BadNamesAndNumbersWarnAndKeepTheDefaults) {
     ox::OXConfig config;
-    const std::string printed =
-        load("<OXConfig><AASettings><samplingMode>Progressive</samplingMode>"
-             "<minSampleRate>lots</minSampleRate></AASettings>"
-             "<RenderSettings><motionBlur>2d</motionBlur></RenderSettings>"
-             "<FrameSettngs/></OXConfig>",
-             config);
+    const std::string printed = load(
+        "<OXConfig><AASettings><samplingMode>Progressive</samplingMode>"
+        "<minSampleRate>lots</minSampleRate></AASettings>"
+        "<RenderSettings><motionBlur>2d</motionBlur></RenderSettings>"
+        "<FrameSettngs/></OXConfig>",
+        config);
     EXPECT_NE(printed.find("Warning, could not set value Progressive for enum samplingMode"),
               std::string::npos);
     EXPECT_NE(printed.find("Warning, could not set value 2d for enum motionBlur"),
@@ -286,14 +287,27 @@ TEST_F(Catalog, SchemaValidatesTheDefaultFileAndListsTheUndocumentedKeys) {
                             " is undocumented");
     };
     add("ADSSettings", {"memLimit"});
-    add("GISettings",
-        {"frame", "causticsPhotonMapAccuracy", "causticsPhotonMapUseFile",
-         "causticsPhotonMapVisualize", "globalPhotonMapVisualize",
-         "dynamicPhotonMapPreviewLightDirection", "dynamicPhotonMapTotalPhotons",
-         "dynamicPhotonMapAccuracy", "dynamicPhotonMapPhotons", "dynamicPhotonMapRadius",
-         "dynamicPhotonMapUseFile", "dynamicPhotonMapFile", "dynamicPhotonMapMaxDepth",
-         "dynamicPhotonMapMinDepth", "dynamicPhotonMapSHBands", "dynamicPhotonMapSHGatherCells",
-         "dynamicPhotonMapGridCells", "fgPreview", "fgVisualize", "fgMaxMovement", "mcDepth"});
+    add("GISettings", {"frame",
+                       "causticsPhotonMapAccuracy",
+                       "causticsPhotonMapUseFile",
+                       "causticsPhotonMapVisualize",
+                       "globalPhotonMapVisualize",
+                       "dynamicPhotonMapPreviewLightDirection",
+                       "dynamicPhotonMapTotalPhotons",
+                       "dynamicPhotonMapAccuracy",
+                       "dynamicPhotonMapPhotons",
+                       "dynamicPhotonMapRadius",
+                       "dynamicPhotonMapUseFile",
+                       "dynamicPhotonMapFile",
+                       "dynamicPhotonMapMaxDepth",
+                       "dynamicPhotonMapMinDepth",
+                       "dynamicPhotonMapSHBands",
+                       "dynamicPhotonMapSHGatherCells",
+                       "dynamicPhotonMapGridCells",
+                       "fgPreview",
+                       "fgVisualize",
+                       "fgMaxMovement",
+                       "mcDepth"});
     add("RNMSettings", {"cosLobeExponent", "cosLobeExponent"});  // texture and vertex bakes
     add("RenderComponents", {"FullAndIndirectIlluminationSettings", "LightPassSettings"});
     add("UVPackSettings", {"maxTextures"});
@@ -307,7 +321,7 @@ TEST_F(Catalog, SchemaValidatesTheDefaultFileAndListsTheUndocumentedKeys) {
     EXPECT_NE(schema.find("<xsd:documentation xml:lang=\"en\">Resolution for the rendering"),
               std::string::npos);
     EXPECT_NE(schema.find("<xsd:enumeration value=\"EXRMultiLayer\"/>"), std::string::npos);
-    const std::string command = "xmllint --noout --schema '" + xsd.string() + "' '" +
-                                xml.string() + "' > '" + (dir_ / "lint.txt").string() + "' 2>&1";
+    const std::string command = "xmllint --noout --schema '" + xsd.string() + "' '" + xml.string() +
+                                "' > '" + (dir_ / "lint.txt").string() + "' 2>&1";
     EXPECT_EQ(std::system(command.c_str()), 0) << readFile(dir_ / "lint.txt");
 }
