@@ -340,14 +340,21 @@ bool CompleteGrid::query(const Grid &grid, const PrimitiveStore &store, const Ra
             case kItemInstance: {
                 const IntersectInstanceGrid &ig = store.instances[s.inst];
                 const IntersectTriangle &t = ig.store->triangles[s.prim];
-                hit->id = t.id, hit->instance = ig.instance, hit->flags = ig.flags;
+                hit->id = s.fromPacket ? s.id : t.id;
+                hit->instance = ig.instance, hit->flags = ig.flags;
                 hit->primitive = &t;
                 break;
             }
             default: {
-                const IntersectTriangle &t = store.triangles[s.prim];
-                hit->id = t.id, hit->instance = t.instance, hit->flags = t.flags;
-                hit->primitive = &t;
+                // Packet hits carry their identifiers: the triangle record is not read.
+                const IntersectTriangle *t = &store.triangles[s.prim];
+                if (s.fromPacket) {
+                    hit->id = s.id, hit->instance = s.instance;
+                    hit->flags = s.flags;
+                } else {
+                    hit->id = t->id, hit->instance = t->instance, hit->flags = t->flags;
+                }
+                hit->primitive = t;
                 break;
             }
         }

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <string>
 
 #include "core/message.h"
@@ -153,7 +154,7 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     mode_ = params.sse ? 3 : 2;
     cellBegin_.clear();
     items_.clear();
-    packets_.clear();
+    blob_.clear();
     children_.clear();
     stats_ = GridStats();
     nx_ = ny_ = nz_ = 0;
@@ -195,10 +196,10 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
 
 int64_t Grid::cellCoord(float v, int axis) const {
     float n = float(axis == 0 ? nx_ : axis == 1 ? ny_ : nz_);
-    float f = std::floor((v - box_.min[axis]) * invCellSize_[axis]);
+    float f = (v - box_.min[axis]) * invCellSize_[axis];
     // Clamp in floating point first: NaN and huge values never reach the integer conversion.
-    f = std::fmin(std::fmax(f, 0.0f), n - 1.0f);
-    return int64_t(f);
+    f = f >= 0.0f ? (f < n - 1.0f ? f : n - 1.0f) : 0.0f;
+    return int64_t(f);  // truncation is floor for the non-negative values left
 }
 
 BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
@@ -291,7 +292,7 @@ void Grid::finalize() {
     if (refinedChild_.size() != ncells) refinedChild_.assign(ncells, 0xFFFFFFFFu);
     cellBegin_.assign(ncells + 1, 0);
     items_.clear();
-    packets_.clear();
+    blob_.clear();
     stats_ = GridStats();
     stats_.voxels = ncells;
     std::vector<uint32_t> tris, others;
@@ -312,22 +313,9 @@ void Grid::finalize() {
                 else
                     others.push_back(code);
             }
-            const float nan = std::numeric_limits<float>::quiet_NaN();
-            for (size_t i = 0; i < tris.size(); i += 4) {
-                IntersectSSETriangle pk;
-                for (int lane = 0; lane < 4; ++lane) {
-                    bool used = i + lane < tris.size();
-                    const IntersectTriangle *t = used ? &store_->triangles[tris[i + lane]] : nullptr;
-                    for (int a = 0; a < 3; ++a) {
-                        pk.p0[a][lane] = used ? t->p0[a] : nan;
-                        pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
-                        pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
-                    }
-                    pk.flags[lane] = used ? t->flags : 0u;
-                    pk.prim[lane] = used ? tris[i + lane] : 0xFFFFFFFFu;
-                }
-                items_.push_back(itemCode(kItemPacket, uint32_t(packets_.size())));
-                packets_.push_back(pk);
+            if (!tris.empty()) {
+                int64_t z = int64_t(c / size_t(nx_ * ny_)), rem = int64_t(c % size_t(nx_ * ny_));
+                packCell(tris, cellBox(rem % nx_, rem / nx_, z));
             }
             items_.insert(items_.end(), others.begin(), others.end());
         }
@@ -336,11 +324,102 @@ void Grid::finalize() {
         stats_.maxElements = std::max(stats_.maxElements, elements);
     }
     cellBegin_[ncells] = uint32_t(items_.size());
+    occupied_.assign((ncells + 63) / 64, 0);
+    for (size_t c = 0; c < ncells; ++c)
+        if (cellBegin_[c] != cellBegin_[c + 1]) occupied_[c >> 6] |= uint64_t(1) << (c & 63);
     items_.shrink_to_fit();
-    packets_.shrink_to_fit();
+    blob_.shrink_to_fit();
     std::vector<uint32_t>().swap(buildBegin_);
     std::vector<uint32_t>().swap(buildItems_);
     std::vector<uint32_t>().swap(refinedChild_);
+}
+
+namespace {
+
+// Interleaves the low ten bits of x, y and z.
+uint32_t morton3(uint32_t x, uint32_t y, uint32_t z) {
+    auto spread = [](uint32_t v) {
+        v &= 0x3FF;
+        v = (v | (v << 16)) & 0x030000FF;
+        v = (v | (v << 8)) & 0x0300F00F;
+        v = (v | (v << 4)) & 0x030C30C3;
+        v = (v | (v << 2)) & 0x09249249;
+        return v;
+    };
+    return spread(x) | (spread(y) << 1) | (spread(z) << 2);
+}
+
+}  // namespace
+
+void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
+    // Neighbouring triangles share packets (Morton order of their centres), so that the
+    // packet boxes are small.
+    std::vector<std::pair<uint32_t, uint32_t>> keyed;
+    keyed.reserve(tris.size());
+    Vec3 ext = cell.extent();
+    for (uint32_t t : tris) {
+        const IntersectTriangle &tri = store_->triangles[t];
+        Vec3 c = tri.p0 + (tri.e1 + tri.e2) * (1.0f / 3.0f);
+        uint32_t q[3];
+        for (int a = 0; a < 3; ++a) {
+            float f = ext[a] > 0.0f ? (c[a] - cell.min[a]) / ext[a] * 1023.0f : 0.0f;
+            f = f >= 0.0f ? (f <= 1023.0f ? f : 1023.0f) : 0.0f;
+            q[a] = uint32_t(f);
+        }
+        keyed.emplace_back(morton3(q[0], q[1], q[2]), t);
+    }
+    std::sort(keyed.begin(), keyed.end());
+    const float nan = std::numeric_limits<float>::quiet_NaN();
+    // Packet boxes are clipped to the cell (a hit is always found in the cell that holds its
+    // point) and padded beyond the cell margin against rounding in the slab test.
+    float pad = margin_ + 1e-3f * cell.extent().length();
+    Vec3 vpad(pad, pad, pad);
+    BBox clip(cell.min - vpad, cell.max + vpad);
+    size_t packetCount = (keyed.size() + 3) / 4;
+    bool grouped = packetCount > 1;
+    for (size_t g = 0; g < packetCount; g += 4) {
+        uint32_t count = uint32_t(std::min<size_t>(4, packetCount - g));
+        uint32_t groupOffset = uint32_t(blob_.size());
+        PacketGroup group;
+        if (grouped) {
+            blob_.resize(blob_.size() + kGroupBlocks);
+            group.first = uint32_t(blob_.size());
+            group.count = count;
+        }
+        for (uint32_t j = 0; j < count; ++j) {
+            size_t i = (g + j) * 4;
+            IntersectSSETriangle pk;
+            BBox box;
+            for (int lane = 0; lane < 4; ++lane) {
+                bool used = i + lane < keyed.size();
+                uint32_t index = used ? keyed[i + lane].second : 0xFFFFFFFFu;
+                const IntersectTriangle *t = used ? &store_->triangles[index] : nullptr;
+                for (int a = 0; a < 3; ++a) {
+                    pk.p0[a][lane] = used ? t->p0[a] : nan;
+                    pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
+                    pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
+                }
+                pk.flags[lane] = used ? t->flags : 0u;
+                pk.prim[lane] = index;
+                pk.id[lane] = used ? t->id : 0u;
+                pk.instance[lane] = used ? t->instance : kNoInstance;
+                if (used) box.extend(t->bounds());
+            }
+            box.min = vmax(box.min - vpad, clip.min);
+            box.max = vmin(box.max + vpad, clip.max);
+            for (int a = 0; a < 3; ++a) group.lo[a][j] = box.min[a], group.hi[a][j] = box.max[a];
+            uint32_t offset = uint32_t(blob_.size());
+            blob_.resize(blob_.size() + kPacketBlocks);
+            std::memcpy(static_cast<void *>(blob_.data() + offset), &pk, sizeof pk);
+            if (!grouped) items_.push_back(itemCode(kItemPacket, offset));
+        }
+        if (grouped) {
+            for (uint32_t j = count; j < 4; ++j)
+                for (int a = 0; a < 3; ++a) group.lo[a][j] = group.lo[a][0], group.hi[a][j] = group.hi[a][0];
+            std::memcpy(static_cast<void *>(blob_.data() + groupOffset), &group, sizeof group);
+            items_.push_back(itemCode(kItemGroup, groupOffset));
+        }
+    }
 }
 
 size_t Grid::nestedGridCount() const {
@@ -357,7 +436,8 @@ uint32_t Grid::nestingDepth() const {
 
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cellBegin_.capacity() * 4 + items_.capacity() * 4 +
-               packets_.capacity() * sizeof(IntersectSSETriangle) +
+               occupied_.capacity() * 8 +
+               blob_.capacity() * sizeof(Block) +
                children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
@@ -379,6 +459,48 @@ bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, Trace
     return true;
 }
 
+namespace {
+
+// Runs the packet kernel and keeps the closest lane hit in the state.
+template <bool kAny>
+inline bool testPacket(const IntersectSSETriangle &pk, const TraceRay &r, TraceState &s) {
+    float4 t, u, v;
+    int mask = intersectPacket(pk, r, s.limit, t, u, v);
+    if (!mask) return false;
+    if constexpr (kAny) return true;
+    alignas(16) float ts[4], us[4], vs[4];
+    _mm_store_ps(ts, t);
+    int lane = -1;
+    for (int i = 0; i < 4; ++i)
+        if ((mask >> i & 1) && (lane < 0 || ts[i] < ts[lane])) lane = i;
+    _mm_store_ps(us, u);
+    _mm_store_ps(vs, v);
+    s.limit = ts[lane];
+    s.u = us[lane], s.v = vs[lane];
+    s.kind = kItemTriangle;
+    s.prim = pk.prim[lane];
+    s.id = pk.id[lane];
+    s.instance = pk.instance[lane];
+    s.flags = pk.flags[lane];
+    s.fromPacket = true;
+    s.found = true;
+    return true;
+}
+
+// Lanes of the group whose box the ray passes through between 0 and the limit.
+inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit) {
+    float4 t0x = (float4::load(g.lo[0]) - r.ox) * r.ix, t1x = (float4::load(g.hi[0]) - r.ox) * r.ix;
+    float4 t0y = (float4::load(g.lo[1]) - r.oy) * r.iy, t1y = (float4::load(g.hi[1]) - r.oy) * r.iy;
+    float4 t0z = (float4::load(g.lo[2]) - r.oz) * r.iz, t1z = (float4::load(g.hi[2]) - r.oz) * r.iz;
+    float4 tnear = _mm_max_ps(_mm_max_ps(_mm_min_ps(t0x, t1x), _mm_min_ps(t0y, t1y)),
+                              _mm_max_ps(_mm_min_ps(t0z, t1z), float4::zero()));
+    float4 tfar = _mm_min_ps(_mm_min_ps(_mm_max_ps(t0x, t1x), _mm_max_ps(t0y, t1y)),
+                             _mm_min_ps(_mm_max_ps(t0z, t1z), float4(limit)));
+    return movemask(_mm_cmple_ps(tnear, tfar)) & ((1 << g.count) - 1);
+}
+
+}  // namespace
+
 template <bool kAny>
 bool Grid::testItems(const TraceRay &r, TraceState &s, uint32_t begin, uint32_t end) const {
     bool hit = false;
@@ -387,22 +509,23 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, uint32_t begin, uint32_t 
         uint32_t index = code & kItemIndexMask;
         switch (code >> kItemIndexBits) {
             case kItemPacket: {
-                float4 t, u, v;
-                int mask = intersectPacket(packets_[index], r, s.limit, t, u, v);
-                if (!mask) break;
-                if constexpr (kAny) return true;
-                alignas(16) float ts[4], us[4], vs[4];
-                _mm_store_ps(ts, t);
-                int lane = -1;
-                for (int i = 0; i < 4; ++i)
-                    if ((mask >> i & 1) && (lane < 0 || ts[i] < ts[lane])) lane = i;
-                _mm_store_ps(us, u);
-                _mm_store_ps(vs, v);
-                s.limit = ts[lane];
-                s.u = us[lane], s.v = vs[lane];
-                s.kind = kItemTriangle;
-                s.prim = packets_[index].prim[lane];
-                s.found = hit = true;
+                if (testPacket<kAny>(*packetAt(index), r, s)) {
+                    if constexpr (kAny) return true;
+                    hit = true;
+                }
+                break;
+            }
+            case kItemGroup: {
+                const PacketGroup &g = *groupAt(index);
+                int mask = groupMask(g, r, s.limit);
+                while (mask) {
+                    int lane = __builtin_ctz(mask);
+                    mask &= mask - 1;
+                    if (testPacket<kAny>(*packetAt(g.first + lane * kPacketBlocks), r, s)) {
+                        if constexpr (kAny) return true;
+                        hit = true;
+                    }
+                }
                 break;
             }
             case kItemTriangle: {
@@ -412,6 +535,7 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, uint32_t begin, uint32_t 
                 s.limit = t, s.u = u, s.v = v;
                 s.kind = kItemTriangle;
                 s.prim = index;
+                s.fromPacket = false;
                 s.found = hit = true;
                 break;
             }
@@ -479,51 +603,78 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     }
     if (!(t0 <= t1)) return false;
 
-    int64_t n[3] = {nx_, ny_, nz_};
-    int64_t idx[3], step[3];
-    float tNext[3];
+    // Per axis: the cell index, the step, the distance to the next cell plane, and what is
+    // needed to recompute that distance exactly from the plane index after each step.
+    int64_t idx[3], step[3], next[3];
+    float tNext[3], base[3];
+    const int64_t n[3] = {nx_, ny_, nz_};
     for (int a = 0; a < 3; ++a) {
         float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * t0;
         idx[a] = cellCoord(p, a);
+        base[a] = box_.min[a] - r.o[a];
         if (r.d[a] > 0.0f) {
             step[a] = 1;
-            float plane = idx[a] + 1 == n[a] ? box_.max[a]
-                                             : box_.min[a] + float(idx[a] + 1) * cellSize_[a];
-            tNext[a] = (plane - r.o[a]) * r.inv[a];
+            next[a] = idx[a] + 1;
         } else if (r.d[a] < 0.0f) {
             step[a] = -1;
-            float plane = box_.min[a] + float(idx[a]) * cellSize_[a];
-            tNext[a] = (plane - r.o[a]) * r.inv[a];
+            next[a] = idx[a];
         } else {
             step[a] = 0;
-            tNext[a] = kInfiniteDistance;
+            next[a] = 0;
         }
+        tNext[a] = step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a]
+                           : kInfiniteDistance;
     }
-    const int64_t rowStride = nx_, sliceStride = nx_ * ny_;
-    const int64_t stride[3] = {1, rowStride, sliceStride};
-    int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
+    float tx = tNext[0], ty = tNext[1], tz = tNext[2];
+    int64_t ix = idx[0], iy = idx[1], iz = idx[2];
+    const int64_t sx = step[0], sy = step[1], sz = step[2];
+    int64_t kx = next[0], ky = next[1], kz = next[2];
+    const int64_t dx = sx, dy = sy * nx_, dz = sz * nx_ * ny_;
+    const float bx = base[0], by = base[1], bz = base[2];
+    const float cx = cellSize_.x * r.inv.x, cy = cellSize_.y * r.inv.y,
+                cz = cellSize_.z * r.inv.z;
+    const float ox = bx * r.inv.x, oy = by * r.inv.y, oz = bz * r.inv.z;
+    (void)ox, (void)oy, (void)oz;
+    int64_t cell = (iz * ny_ + iy) * nx_ + ix;
+    const uint64_t *occupied = occupied_.data();
+    const uint32_t *begins = cellBegin_.data();
     bool found = false;
     // A walk visits at most nx + ny + nz cells.
     for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
-        int axis = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2)
-                                       : (tNext[1] < tNext[2] ? 1 : 2);
-        float exit = tNext[axis];
-        uint32_t begin = cellBegin_[cell], end = cellBegin_[cell + 1];
-        if (begin != end && testItems<kAny>(r, s, begin, end)) {
-            if constexpr (kAny) return true;
-            found = true;
+        if (occupied[uint64_t(cell) >> 6] >> (uint64_t(cell) & 63) & 1) {
+            if (testItems<kAny>(r, s, begins[cell], begins[cell + 1])) {
+                if constexpr (kAny) return true;
+                found = true;
+            }
         }
         // The best hit lies inside the cells walked so far: nothing further can be closer.
-        if (exit >= s.limit) break;
-        idx[axis] += step[axis];
-        if (idx[axis] < 0 || idx[axis] >= n[axis]) break;
-        cell += step[axis] * stride[axis];
-        float plane = step[axis] > 0 ? (idx[axis] + 1 == n[axis]
-                                            ? box_.max[axis]
-                                            : box_.min[axis] + float(idx[axis] + 1) * cellSize_[axis])
-                                     : box_.min[axis] + float(idx[axis]) * cellSize_[axis];
-        tNext[axis] = (plane - r.o[axis]) * r.inv[axis];
+        if (tx < ty) {
+            if (tx < tz) {
+                if (tx >= s.limit) break;
+                ix += sx;
+                if (uint64_t(ix) >= uint64_t(nx_)) break;
+                cell += dx;
+                kx += sx;
+                tx = (bx + float(kx) * cellSize_.x) * r.inv.x;
+                continue;
+            }
+        } else if (ty < tz) {
+            if (ty >= s.limit) break;
+            iy += sy;
+            if (uint64_t(iy) >= uint64_t(ny_)) break;
+            cell += dy;
+            ky += sy;
+            ty = (by + float(ky) * cellSize_.y) * r.inv.y;
+            continue;
+        }
+        if (tz >= s.limit) break;
+        iz += sz;
+        if (uint64_t(iz) >= uint64_t(nz_)) break;
+        cell += dz;
+        kz += sz;
+        tz = (bz + float(kz) * cellSize_.z) * r.inv.z;
     }
+    (void)cx, (void)cy, (void)cz;
     return found;
 }
 

@@ -20,6 +20,17 @@ enum ItemKind : uint32_t {
     kItemMotion = 2,    ///< A MotionTriangle of the store.
     kItemInstance = 3,  ///< An IntersectInstanceGrid of the store.
     kItemChild = 4,     ///< A DynamicVoxel: a nested grid of the grid itself.
+    kItemGroup = 5,     ///< Up to four packets of the grid behind one four-wide box test.
+};
+
+/// Up to four consecutive packets with their boxes (clipped to the cell), tested together so
+/// that a ray only runs the triangle kernel on packets whose box it passes through.
+struct alignas(16) PacketGroup {
+    float lo[3][4];
+    float hi[3][4];
+    uint32_t first = 0;   ///< Block offset of the first packet (the packets follow the group).
+    uint32_t count = 0;   ///< Number of packets (1 to 4).
+    uint32_t reserved[2] = {0, 0};
 };
 constexpr uint32_t kItemIndexBits = 29;
 constexpr uint32_t kItemIndexMask = (1u << kItemIndexBits) - 1u;
@@ -143,8 +154,6 @@ public:
     std::vector<uint32_t> cellItems(int64_t x, int64_t y, int64_t z) const;
     /// The nested grid of a kItemChild code (for tests).
     const Grid *child(uint32_t index) const { return children_[index].get(); }
-    /// The packet of a kItemPacket code (for tests).
-    const IntersectSSETriangle &packet(uint32_t index) const { return packets_[index]; }
 
 private:
     bool prepare(const PrimitiveStore &store, const std::vector<uint32_t> &prims, const BBox &box,
@@ -155,6 +164,7 @@ private:
     void refine();
     void finalize();
     int64_t cellCoord(float v, int axis) const;
+    void packCell(std::vector<uint32_t> &tris, const BBox &cell);
     template <bool kAny>
     bool testItems(const TraceRay &ray, TraceState &state, uint32_t begin, uint32_t end) const;
 
@@ -168,8 +178,22 @@ private:
     float margin_ = 0.0f;
     BBox box_;
     std::vector<uint32_t> cellBegin_;  // ncells + 1 offsets into items_
+    std::vector<uint64_t> occupied_;   // one bit per cell: it holds items
     std::vector<uint32_t> items_;
-    std::vector<IntersectSSETriangle> packets_;
+    // Packets and packet groups, 16-byte blocks; a group is followed by its packets so that
+    // one cell's data lies together in memory. Item codes of both kinds hold block offsets.
+    struct alignas(16) Block {
+        float f[4];
+    };
+    std::vector<Block> blob_;
+    const PacketGroup *groupAt(uint32_t offset) const {
+        return reinterpret_cast<const PacketGroup *>(blob_.data() + offset);
+    }
+    const IntersectSSETriangle *packetAt(uint32_t offset) const {
+        return reinterpret_cast<const IntersectSSETriangle *>(blob_.data() + offset);
+    }
+    static constexpr uint32_t kGroupBlocks = sizeof(PacketGroup) / 16;
+    static constexpr uint32_t kPacketBlocks = sizeof(IntersectSSETriangle) / 16;
     std::vector<std::unique_ptr<Grid>> children_;
     GridStats stats_;
     // Build-time lists, released by finalize.

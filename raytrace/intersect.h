@@ -24,16 +24,20 @@ struct TraceRay {
     float time = 0.0f;       ///< Shutter time in [0, 1].
     bool overrideFlags = false;  ///< Inside an instance: test every triangle with instFlags.
     uint32_t instFlags = 0;
-    float4 ox, oy, oz, dx, dy, dz;
+    float4 ox, oy, oz, dx, dy, dz, ix, iy, iz;
 
     /// Prepares the data; false when the ray can hit nothing (non-finite or zero direction).
     bool prepare(const Vec3 &origin, const Vec3 &direction, uint32_t requiredFlags, float t) {
         o = origin;
         d = direction;
         required = requiredFlags;
-        time = std::isnan(t) ? 0.0f : std::fmin(std::fmax(t, 0.0f), 1.0f);
+        time = t >= 0.0f ? (t <= 1.0f ? t : 1.0f) : 0.0f;  // NaN becomes 0
         if (!isFinite(o) || !isFinite(d) || d.lengthSquared() == 0.0f) return false;
-        inv = {1.0f / d.x, 1.0f / d.y, 1.0f / d.z};
+        // A zero component gets a huge finite reciprocal instead of infinity, so that slab tests
+        // never form 0 * inf; the grid walk tests zero components itself.
+        auto recip = [](float x) { return x != 0.0f ? 1.0f / x : 1e30f; };
+        inv = {recip(d.x), recip(d.y), recip(d.z)};
+        ix = float4(inv.x), iy = float4(inv.y), iz = float4(inv.z);
         ox = float4(o.x), oy = float4(o.y), oz = float4(o.z);
         dx = float4(d.x), dy = float4(d.y), dz = float4(d.z);
         return true;
@@ -49,6 +53,10 @@ struct TraceState {
     uint8_t kind = 0;        ///< Item kind of the hit (see Grid::ItemKind).
     uint32_t prim = 0;       ///< Index of the triangle (or motion triangle) in its store.
     uint32_t inst = 0;       ///< For hits through an instance: the instance's index in the store.
+    uint32_t id = 0;         ///< Triangle hit: its index inside its shape (from the packet).
+    uint32_t instance = kNoInstance;  ///< Triangle hit: its scene instance (from the packet).
+    uint32_t flags = 0;      ///< Triangle hit: its flag word (from the packet).
+    bool fromPacket = false;  ///< id, instance and flags are set.
 };
 
 /// True when an object with these flags is seen by rays that need one of the required bits.
@@ -120,6 +128,8 @@ struct alignas(16) IntersectSSETriangle {
     float e2[3][4];
     uint32_t flags[4];
     uint32_t prim[4];    ///< Store index of each lane's triangle (0xFFFFFFFF for unused lanes).
+    uint32_t id[4];      ///< Triangle index inside its shape.
+    uint32_t instance[4];  ///< Scene instance of each lane.
 };
 
 /// Tests the four lanes; returns the lane bit mask of hits with 1e-6 < t < tmax.

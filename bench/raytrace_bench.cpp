@@ -1,0 +1,224 @@
+// Rays per second of the complete grid against Intel Embree on the same meshes and rays:
+// incoherent rays (random origins inside the scene box, random directions) and camera rays,
+// closest hit and occlusion, one and two threads, over meshes of about 70k and 870k triangles.
+// The build benchmarks report the build time and the bytes per triangle of both structures.
+#include <benchmark/benchmark.h>
+
+#include <atomic>
+#include <chrono>
+#include <cmath>
+#include <memory>
+#include <vector>
+
+#include "core/message.h"
+#include "raytrace/camera.h"
+#include "raytrace/complete_grid.h"
+#include "tests/raytrace/test_meshes.h"
+
+#ifdef OX_HAVE_EMBREE
+#include <embree3/rtcore.h>
+#endif
+
+namespace {
+
+using namespace ox;
+
+constexpr size_t kRayCount = 1 << 16;
+
+#ifdef OX_HAVE_EMBREE
+std::atomic<int64_t> gEmbreeBytes{0};
+bool embreeMemory(void *, ssize_t bytes, bool) {
+    gEmbreeBytes += bytes;
+    return true;
+}
+
+struct EmbreeScene {
+    RTCDevice device = nullptr;
+    RTCScene scene = nullptr;
+    double buildSeconds = 0;
+    int64_t bytes = 0;
+
+    explicit EmbreeScene(const testmesh::Mesh &m) {
+        device = rtcNewDevice("threads=1");
+        rtcSetDeviceMemoryMonitorFunction(device, embreeMemory, nullptr);
+        int64_t before = gEmbreeBytes;
+        auto start = std::chrono::steady_clock::now();
+        scene = rtcNewScene(device);
+        RTCGeometry g = rtcNewGeometry(device, RTC_GEOMETRY_TYPE_TRIANGLE);
+        auto *v = static_cast<float *>(rtcSetNewGeometryBuffer(
+            g, RTC_BUFFER_TYPE_VERTEX, 0, RTC_FORMAT_FLOAT3, 3 * sizeof(float),
+            m.positions.size()));
+        for (size_t i = 0; i < m.positions.size(); ++i)
+            v[3 * i] = m.positions[i].x, v[3 * i + 1] = m.positions[i].y,
+                  v[3 * i + 2] = m.positions[i].z;
+        auto *ix = static_cast<unsigned *>(rtcSetNewGeometryBuffer(
+            g, RTC_BUFFER_TYPE_INDEX, 0, RTC_FORMAT_UINT3, 3 * sizeof(unsigned),
+            m.triangleCount()));
+        for (size_t i = 0; i < m.indices.size(); ++i) ix[i] = m.indices[i];
+        rtcCommitGeometry(g);
+        rtcAttachGeometry(scene, g);
+        rtcReleaseGeometry(g);
+        rtcCommitScene(scene);
+        buildSeconds =
+            std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+        bytes = gEmbreeBytes - before;
+    }
+    ~EmbreeScene() {
+        rtcReleaseScene(scene);
+        rtcReleaseDevice(device);
+    }
+};
+#endif
+
+struct Fixture {
+    testmesh::Mesh mesh;
+    CompleteGrid grid;
+    double buildSeconds = 0;
+    std::vector<Ray> incoherent, camera;
+    float incoherentTmax = 0, cameraTmax = 0;
+#ifdef OX_HAVE_EMBREE
+    std::unique_ptr<EmbreeScene> embree;
+#endif
+
+    explicit Fixture(uint32_t rings, uint32_t segments) {
+        setTypeEnabled(kMsgProgress | kMsgInfo | kMsgBench | kMsgVerbose, false);
+        mesh = testmesh::blob(rings, segments);
+        InstanceInput in;
+        in.name = "blob";
+        in.mesh.positions = mesh.positions.data();
+        in.mesh.vertexCount = mesh.positions.size();
+        in.mesh.indices = mesh.indices.data();
+        in.mesh.triangleCount = mesh.triangleCount();
+        in.flags = 0x4EDFF;
+        in.index = 0;
+        auto start = std::chrono::steady_clock::now();
+        grid.build({in}, ADSParameters());
+        buildSeconds =
+            std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+        testmesh::Rng rng(12345);
+        BBox box = grid.bounds();
+        incoherentTmax = box.extent().length() * 0.25f;
+        for (size_t i = 0; i < kRayCount; ++i) {
+            Ray r;
+            r.origin = rng.inBox(box);
+            r.direction = rng.direction();
+            incoherent.push_back(r);
+        }
+        Mtx4 m = Mtx4::translation({0.3f, 0.4f, 4.0f});
+        PerspectiveCamera cam("cam", m, nullptr, 0.8f, 0.8f, {0, 0});
+        for (size_t y = 0; y < 256; ++y)
+            for (size_t x = 0; x < 256; ++x) {
+                Ray r;
+                cam.generateRay({(x + 0.5f) / 256.0f, (y + 0.5f) / 256.0f}, {0.5f, 0.5f}, r);
+                camera.push_back(r);
+            }
+        cameraTmax = 4.0f;
+#ifdef OX_HAVE_EMBREE
+        embree = std::make_unique<EmbreeScene>(mesh);
+#endif
+    }
+};
+
+Fixture &fixture(int which) {
+    static std::unique_ptr<Fixture> small, large;
+    if (which == 0) {
+        if (!small) small = std::make_unique<Fixture>(133, 265);  // 69,960 triangles
+        return *small;
+    }
+    if (!large) large = std::make_unique<Fixture>(466, 935);  // 869,550 triangles
+    return *large;
+}
+
+// Arguments: mesh (0 small, 1 large), rays (0 incoherent, 1 camera), query (0 closest, 1 any).
+void BM_Grid(benchmark::State &state) {
+    static std::atomic<int> ready{0};
+    Fixture &f = fixture(int(state.range(0)));
+    (void)ready;
+    const std::vector<Ray> &rays = state.range(1) == 0 ? f.incoherent : f.camera;
+    float tmax = state.range(1) == 0 ? f.incoherentTmax : f.cameraTmax;
+    bool any = state.range(2) == 1;
+    size_t i = size_t(state.thread_index()) * 7919, hits = 0, n = 0;
+    RayCounter counter;
+    for (auto _ : state) {
+        for (int k = 0; k < 256; ++k, ++i) {
+            const Ray &r = rays[i & (rays.size() - 1)];
+            if (any) {
+                hits += f.grid.occluded(r, tmax, &counter);
+            } else {
+                Hit h;
+                hits += f.grid.intersect(r, h, &counter);
+            }
+        }
+        n += 256;
+    }
+    state.SetItemsProcessed(int64_t(n));
+    state.counters["hitRate"] = double(hits) / double(n ? n : 1);
+}
+
+#ifdef OX_HAVE_EMBREE
+void BM_Embree(benchmark::State &state) {
+    Fixture &f = fixture(int(state.range(0)));
+    const std::vector<Ray> &rays = state.range(1) == 0 ? f.incoherent : f.camera;
+    float tmax = state.range(1) == 0 ? f.incoherentTmax : f.cameraTmax;
+    bool any = state.range(2) == 1;
+    RTCScene scene = f.embree->scene;
+    size_t i = size_t(state.thread_index()) * 7919, hits = 0, n = 0;
+    for (auto _ : state) {
+        for (int k = 0; k < 256; ++k, ++i) {
+            const Ray &r = rays[i & (rays.size() - 1)];
+            RTCIntersectContext ctx;
+            rtcInitIntersectContext(&ctx);
+            RTCRayHit rh;
+            rh.ray.org_x = r.origin.x, rh.ray.org_y = r.origin.y, rh.ray.org_z = r.origin.z;
+            rh.ray.dir_x = r.direction.x, rh.ray.dir_y = r.direction.y,
+            rh.ray.dir_z = r.direction.z;
+            rh.ray.tnear = 1e-6f;
+            rh.ray.tfar = any ? tmax : 3.4028235e38f;
+            rh.ray.mask = 0xFFFFFFFFu;
+            rh.ray.flags = 0;
+            rh.ray.time = 0;
+            if (any) {
+                rtcOccluded1(scene, &ctx, &rh.ray);
+                hits += rh.ray.tfar < 0.0f;
+            } else {
+                rh.hit.geomID = RTC_INVALID_GEOMETRY_ID;
+                rtcIntersect1(scene, &ctx, &rh);
+                hits += rh.hit.geomID != RTC_INVALID_GEOMETRY_ID;
+            }
+        }
+        n += 256;
+    }
+    state.SetItemsProcessed(int64_t(n));
+    state.counters["hitRate"] = double(hits) / double(n ? n : 1);
+}
+#endif
+
+void BM_Build(benchmark::State &state) {
+    Fixture &f = fixture(int(state.range(0)));
+    for (auto _ : state) benchmark::DoNotOptimize(f.grid.bounds());
+    double tris = double(f.mesh.triangleCount());
+    state.counters["triangles"] = tris;
+    state.counters["gridBuildSeconds"] = f.buildSeconds;
+    state.counters["gridBytesPerTriangle"] = double(f.grid.sizeBytes()) / tris;
+#ifdef OX_HAVE_EMBREE
+    state.counters["embreeBuildSeconds"] = f.embree->buildSeconds;
+    state.counters["embreeBytesPerTriangle"] = double(f.embree->bytes) / tris;
+#endif
+}
+
+void rayArgs(benchmark::internal::Benchmark *b) {
+    b->ArgNames({"mesh", "camera", "occlusion"});
+    for (int mesh : {0, 1})
+        for (int rays : {0, 1})
+            for (int any : {0, 1}) b->Args({mesh, rays, any});
+    b->Threads(1)->Threads(2)->UseRealTime();
+}
+
+}  // namespace
+
+BENCHMARK(BM_Build)->Arg(0)->Arg(1)->Iterations(1);
+BENCHMARK(BM_Grid)->Apply(rayArgs);
+#ifdef OX_HAVE_EMBREE
+BENCHMARK(BM_Embree)->Apply(rayArgs);
+#endif
+BENCHMARK_MAIN();
