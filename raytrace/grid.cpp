@@ -152,7 +152,7 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     params_.maxDepth = std::min(params.maxDepth, kMaxDepthLimit);
     depth_ = depth;
     mode_ = params.sse ? 3 : 2;
-    cellBegin_.clear();
+    cells_.clear();
     items_.clear();
     blob_.clear();
     children_.clear();
@@ -290,14 +290,14 @@ void Grid::refine() {
 void Grid::finalize() {
     size_t ncells = size_t(nx_ * ny_ * nz_);
     if (refinedChild_.size() != ncells) refinedChild_.assign(ncells, 0xFFFFFFFFu);
-    cellBegin_.assign(ncells + 1, 0);
+    std::vector<uint32_t> cellBegin(ncells + 1, 0);
     items_.clear();
     blob_.clear();
     stats_ = GridStats();
     stats_.voxels = ncells;
     std::vector<uint32_t> tris, others;
     for (size_t c = 0; c < ncells; ++c) {
-        cellBegin_[c] = uint32_t(items_.size());
+        cellBegin[c] = uint32_t(items_.size());
         uint64_t elements = 0;
         if (refinedChild_[c] != 0xFFFFFFFFu) {
             items_.push_back(itemCode(kItemChild, refinedChild_[c]));
@@ -323,10 +323,22 @@ void Grid::finalize() {
         stats_.elements += elements;
         stats_.maxElements = std::max(stats_.maxElements, elements);
     }
-    cellBegin_[ncells] = uint32_t(items_.size());
-    occupied_.assign((ncells + 63) / 64, 0);
-    for (size_t c = 0; c < ncells; ++c)
-        if (cellBegin_[c] != cellBegin_[c + 1]) occupied_[c >> 6] |= uint64_t(1) << (c & 63);
+    cellBegin[ncells] = uint32_t(items_.size());
+    cells_.assign(ncells, CellRef());
+    std::vector<uint32_t> lists;
+    for (size_t c = 0; c < ncells; ++c) {
+        uint32_t count = cellBegin[c + 1] - cellBegin[c];
+        if (!count) continue;
+        cells_[c].count = count;
+        if (count == 1) {
+            cells_[c].first = items_[cellBegin[c]];
+        } else {
+            cells_[c].first = uint32_t(lists.size());
+            lists.insert(lists.end(), items_.begin() + cellBegin[c], items_.begin() + cellBegin[c + 1]);
+        }
+    }
+    items_.swap(lists);
+    computeDistances();
     items_.shrink_to_fit();
     blob_.shrink_to_fit();
     std::vector<uint32_t>().swap(buildBegin_);
@@ -422,6 +434,39 @@ void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
     }
 }
 
+void Grid::computeDistances() {
+    // Exact chessboard distance by two raster passes over the 26-neighbourhood.
+    size_t ncells = cells_.size();
+    distance_.assign(ncells, 255);
+    for (size_t c = 0; c < ncells; ++c)
+        if (cells_[c].count) distance_[c] = 0;
+    auto pass = [&](int dir) {
+        int64_t zs = dir > 0 ? 0 : nz_ - 1, ys0 = dir > 0 ? 0 : ny_ - 1, xs0 = dir > 0 ? 0 : nx_ - 1;
+        for (int64_t z = zs; z >= 0 && z < nz_; z += dir)
+            for (int64_t y = ys0; y >= 0 && y < ny_; y += dir)
+                for (int64_t x = xs0; x >= 0 && x < nx_; x += dir) {
+                    size_t c = size_t((z * ny_ + y) * nx_ + x);
+                    uint32_t best = distance_[c];
+                    if (best == 0) continue;
+                    // The 13 neighbours already visited in this pass's order.
+                    for (int64_t dz = -1; dz <= 0; ++dz)
+                        for (int64_t dy = -1; dy <= 1; ++dy)
+                            for (int64_t dx = -1; dx <= 1; ++dx) {
+                                if (dz == 0 && (dy > 0 || (dy == 0 && dx >= 0))) continue;
+                                int64_t xx = x + dx * dir, yy = y + dy * dir, zz = z + dz * dir;
+                                if (xx < 0 || yy < 0 || zz < 0 || xx >= nx_ || yy >= ny_ ||
+                                    zz >= nz_)
+                                    continue;
+                                uint32_t d = distance_[size_t((zz * ny_ + yy) * nx_ + xx)] + 1u;
+                                if (d < best) best = d;
+                            }
+                    distance_[c] = uint8_t(std::min<uint32_t>(best, 255));
+                }
+    };
+    pass(1);
+    pass(-1);
+}
+
 size_t Grid::nestedGridCount() const {
     size_t n = children_.size();
     for (const auto &c : children_) n += c->nestedGridCount();
@@ -435,8 +480,8 @@ uint32_t Grid::nestingDepth() const {
 }
 
 size_t Grid::sizeBytes() const {
-    size_t n = sizeof(Grid) + cellBegin_.capacity() * 4 + items_.capacity() * 4 +
-               occupied_.capacity() * 8 +
+    size_t n = sizeof(Grid) + cells_.capacity() * sizeof(CellRef) + items_.capacity() * 4 +
+               distance_.capacity() +
                blob_.capacity() * sizeof(Block) +
                children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
@@ -446,7 +491,9 @@ size_t Grid::sizeBytes() const {
 std::vector<uint32_t> Grid::cellItems(int64_t x, int64_t y, int64_t z) const {
     if (empty() || x < 0 || y < 0 || z < 0 || x >= nx_ || y >= ny_ || z >= nz_) return {};
     size_t c = size_t((z * ny_ + y) * nx_ + x);
-    return {items_.begin() + cellBegin_[c], items_.begin() + cellBegin_[c + 1]};
+    const CellRef &ref = cells_[c];
+    if (ref.count == 1) return {ref.first};
+    return {items_.begin() + ref.first, items_.begin() + ref.first + ref.count};
 }
 
 bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, TraceRay &local) {
@@ -502,10 +549,11 @@ inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit) {
 }  // namespace
 
 template <bool kAny>
-bool Grid::testItems(const TraceRay &r, TraceState &s, uint32_t begin, uint32_t end) const {
+bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
+                     const uint32_t *last) const {
     bool hit = false;
-    for (uint32_t k = begin; k < end; ++k) {
-        uint32_t code = items_[k];
+    for (const uint32_t *k = first; k != last; ++k) {
+        uint32_t code = *k;
         uint32_t index = code & kItemIndexMask;
         switch (code >> kItemIndexBits) {
             case kItemPacket: {
@@ -587,7 +635,7 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, uint32_t begin, uint32_t 
 
 template <bool kAny>
 bool Grid::traverse(const TraceRay &r, TraceState &s) const {
-    if (cellBegin_.empty()) return false;
+    if (cells_.empty()) return false;
     // Clip the ray against the box (slab test); zero direction components test the slab only.
     float t0 = 0.0f, t1 = s.limit;
     for (int a = 0; a < 3; ++a) {
@@ -625,56 +673,64 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         tNext[a] = step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a]
                            : kInfiniteDistance;
     }
-    float tx = tNext[0], ty = tNext[1], tz = tNext[2];
-    int64_t ix = idx[0], iy = idx[1], iz = idx[2];
-    const int64_t sx = step[0], sy = step[1], sz = step[2];
-    int64_t kx = next[0], ky = next[1], kz = next[2];
-    const int64_t dx = sx, dy = sy * nx_, dz = sz * nx_ * ny_;
-    const float bx = base[0], by = base[1], bz = base[2];
-    const float cx = cellSize_.x * r.inv.x, cy = cellSize_.y * r.inv.y,
-                cz = cellSize_.z * r.inv.z;
-    const float ox = bx * r.inv.x, oy = by * r.inv.y, oz = bz * r.inv.z;
-    (void)ox, (void)oy, (void)oz;
-    int64_t cell = (iz * ny_ + iy) * nx_ + ix;
-    const uint64_t *occupied = occupied_.data();
-    const uint32_t *begins = cellBegin_.data();
+    int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
+    const uint8_t *distance = distance_.data();
+    const CellRef *cells = cells_.data();
+    const uint32_t *items = items_.data();
     bool found = false;
-    // A walk visits at most nx + ny + nz cells.
+    // Every iteration advances at least one cell along the ray, so a walk needs at most
+    // nx + ny + nz of them.
     for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
-        if (occupied[uint64_t(cell) >> 6] >> (uint64_t(cell) & 63) & 1) {
-            if (testItems<kAny>(r, s, begins[cell], begins[cell + 1])) {
+        uint32_t dist = distance[cell];
+        if (dist == 0) {
+            const CellRef &ref = cells[cell];
+            const uint32_t *first = ref.count == 1 ? &ref.first : items + ref.first;
+            if (testItems<kAny>(r, s, first, first + ref.count)) {
                 if constexpr (kAny) return true;
                 found = true;
             }
-        }
-        // The best hit lies inside the cells walked so far: nothing further can be closer.
-        if (tx < ty) {
-            if (tx < tz) {
-                if (tx >= s.limit) break;
-                ix += sx;
-                if (uint64_t(ix) >= uint64_t(nx_)) break;
-                cell += dx;
-                kx += sx;
-                tx = (bx + float(kx) * cellSize_.x) * r.inv.x;
-                continue;
+        } else if (dist >= 2) {
+            // Every cell within dist - 1 of this one is empty: leave that cube in one jump.
+            int64_t reach = int64_t(dist) - 1;
+            int axis = -1;
+            float tExit = kInfiniteDistance;
+            for (int a = 0; a < 3; ++a) {
+                if (!step[a]) continue;
+                int64_t plane = step[a] > 0 ? idx[a] + reach + 1 : idx[a] - reach;
+                plane = std::clamp<int64_t>(plane, 0, n[a]);
+                float t = (base[a] + float(plane) * cellSize_[a]) * r.inv[a];
+                if (t < tExit) tExit = t, axis = a;
             }
-        } else if (ty < tz) {
-            if (ty >= s.limit) break;
-            iy += sy;
-            if (uint64_t(iy) >= uint64_t(ny_)) break;
-            cell += dy;
-            ky += sy;
-            ty = (by + float(ky) * cellSize_.y) * r.inv.y;
+            if (axis < 0 || tExit >= s.limit) break;
+            int64_t jumped = idx[axis] + step[axis] * (reach + 1);
+            if (jumped < 0 || jumped >= n[axis]) break;
+            for (int a = 0; a < 3; ++a) {
+                if (a == axis) {
+                    idx[a] = jumped;
+                } else {
+                    float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * tExit;
+                    // Stay inside the cube (rounding must not skip a cell beside it).
+                    idx[a] = std::clamp<int64_t>(cellCoord(p, a), std::max<int64_t>(0, idx[a] - reach),
+                                                 std::min<int64_t>(n[a] - 1, idx[a] + reach));
+                }
+                if (step[a]) {
+                    next[a] = step[a] > 0 ? idx[a] + 1 : idx[a];
+                    tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
+                }
+            }
+            cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
             continue;
         }
-        if (tz >= s.limit) break;
-        iz += sz;
-        if (uint64_t(iz) >= uint64_t(nz_)) break;
-        cell += dz;
-        kz += sz;
-        tz = (bz + float(kz) * cellSize_.z) * r.inv.z;
+        // Step to the neighbour across the nearest cell plane. The best hit lies inside the
+        // cells walked so far when that plane is beyond it: nothing further can be closer.
+        int a = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2) : (tNext[1] < tNext[2] ? 1 : 2);
+        if (tNext[a] >= s.limit) break;
+        idx[a] += step[a];
+        if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
+        cell += a == 0 ? step[0] : a == 1 ? step[1] * nx_ : step[2] * nx_ * ny_;
+        next[a] += step[a];
+        tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
     }
-    (void)cx, (void)cy, (void)cz;
     return found;
 }
 

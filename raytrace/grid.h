@@ -135,7 +135,7 @@ public:
     template <bool kAny>
     bool traverse(const TraceRay &ray, TraceState &state) const;
 
-    bool empty() const { return cellBegin_.empty(); }
+    bool empty() const { return cells_.empty(); }
     const BBox &box() const { return box_; }
     GridResolution cells() const { return {nx_, ny_, nz_}; }
     Vec3 cellSize() const { return cellSize_; }
@@ -166,7 +166,8 @@ private:
     int64_t cellCoord(float v, int axis) const;
     void packCell(std::vector<uint32_t> &tris, const BBox &cell);
     template <bool kAny>
-    bool testItems(const TraceRay &ray, TraceState &state, uint32_t begin, uint32_t end) const;
+    bool testItems(const TraceRay &ray, TraceState &state, const uint32_t *first,
+                   const uint32_t *last) const;
 
     const PrimitiveStore *store_ = nullptr;
     GridParams params_;
@@ -177,8 +178,17 @@ private:
     float tolerance_ = 0.001f;
     float margin_ = 0.0f;
     BBox box_;
-    std::vector<uint32_t> cellBegin_;  // ncells + 1 offsets into items_
-    std::vector<uint64_t> occupied_;   // one bit per cell: it holds items
+    // Per cell: the item count and either the only item's code (count 1) or the offset of the
+    // cell's items in items_, so that most cells reach their data without the item list.
+    struct CellRef {
+        uint32_t first = 0;
+        uint32_t count = 0;
+    };
+    std::vector<CellRef> cells_;
+    // Per cell: 0 when it holds items, else the chessboard distance (in cells, at most 255) to
+    // the nearest cell that does; the walk jumps over the empty cube this guarantees.
+    std::vector<uint8_t> distance_;
+    void computeDistances();
     std::vector<uint32_t> items_;
     // Packets and packet groups, 16-byte blocks; a group is followed by its packets so that
     // one cell's data lies together in memory. Item codes of both kinds hold block offsets.
