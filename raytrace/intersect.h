@@ -25,6 +25,15 @@ struct TraceRay {
     bool overrideFlags = false;  ///< Inside an instance: test every triangle with instFlags.
     uint32_t instFlags = 0;
     float4 ox, oy, oz, dx, dy, dz, ix, iy, iz;
+    int4 flagKeep, flagSet, required4;  ///< Lane flags = (packet flags & keep) | set.
+
+    /// Switches to testing every triangle with the flags of an instance.
+    void setInstanceFlags(uint32_t flags) {
+        overrideFlags = true;
+        instFlags = flags;
+        flagKeep = int4(0);
+        flagSet = int4(int32_t(flags));
+    }
 
     /// Prepares the data; false when the ray can hit nothing (non-finite or zero direction).
     bool prepare(const Vec3 &origin, const Vec3 &direction, uint32_t requiredFlags, float t) {
@@ -40,6 +49,10 @@ struct TraceRay {
         ix = float4(inv.x), iy = float4(inv.y), iz = float4(inv.z);
         ox = float4(o.x), oy = float4(o.y), oz = float4(o.z);
         dx = float4(d.x), dy = float4(d.y), dz = float4(d.z);
+        overrideFlags = false;
+        flagKeep = int4(-1);
+        flagSet = int4(0);
+        required4 = int4(int32_t(required));
         return true;
     }
 };
@@ -133,12 +146,14 @@ struct alignas(16) IntersectSSETriangle {
 };
 
 /// Tests the four lanes; returns the lane bit mask of hits with 1e-6 < t < tmax.
-inline int intersectPacket(const IntersectSSETriangle &pk, const TraceRay &r, float tmax,
-                           float4 &tOut, float4 &uOut, float4 &vOut) {
-    int4 flags = r.overrideFlags ? int4(int32_t(r.instFlags)) : int4::load(pk.flags);
+__attribute__((always_inline)) inline int intersectPacket(const IntersectSSETriangle &pk,
+                                                          const TraceRay &r, float tmax,
+                                                          float4 &tOut, float4 &uOut,
+                                                          float4 &vOut) {
+    int4 flags = (int4::load(pk.flags) & r.flagKeep) | r.flagSet;
     int4 zero(0);
     // Lanes whose flags lack every required bit are invisible.
-    float4 invisible = asFloat(cmpeq(flags & int4(int32_t(r.required)), zero));
+    float4 invisible = asFloat(cmpeq(flags & r.required4, zero));
     float4 e1x = float4::load(pk.e1[0]), e1y = float4::load(pk.e1[1]),
            e1z = float4::load(pk.e1[2]);
     float4 e2x = float4::load(pk.e2[0]), e2y = float4::load(pk.e2[1]),
