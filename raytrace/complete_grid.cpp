@@ -245,7 +245,6 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
                 std::vector<uint32_t> shapeCodes;
                 skipped = addTriangles(owned->store, shapeCodes, in.mesh, Mtx4(), false, 0u,
                                        kNoInstance);
-                if (gp.sse) owned->store.buildPackets();
                 if (!owned->grid.build(owned->store, shapeCodes, unionOf(owned->store, shapeCodes),
                                        gp, 0, true))
                     return false;
@@ -294,10 +293,6 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
 
     message(kMsgProgress, 1, "Building ADS structure");
     box_ = unionOf(store_, codes);
-    if (gp.sse) {
-        store_.buildPackets();
-        secondStore_.buildPackets();
-    }
     if (!grid_.build(store_, codes, box_, gp, 0, true)) return false;
     if (!second_.build(secondStore_, secondCodes, unionOf(secondStore_, secondCodes), gp, 0, true))
         return false;

@@ -84,8 +84,6 @@ BBox PrimitiveStore::bounds(uint32_t code) const {
 size_t PrimitiveStore::sizeBytes() const {
     return triangles.capacity() * sizeof(IntersectTriangle) +
            motion.capacity() * sizeof(MotionTriangle) + motionCorners.capacity() * sizeof(Vec3) +
-           packets.capacity() * sizeof(IntersectSSETriangle) + packetBoxes.capacity() * sizeof(BBox) +
-           packetOfTriangle.capacity() * sizeof(uint32_t) +
            instances.capacity() * sizeof(IntersectInstanceGrid);
 }
 
@@ -156,7 +154,7 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     mode_ = params.sse ? 3 : 2;
     cells_.clear();
     items_.clear();
-    groups_.clear();
+    blob_.clear();
     children_.clear();
     stats_ = GridStats();
     nx_ = ny_ = nz_ = 0;
@@ -194,6 +192,14 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     margin_ = std::min(tolerance_, 0.05f * minCell) + 4e-7f * maxAbs;
     insertAll(prims);
     return true;
+}
+
+int64_t Grid::cellCoord(float v, int axis) const {
+    float n = float(axis == 0 ? nx_ : axis == 1 ? ny_ : nz_);
+    float f = (v - box_.min[axis]) * invCellSize_[axis];
+    // Clamp in floating point first: NaN and huge values never reach the integer conversion.
+    f = f >= 0.0f ? (f < n - 1.0f ? f : n - 1.0f) : 0.0f;
+    return int64_t(f);  // truncation is floor for the non-negative values left
 }
 
 BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
@@ -286,13 +292,10 @@ void Grid::finalize() {
     if (refinedChild_.size() != ncells) refinedChild_.assign(ncells, 0xFFFFFFFFu);
     std::vector<uint32_t> cellBegin(ncells + 1, 0);
     items_.clear();
-    groups_.clear();
+    blob_.clear();
     stats_ = GridStats();
     stats_.voxels = ncells;
     std::vector<uint32_t> tris, others;
-    // Packing needs the store's packets; without them triangles are tested one by one.
-    bool packed = params_.sse && !store_->packets.empty() &&
-                  store_->packetOfTriangle.size() == store_->triangles.size();
     for (size_t c = 0; c < ncells; ++c) {
         cellBegin[c] = uint32_t(items_.size());
         uint64_t elements = 0;
@@ -305,7 +308,7 @@ void Grid::finalize() {
             for (uint32_t k = buildBegin_[c]; k < buildBegin_[c + 1]; ++k) {
                 uint32_t code = buildItems_[k];
                 ++elements;
-                if (packed && (code >> kItemIndexBits) == kItemTriangle)
+                if (params_.sse && (code >> kItemIndexBits) == kItemTriangle)
                     tris.push_back(code & kItemIndexMask);
                 else
                     others.push_back(code);
@@ -337,7 +340,7 @@ void Grid::finalize() {
     items_.swap(lists);
     computeDistances();
     items_.shrink_to_fit();
-    groups_.shrink_to_fit();
+    blob_.shrink_to_fit();
     std::vector<uint32_t>().swap(buildBegin_);
     std::vector<uint32_t>().swap(buildItems_);
     std::vector<uint32_t>().swap(refinedChild_);
@@ -360,83 +363,74 @@ uint32_t morton3(uint32_t x, uint32_t y, uint32_t z) {
 
 }  // namespace
 
-void PrimitiveStore::buildPackets() {
-    packets.clear();
-    packetBoxes.clear();
-    packetOfTriangle.assign(triangles.size(), 0);
-    BBox all;
-    for (const IntersectTriangle &t : triangles) all.extend(t.bounds());
-    Vec3 ext = all.extent();
+void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
+    // Neighbouring triangles share packets (Morton order of their centres), so that the
+    // packet boxes are small.
     std::vector<std::pair<uint32_t, uint32_t>> keyed;
-    keyed.reserve(triangles.size());
-    for (uint32_t i = 0; i < triangles.size(); ++i) {
-        const IntersectTriangle &tri = triangles[i];
+    keyed.reserve(tris.size());
+    Vec3 ext = cell.extent();
+    for (uint32_t t : tris) {
+        const IntersectTriangle &tri = store_->triangles[t];
         Vec3 c = tri.p0 + (tri.e1 + tri.e2) * (1.0f / 3.0f);
         uint32_t q[3];
         for (int a = 0; a < 3; ++a) {
-            float f = ext[a] > 0.0f ? (c[a] - all.min[a]) / ext[a] * 1023.0f : 0.0f;
+            float f = ext[a] > 0.0f ? (c[a] - cell.min[a]) / ext[a] * 1023.0f : 0.0f;
             f = f >= 0.0f ? (f <= 1023.0f ? f : 1023.0f) : 0.0f;
             q[a] = uint32_t(f);
         }
-        keyed.emplace_back(morton3(q[0], q[1], q[2]), i);
+        keyed.emplace_back(morton3(q[0], q[1], q[2]), t);
     }
     std::sort(keyed.begin(), keyed.end());
     const float nan = std::numeric_limits<float>::quiet_NaN();
-    packets.reserve((keyed.size() + 3) / 4);
-    for (size_t i = 0; i < keyed.size(); i += 4) {
-        IntersectSSETriangle pk;
-        BBox box;
-        for (int lane = 0; lane < 4; ++lane) {
-            bool used = i + lane < keyed.size();
-            uint32_t index = used ? keyed[i + lane].second : 0xFFFFFFFFu;
-            const IntersectTriangle *t = used ? &triangles[index] : nullptr;
-            for (int a = 0; a < 3; ++a) {
-                pk.p0[a][lane] = used ? t->p0[a] : nan;
-                pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
-                pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
-            }
-            pk.flags[lane] = used ? t->flags : 0u;
-            pk.prim[lane] = index;
-            pk.id[lane] = used ? t->id : 0u;
-            pk.instance[lane] = used ? t->instance : kNoInstance;
-            if (used) {
-                box.extend(t->bounds());
-                packetOfTriangle[index] = uint32_t(packets.size());
-            }
-        }
-        packets.push_back(pk);
-        packetBoxes.push_back(box);
-    }
-}
-
-void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
-    // The packets holding the cell's triangles (a packet may also hold triangles of other
-    // cells: testing them too only finds real hits).
-    for (uint32_t &t : tris) t = store_->packetOfTriangle[t];
-    std::sort(tris.begin(), tris.end());
-    tris.erase(std::unique(tris.begin(), tris.end()), tris.end());
-    if (tris.size() == 1) {
-        items_.push_back(itemCode(kItemPacket, tris[0]));
-        return;
-    }
     // Packet boxes are clipped to the cell (a hit is always found in the cell that holds its
     // point) and padded beyond the cell margin against rounding in the slab test.
     float pad = margin_ + 1e-3f * cell.extent().length();
     Vec3 vpad(pad, pad, pad);
     BBox clip(cell.min - vpad, cell.max + vpad);
-    for (size_t g = 0; g < tris.size(); g += 4) {
+    size_t packetCount = (keyed.size() + 3) / 4;
+    bool grouped = packetCount > 1;
+    for (size_t g = 0; g < packetCount; g += 4) {
+        uint32_t count = uint32_t(std::min<size_t>(4, packetCount - g));
+        uint32_t groupOffset = uint32_t(blob_.size());
         PacketGroup group;
-        group.count = uint32_t(std::min<size_t>(4, tris.size() - g));
-        for (uint32_t j = 0; j < 4; ++j) {
-            uint32_t packet = tris[g + std::min(j, group.count - 1)];
-            BBox box = store_->packetBoxes[packet];
+        if (grouped) {
+            blob_.resize(blob_.size() + kGroupBlocks);
+            group.first = uint32_t(blob_.size());
+            group.count = count;
+        }
+        for (uint32_t j = 0; j < count; ++j) {
+            size_t i = (g + j) * 4;
+            IntersectSSETriangle pk;
+            BBox box;
+            for (int lane = 0; lane < 4; ++lane) {
+                bool used = i + lane < keyed.size();
+                uint32_t index = used ? keyed[i + lane].second : 0xFFFFFFFFu;
+                const IntersectTriangle *t = used ? &store_->triangles[index] : nullptr;
+                for (int a = 0; a < 3; ++a) {
+                    pk.p0[a][lane] = used ? t->p0[a] : nan;
+                    pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
+                    pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
+                }
+                pk.flags[lane] = used ? t->flags : 0u;
+                pk.prim[lane] = index;
+                pk.id[lane] = used ? t->id : 0u;
+                pk.instance[lane] = used ? t->instance : kNoInstance;
+                if (used) box.extend(t->bounds());
+            }
             box.min = vmax(box.min - vpad, clip.min);
             box.max = vmin(box.max + vpad, clip.max);
             for (int a = 0; a < 3; ++a) group.lo[a][j] = box.min[a], group.hi[a][j] = box.max[a];
-            group.packet[j] = packet;
+            uint32_t offset = uint32_t(blob_.size());
+            blob_.resize(blob_.size() + kPacketBlocks);
+            std::memcpy(static_cast<void *>(blob_.data() + offset), &pk, sizeof pk);
+            if (!grouped) items_.push_back(itemCode(kItemPacket, offset));
         }
-        items_.push_back(itemCode(kItemGroup, uint32_t(groups_.size())));
-        groups_.push_back(group);
+        if (grouped) {
+            for (uint32_t j = count; j < 4; ++j)
+                for (int a = 0; a < 3; ++a) group.lo[a][j] = group.lo[a][0], group.hi[a][j] = group.hi[a][0];
+            std::memcpy(static_cast<void *>(blob_.data() + groupOffset), &group, sizeof group);
+            items_.push_back(itemCode(kItemGroup, groupOffset));
+        }
     }
 }
 
@@ -488,7 +482,7 @@ uint32_t Grid::nestingDepth() const {
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cells_.capacity() * sizeof(CellRef) + items_.capacity() * 4 +
                distance_.capacity() +
-               groups_.capacity() * sizeof(PacketGroup) +
+               blob_.capacity() * sizeof(Block) +
                children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
@@ -562,19 +556,19 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
         uint32_t index = code & kItemIndexMask;
         switch (code >> kItemIndexBits) {
             case kItemPacket: {
-                if (testPacket<kAny>(store_->packets[index], r, s)) {
+                if (testPacket<kAny>(*packetAt(index), r, s)) {
                     if constexpr (kAny) return true;
                     hit = true;
                 }
                 break;
             }
             case kItemGroup: {
-                const PacketGroup &g = groups_[index];
+                const PacketGroup &g = *groupAt(index);
                 int mask = groupMask(g, r, s.limit);
                 while (mask) {
                     int lane = __builtin_ctz(mask);
                     mask &= mask - 1;
-                    if (testPacket<kAny>(store_->packets[g.packet[lane]], r, s)) {
+                    if (testPacket<kAny>(*packetAt(g.first + lane * kPacketBlocks), r, s)) {
                         if constexpr (kAny) return true;
                         hit = true;
                     }
@@ -651,24 +645,32 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         float ta = (box_.min[a] - r.o[a]) * r.inv[a];
         float tb = (box_.max[a] - r.o[a]) * r.inv[a];
         if (ta > tb) std::swap(ta, tb);
-        t0 = ta > t0 ? ta : t0;
-        t1 = tb < t1 ? tb : t1;
+        t0 = std::max(t0, ta);
+        t1 = std::min(t1, tb);
     }
     if (!(t0 <= t1)) return false;
 
-    // Per axis: the cell index, the step, the index of the next cell plane and the distance to
-    // it, recomputed exactly from the plane index after each step.
-    int64_t idx[3], step[3], next[3], n[3] = {nx_, ny_, nz_};
-    float tNext[3], base[3], size[3];
-    const int64_t stride[3] = {1, nx_, nx_ * ny_};
+    // Per axis: the cell index, the step, the distance to the next cell plane, and what is
+    // needed to recompute that distance exactly from the plane index after each step.
+    int64_t idx[3], step[3], next[3];
+    float tNext[3], base[3];
+    const int64_t n[3] = {nx_, ny_, nz_};
     for (int a = 0; a < 3; ++a) {
         float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * t0;
         idx[a] = cellCoord(p, a);
         base[a] = box_.min[a] - r.o[a];
-        size[a] = cellSize_[a];
-        step[a] = r.d[a] > 0.0f ? 1 : (r.d[a] < 0.0f ? -1 : 0);
-        next[a] = idx[a] + (step[a] > 0);
-        tNext[a] = step[a] ? (base[a] + float(next[a]) * size[a]) * r.inv[a] : kInfiniteDistance;
+        if (r.d[a] > 0.0f) {
+            step[a] = 1;
+            next[a] = idx[a] + 1;
+        } else if (r.d[a] < 0.0f) {
+            step[a] = -1;
+            next[a] = idx[a];
+        } else {
+            step[a] = 0;
+            next[a] = 0;
+        }
+        tNext[a] = step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a]
+                           : kInfiniteDistance;
     }
     int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
     const uint8_t *distance = distance_.data();
@@ -688,30 +690,32 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             }
         } else if (dist >= 2) {
             // Every cell within dist - 1 of this one is empty: leave that cube in one jump.
-            // The exit face is the nearest of the cube's far planes; on the other axes the walk
-            // catches up with ordinary steps up to the exit distance.
             int64_t reach = int64_t(dist) - 1;
-            float tE[3];
-            for (int a = 0; a < 3; ++a)
-                tE[a] = step[a] ? (base[a] + float(step[a] > 0 ? idx[a] + dist : idx[a] - reach) *
-                                                 size[a]) *
-                                      r.inv[a]
-                                : kInfiniteDistance;
-            int a = tE[0] < tE[1] ? (tE[0] < tE[2] ? 0 : 2) : (tE[1] < tE[2] ? 1 : 2);
-            float tExit = tE[a];
-            if (!(tExit < s.limit)) break;
-            idx[a] += step[a] * int64_t(dist);
-            if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
-            next[a] = idx[a] + (step[a] > 0);
-            tNext[a] = (base[a] + float(next[a]) * size[a]) * r.inv[a];
-            for (int b = 0; b < 3; ++b) {
-                if (b == a) continue;
-                for (int64_t k = reach; k > 0 && tNext[b] < tExit; --k) {
-                    idx[b] += step[b];
-                    next[b] += step[b];
-                    tNext[b] = (base[b] + float(next[b]) * size[b]) * r.inv[b];
+            int axis = -1;
+            float tExit = kInfiniteDistance;
+            for (int a = 0; a < 3; ++a) {
+                if (!step[a]) continue;
+                int64_t plane = step[a] > 0 ? idx[a] + reach + 1 : idx[a] - reach;
+                plane = std::clamp<int64_t>(plane, 0, n[a]);
+                float t = (base[a] + float(plane) * cellSize_[a]) * r.inv[a];
+                if (t < tExit) tExit = t, axis = a;
+            }
+            if (axis < 0 || tExit >= s.limit) break;
+            int64_t jumped = idx[axis] + step[axis] * (reach + 1);
+            if (jumped < 0 || jumped >= n[axis]) break;
+            for (int a = 0; a < 3; ++a) {
+                if (a == axis) {
+                    idx[a] = jumped;
+                } else {
+                    float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * tExit;
+                    // Stay inside the cube (rounding must not skip a cell beside it).
+                    idx[a] = std::clamp<int64_t>(cellCoord(p, a), std::max<int64_t>(0, idx[a] - reach),
+                                                 std::min<int64_t>(n[a] - 1, idx[a] + reach));
                 }
-                if (uint64_t(idx[b]) >= uint64_t(n[b])) return found;
+                if (step[a]) {
+                    next[a] = step[a] > 0 ? idx[a] + 1 : idx[a];
+                    tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
+                }
             }
             cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
             continue;
@@ -722,9 +726,9 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         if (tNext[a] >= s.limit) break;
         idx[a] += step[a];
         if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
-        cell += step[a] * stride[a];
+        cell += a == 0 ? step[0] : a == 1 ? step[1] * nx_ : step[2] * nx_ * ny_;
         next[a] += step[a];
-        tNext[a] = (base[a] + float(next[a]) * size[a]) * r.inv[a];
+        tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
     }
     return found;
 }

@@ -23,13 +23,14 @@ enum ItemKind : uint32_t {
     kItemGroup = 5,     ///< Up to four packets of the grid behind one four-wide box test.
 };
 
-/// Up to four packets of a cell with their boxes (clipped to the cell), tested together so
+/// Up to four consecutive packets with their boxes (clipped to the cell), tested together so
 /// that a ray only runs the triangle kernel on packets whose box it passes through.
-struct alignas(64) PacketGroup {
+struct alignas(16) PacketGroup {
     float lo[3][4];
     float hi[3][4];
-    uint32_t packet[4] = {0, 0, 0, 0};  ///< Store packet indices.
-    uint32_t count = 0;                 ///< Number of packets (1 to 4).
+    uint32_t first = 0;   ///< Block offset of the first packet (the packets follow the group).
+    uint32_t count = 0;   ///< Number of packets (1 to 4).
+    uint32_t reserved[2] = {0, 0};
 };
 constexpr uint32_t kItemIndexBits = 29;
 constexpr uint32_t kItemIndexMask = (1u << kItemIndexBits) - 1u;
@@ -71,14 +72,7 @@ struct PrimitiveStore {
     std::vector<MotionTriangle> motion;
     std::vector<Vec3> motionCorners;
     std::vector<IntersectInstanceGrid> instances;
-    /// The triangles four to a packet in Morton order of their centres (shared by every grid
-    /// over this store; a cell refers to the packets that hold its triangles).
-    std::vector<IntersectSSETriangle> packets;
-    std::vector<BBox> packetBoxes;
-    std::vector<uint32_t> packetOfTriangle;
 
-    /// Packs the triangles into packets (once, before grids with packing are built).
-    void buildPackets();
     /// Box of the primitive an item code names.
     BBox bounds(uint32_t code) const;
     /// Bytes held.
@@ -169,14 +163,7 @@ private:
     BBox cellBox(int64_t x, int64_t y, int64_t z) const;
     void refine();
     void finalize();
-    /// Cell index along an axis, clamped in floating point first (NaN and huge values never
-    /// reach the integer conversion).
-    int64_t cellCoord(float v, int axis) const {
-        float n = float(axis == 0 ? nx_ : axis == 1 ? ny_ : nz_);
-        float f = (v - box_.min[axis]) * invCellSize_[axis];
-        f = f >= 0.0f ? (f < n - 1.0f ? f : n - 1.0f) : 0.0f;
-        return int64_t(f);  // truncation is floor for the non-negative values left
-    }
+    int64_t cellCoord(float v, int axis) const;
     void packCell(std::vector<uint32_t> &tris, const BBox &cell);
     template <bool kAny>
     bool testItems(const TraceRay &ray, TraceState &state, const uint32_t *first,
@@ -203,7 +190,20 @@ private:
     std::vector<uint8_t> distance_;
     void computeDistances();
     std::vector<uint32_t> items_;
-    std::vector<PacketGroup> groups_;  // the packet groups of the cells
+    // Packets and packet groups, 16-byte blocks; a group is followed by its packets so that
+    // one cell's data lies together in memory. Item codes of both kinds hold block offsets.
+    struct alignas(16) Block {
+        float f[4];
+    };
+    std::vector<Block> blob_;
+    const PacketGroup *groupAt(uint32_t offset) const {
+        return reinterpret_cast<const PacketGroup *>(blob_.data() + offset);
+    }
+    const IntersectSSETriangle *packetAt(uint32_t offset) const {
+        return reinterpret_cast<const IntersectSSETriangle *>(blob_.data() + offset);
+    }
+    static constexpr uint32_t kGroupBlocks = sizeof(PacketGroup) / 16;
+    static constexpr uint32_t kPacketBlocks = sizeof(IntersectSSETriangle) / 16;
     std::vector<std::unique_ptr<Grid>> children_;
     GridStats stats_;
     // Build-time lists, released by finalize.
