@@ -5,9 +5,11 @@
 #include <charconv>
 #include <cmath>
 #include <cstdio>
+#include <cstring>
 #include <filesystem>
 
 #include "core/message.h"
+#include "platform/file_system.h"
 #include "tools/scene_xml_writer.h"
 #include "tools/shape_file.h"
 
@@ -241,6 +243,9 @@ std::vector<std::string> describeModel(const ImportedModel &model) {
             {"emissive", &m.emissive}, {"specular", &m.specular}, {"reflection", &m.reflection},
             {"normal", &m.normal}};
         for (const auto &[name, ch] : channels) {
+            if (ch->embeddedImage >= 0 && size_t(ch->embeddedImage) < model.images.size())
+                line += format(", %s map %s (stored in the model)", name,
+                               model.images[size_t(ch->embeddedImage)].fileName.c_str());
             if (!ch->fileTexture.empty()) line += format(", %s map %s", name, ch->fileTexture.c_str());
             if (name != std::string("diffuse") && ch->fileTexture.empty() && ch->scale > 0.0f)
                 line += format(", %s (%g, %g, %g)", name, ch->color.r, ch->color.g, ch->color.b);
@@ -339,24 +344,40 @@ int runImport(const ImportCommand &command, const std::function<void(float)> &pr
     for (const ImportedShape &s : model.shapes)
         targets.emplace_back((dir / (s.name + ".vtm")).string(), &s);
     const std::string scenePath = (dir / sceneName).string();
+    const fs::path textureDir = dir / "textures";
+    std::vector<std::string> imagePaths;
+    for (const ImportedImage &image : model.images)
+        imagePaths.push_back((textureDir / image.fileName).string());
     if (!command.force) {
-        for (const auto &[path, shape] : targets)
+        std::vector<std::string> all = imagePaths;
+        for (const auto &[path, shape] : targets) all.push_back(path);
+        all.push_back(scenePath);
+        for (const std::string &path : all)
             if (fs::exists(path, ec)) {
                 message(kMsgError, 6, "Refusing to overwrite %s (use --force)", path.c_str());
                 return kImportWouldOverwrite;
             }
-        if (fs::exists(scenePath, ec)) {
-            message(kMsgError, 6, "Refusing to overwrite %s (use --force)", scenePath.c_str());
-            return kImportWouldOverwrite;
-        }
     }
-    fs::create_directories(dir, ec);
-    if (!fs::is_directory(dir, ec)) {
+    fs::create_directories(model.images.empty() ? dir : textureDir, ec);
+    if (!fs::is_directory(dir, ec) || (!model.images.empty() && !fs::is_directory(textureDir, ec))) {
         message(kMsgError, 6, "Cannot create output directory %s", command.outputDir.c_str());
         return kImportFailed;
     }
     for (const auto &[path, shape] : targets)
         if (!writeShapeFile(path, *shape)) return kImportFailed;
+    // Images stored in the model become files; the materials name them by absolute path.
+    for (size_t i = 0; i < model.images.size(); ++i)
+        if (!writeFileAtomically(imagePaths[i], model.images[i].bytes)) {
+            message(kMsgError, 6, "Cannot write texture %s: %s", imagePaths[i].c_str(),
+                    std::strerror(errno));
+            return kImportFailed;
+        }
+    for (ImportedMaterial &m : model.materials)
+        for (ImportedChannel *ch : {&m.diffuse, &m.ambient, &m.transparency, &m.emissive,
+                                    &m.specular, &m.reflection, &m.normal})
+            if (ch->embeddedImage >= 0 && size_t(ch->embeddedImage) < imagePaths.size())
+                ch->fileTexture =
+                    fs::absolute(imagePaths[size_t(ch->embeddedImage)], ec).lexically_normal().string();
     if (!writeSceneXml(scenePath, model)) return kImportFailed;
     size_t triangles = 0;
     for (const ImportedShape &s : model.shapes) triangles += s.triangleCount();

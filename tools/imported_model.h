@@ -42,6 +42,15 @@ struct ImportedChannel {
     std::string fileTexture;
     bool useVertexColor = false;
     std::string uvLayerOverride;
+    /// Index into ImportedModel::images when the texture is stored inside the model, else -1;
+    /// fileTexture is then set when the image is written.
+    int embeddedImage = -1;
+};
+
+/// A texture stored inside the model file; it is written beside the scene as its own file.
+struct ImportedImage {
+    std::string fileName;  ///< name in the output's "textures" folder
+    std::string bytes;     ///< the file's contents (as stored, or a TGA for raw texels)
 };
 
 /// A material in the scene file's terms; the channels keep the scene's order.
@@ -100,6 +109,7 @@ struct ImportedModel {
     std::vector<ImportedInstance> instances;
     std::vector<ImportedCamera> cameras;
     std::vector<ImportedLight> lights;
+    std::vector<ImportedImage> images;
 };
 
 /// Fills the tangent and bitangent of every vertex whose tangent is zero: from UV set 0 where

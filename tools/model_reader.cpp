@@ -251,6 +251,7 @@ public:
     }
 
     bool walk(ImportedModel &model) {
+        model_ = &model;
         materialIndex_.assign(scene_.mNumMaterials, -1);
         if (scene_.mRootNode) walkNode(*scene_.mRootNode, Mtx4(), model);
         for (unsigned i = 0; i < scene_.mNumCameras; ++i) addCamera(*scene_.mCameras[i], model);
@@ -418,9 +419,17 @@ private:
         if (mat.GetTexture(type, 0, &file, nullptr, &uvIndex) != AI_SUCCESS) return false;
         std::string name = file.C_Str();
         if (name.empty()) return false;
-        if (name[0] == '*' || scene_.GetEmbeddedTexture(file.C_Str())) {
-            ++stats_.embeddedTextures;
-            message(kMsgWarning, 6, "Texture %s is stored inside the model and is not carried over",
+        if (const aiTexture *embedded = scene_.GetEmbeddedTexture(file.C_Str())) {
+            channel.embeddedImage = embeddedImage(*embedded, name);
+            if (channel.embeddedImage < 0) return false;
+            if (uvIndex > 0) channel.uvLayerOverride = "uv" + std::to_string(uvIndex);
+            channel.scale = 1.0f;
+            channel.color = Color::white();
+            return true;
+        }
+        if (name[0] == '*') {
+            ++stats_.missingTextures;
+            message(kMsgWarning, 6, "Texture %s refers to an image the model does not hold",
                     name.c_str());
             return false;
         }
@@ -446,6 +455,47 @@ private:
         channel.scale = 1.0f;
         channel.color = Color::white();
         return true;
+    }
+
+    // Keeps an image stored inside the model for writing: compressed images as they are, raw
+    // texels as an uncompressed 32-bit TGA. Returns its index, or -1 when it cannot be used.
+    int embeddedImage(const aiTexture &texture, const std::string &reference) {
+        auto known = imageOf_.find(&texture);
+        if (known != imageOf_.end()) return known->second;
+        ImportedImage image;
+        std::string ext;
+        if (texture.mHeight == 0) {
+            if (!texture.pcData || texture.mWidth == 0) return -1;
+            image.bytes.assign(reinterpret_cast<const char *>(texture.pcData), texture.mWidth);
+            ext = sanitizeName(std::string(texture.achFormatHint,
+                                           strnlen(texture.achFormatHint, HINTMAXTEXTURELEN)),
+                               "bin");
+        } else {
+            if (!texture.pcData || texture.mWidth > 65535 || texture.mHeight > 65535) {
+                ++stats_.missingTextures;
+                message(kMsgWarning, 6, "Embedded texture %s is too large, skipping it",
+                        reference.c_str());
+                return -1;
+            }
+            const uint16_t w = uint16_t(texture.mWidth), h = uint16_t(texture.mHeight);
+            const unsigned char header[18] = {0, 0, 2, 0, 0, 0, 0, 0, 0, 0, 0, 0,
+                                              uint8_t(w & 0xff), uint8_t(w >> 8),
+                                              uint8_t(h & 0xff), uint8_t(h >> 8), 32, 0x28};
+            image.bytes.assign(reinterpret_cast<const char *>(header), sizeof header);
+            // The texels are blue, green, red, alpha from the top row down, as the header says.
+            image.bytes.append(reinterpret_cast<const char *>(texture.pcData),
+                               size_t(w) * h * sizeof(aiTexel));
+            ext = "tga";
+        }
+        std::string base = texture.mFilename.length
+                               ? fs::path(texture.mFilename.C_Str()).stem().string()
+                               : stem_ + "_texture" + std::to_string(model_->images.size());
+        image.fileName = uniqueName(sanitizeName(base, "texture") + "." + ext, imageNames_);
+        ++stats_.embeddedTextures;
+        int index = int(model_->images.size());
+        model_->images.push_back(std::move(image));
+        imageOf_.emplace(&texture, index);
+        return index;
     }
 
     ImportedMaterial convertMaterial(const aiMaterial &mat, bool vertexColors) {
@@ -597,6 +647,9 @@ private:
     fs::path modelDir_;
     std::string stem_;
     bool gltf_ = false;
+    ImportedModel *model_ = nullptr;
+    std::map<const aiTexture *, int> imageOf_;
+    std::unordered_set<std::string> imageNames_;
     Mtx4 convert_, convertInverse_, convertLinear_, normalMatrix_;
     bool mirror_ = false;
     std::map<std::vector<unsigned>, size_t> shapeOf_;

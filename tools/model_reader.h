@@ -39,7 +39,7 @@ struct ImportStats {
     uint64_t emptyMeshes = 0;         ///< meshes with no triangle left
     uint64_t missingTextures = 0;     ///< texture files that were not found
     uint64_t unsupportedLights = 0;   ///< lights of a kind the scene cannot show
-    uint64_t embeddedTextures = 0;    ///< textures stored inside the model (not carried over)
+    uint64_t embeddedTextures = 0;    ///< images stored inside the model (written as files)
 };
 
 /// The row-vector matrix that takes model coordinates to scene coordinates under the options.

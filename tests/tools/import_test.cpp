@@ -317,6 +317,29 @@ TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
     EXPECT_EQ(model.materials[0].emissive.scale, 1.0f);
 }
 
+// An image stored inside the model is written beside the scene, byte for byte, and the material
+// names that file.
+TEST_F(ImportTest, EmbeddedImagesBecomeFiles) {
+    std::string gltf = gltfQuad();
+    // "\x89PNG-ish" in base64.
+    const std::string uri = "\"uri\":\"tiles.png\"";
+    gltf.replace(gltf.find(uri), uri.size(), "\"uri\":\"data:image/png;base64,iVBORy1pc2g=\"");
+    writeText(path("packed.gltf"), gltf);
+    RunResult r = runImport(path("packed.gltf") + " -o " + path("out"));
+    ASSERT_EQ(r.status, 0) << r.output;
+    const fs::path image = fs::path(path("out")) / "textures" / "packed_texture0.png";
+    EXPECT_EQ(readBytes(image), "\x89PNG-ish");
+    EXPECT_NE(readBytes(path("out/packed.xml"))
+                  .find("<FileTexture>" + fs::canonical(image).string() + "</FileTexture>"),
+              std::string::npos);
+    // The image is an output like the others: kept unless --force.
+    fs::remove(path("out/packed.xml"));
+    fs::remove(path("out/Quad.vtm"));
+    r = runImport(path("packed.gltf") + " -o " + path("out"));
+    EXPECT_EQ(r.status, ox::kImportWouldOverwrite) << r.output;
+    EXPECT_FALSE(fs::exists(path("out/packed.xml")));
+}
+
 // Vertex colours of a PLY scan give a version 2 file and a material that uses them.
 TEST_F(ImportTest, PlyVertexColours) {
     writeText(path("scan.ply"),
