@@ -1,5 +1,6 @@
 #include "tools/import_command.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdarg>
 #include <charconv>
@@ -204,9 +205,15 @@ bool addLightmapUVs(ImportedModel &model, const LightmapOptions &options) {
             message(kMsgError, 6, "Light-map UVs for shape %s failed", shape.name.c_str());
             return false;
         }
-        if (shape.uvSets.empty()) appendCornerUVSet(shape, "uv0", layout.cornerUVs);
+        const bool hadNoUVs = shape.uvSets.empty();
+        if (hadNoUVs) appendCornerUVSet(shape, "uv0", layout.cornerUVs);
         std::unordered_set<std::string> names(shape.uvSetNames.begin(), shape.uvSetNames.end());
         appendCornerUVSet(shape, uniqueName("lightmap", names), layout.cornerUVs);
+        if (hadNoUVs) {
+            // The tangent frames follow the new first set instead of an arbitrary direction.
+            std::fill(shape.tangents.begin(), shape.tangents.end(), Vec3());
+            completeTangentFrames(shape);
+        }
         message(kMsgInfo, 6,
                 "Light-map UVs for %s: %u charts, %.1f%% of the square covered, largest stretch "
                 "%.3f, %.4g texels per unit",

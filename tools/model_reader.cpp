@@ -35,9 +35,10 @@ std::string lowerExtension(const std::string &path) {
 
 // ---------------------------------------------------------------------------------------------
 // OBJ face filter. The OBJ reader of the library refuses a whole file for one face that names a
-// vertex that does not exist; such faces are taken out of the text before it is read.
+// vertex that does not exist (or that carries a comment); such faces are taken out (and such
+// comments cut off) before the text is read.
 
-// Parses one index of a face corner ("3", "-1", "3/2/1": the position part and, when present,
+// Parses one corner of a face ("3", "-1", "3/2/1": the position part and, when present,
 // the texture and normal parts). Returns false when any part is out of range.
 bool objCornerInRange(std::string_view corner, const uint64_t counts[3]) {
     for (int part = 0; part < 3 && !corner.empty(); ++part) {
@@ -61,8 +62,10 @@ bool objCornerInRange(std::string_view corner, const uint64_t counts[3]) {
     return true;
 }
 
-// Returns the number of faces removed; when it is not zero, filtered holds the cleaned text.
-uint64_t filterObjFaces(const std::string &text, std::string &filtered) {
+// Takes out faces with corners out of range (counted in dropped) and comments after face
+// corners, which the library's reader refuses too. Returns true when the text changed; filtered
+// then holds the new text.
+bool filterObjFaces(const std::string &text, std::string &filtered, uint64_t &dropped) {
     // Indices may refer to vertices defined later in the file, so the totals count.
     uint64_t totals[3] = {0, 0, 0};
     auto forEachLine = [&](auto &&fn) {
@@ -70,7 +73,7 @@ uint64_t filterObjFaces(const std::string &text, std::string &filtered) {
         while (pos < text.size()) {
             size_t end = text.find('\n', pos);
             if (end == std::string::npos) end = text.size();
-            fn(std::string_view(text).substr(pos, end - pos), pos, end);
+            fn(std::string_view(text).substr(pos, end - pos), pos);
             pos = end + 1;
         }
     };
@@ -80,22 +83,25 @@ uint64_t filterObjFaces(const std::string &text, std::string &filtered) {
         size_t b = line.find_first_of(" \t\r", a);
         return line.substr(a, b == std::string_view::npos ? line.size() - a : b - a);
     };
-    forEachLine([&](std::string_view line, size_t, size_t) {
+    forEachLine([&](std::string_view line, size_t) {
         std::string_view k = keyword(line);
         if (k == "v") ++totals[0];
         else if (k == "vt") ++totals[1];
         else if (k == "vn") ++totals[2];
     });
-    uint64_t dropped = 0;
+    dropped = 0;
     uint64_t seen[3] = {0, 0, 0};
-    std::vector<std::pair<size_t, size_t>> cut;
-    forEachLine([&](std::string_view line, size_t begin, size_t end) {
+    std::vector<std::pair<size_t, size_t>> cut;  // byte ranges to take out
+    forEachLine([&](std::string_view line, size_t begin) {
         std::string_view k = keyword(line);
         if (k == "v") ++seen[0];
         else if (k == "vt") ++seen[1];
         else if (k == "vn") ++seen[2];
         if (k != "f" && k != "l" && k != "p") return;
-        std::string_view rest = line.substr(line.find(k) + k.size());
+        const size_t restAt = line.find(k) + k.size();
+        std::string_view rest = line.substr(restAt);
+        const size_t comment = rest.find('#');
+        rest = rest.substr(0, comment);
         bool ok = true;
         size_t pos = 0;
         while (ok) {
@@ -113,21 +119,24 @@ uint64_t filterObjFaces(const std::string &text, std::string &filtered) {
             if (stop == std::string_view::npos) break;
             pos = stop;
         }
+        // The line break stays, so line numbers in later messages stay right.
         if (!ok) {
             ++dropped;
-            cut.emplace_back(begin, end);
+            cut.emplace_back(begin, begin + line.size());
+        } else if (comment != std::string_view::npos) {
+            cut.emplace_back(begin + restAt + comment, begin + line.size());
         }
     });
-    if (dropped == 0) return 0;
+    if (cut.empty()) return false;
     filtered.clear();
     filtered.reserve(text.size());
     size_t from = 0;
     for (auto [b, e] : cut) {
         filtered.append(text, from, b - from);
-        from = e;  // keeps the line break, so line numbers in later messages stay right
+        from = e;
     }
     filtered.append(text, from, std::string::npos);
-    return dropped;
+    return true;
 }
 
 // Serves one file from memory and every other (materials, textures) from the disk.
@@ -773,8 +782,8 @@ bool readModel(const std::string &path, const ImportOptions &options, ImportedMo
                 while ((n = std::fread(buffer, 1, sizeof buffer, f)) > 0) text.append(buffer, n);
                 std::fclose(f);
             }
-            uint64_t dropped = filterObjFaces(text, filtered);
-            if (dropped > 0) {
+            uint64_t dropped = 0;
+            if (filterObjFaces(text, filtered, dropped)) {
                 stats.badIndexFaces += dropped;
                 importer.SetIOHandler(new FilteredIOSystem(path, std::move(filtered)));
             }

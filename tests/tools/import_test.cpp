@@ -370,7 +370,7 @@ TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
               "f 1 -9 2\n"     // relative index out of range
               "f 1 2 5\n"      // NaN corner
               "l 1 3\n"        // a line
-              "f 2 3 4\n");
+              "f 2 3 4 # a comment, which the reader would refuse\n");
     RunResult r = runImport(path("bad.obj") + " --list");
     ASSERT_EQ(r.status, 0) << r.output;
     EXPECT_NE(r.output.find("Dropped 2 faces with vertex indices out of range"), std::string::npos)
