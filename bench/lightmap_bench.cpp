@@ -14,7 +14,8 @@ void sphere(int stacks, int slices, std::vector<ox::Vec3> &p, std::vector<uint32
     for (int i = 0; i <= stacks; ++i)
         for (int j = 0; j <= slices; ++j) {
             float th = pi * float(i) / float(stacks), ph = 2 * pi * float(j) / float(slices);
-            p.push_back(ox::Vec3(std::sin(th) * std::cos(ph), std::cos(th), std::sin(th) * std::sin(ph)));
+            p.push_back(
+                ox::Vec3(std::sin(th) * std::cos(ph), std::cos(th), std::sin(th) * std::sin(ph)));
         }
     for (int i = 0; i < stacks; ++i)
         for (int j = 0; j < slices; ++j) {

@@ -2,9 +2,9 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdarg>
 #include <charconv>
 #include <cmath>
+#include <cstdarg>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
@@ -109,9 +109,12 @@ bool parseImportCommand(const std::vector<std::string> &args, ImportCommand &com
             }
         } else if (a == "--up") {
             if (!value(v)) return false;
-            if (v == "y" || v == "Y") c.options.upAxis = UpAxis::kY;
-            else if (v == "z" || v == "Z") c.options.upAxis = UpAxis::kZ;
-            else if (v == "x" || v == "X") c.options.upAxis = UpAxis::kX;
+            if (v == "y" || v == "Y")
+                c.options.upAxis = UpAxis::kY;
+            else if (v == "z" || v == "Z")
+                c.options.upAxis = UpAxis::kZ;
+            else if (v == "x" || v == "X")
+                c.options.upAxis = UpAxis::kX;
             else {
                 message(kMsgError, 6, "Up axis must be x, y or z, not %s", v.c_str());
                 return false;
@@ -129,7 +132,8 @@ bool parseImportCommand(const std::vector<std::string> &args, ImportCommand &com
             if (!value(v)) return false;
             float deg;
             if (!parseFloat(v, deg) || deg < 0.0f || deg > 180.0f) {
-                message(kMsgError, 6, "Smoothing angle must be 0 to 180 degrees, not %s", v.c_str());
+                message(kMsgError, 6, "Smoothing angle must be 0 to 180 degrees, not %s",
+                        v.c_str());
                 return false;
             }
             c.options.smoothingAngleDegrees = deg;
@@ -137,8 +141,7 @@ bool parseImportCommand(const std::vector<std::string> &args, ImportCommand &com
             if (!value(v)) return false;
             if (!parseInt(v, c.lightmapResolution) || c.lightmapResolution < 8 ||
                 c.lightmapResolution > 65536) {
-                message(kMsgError, 6, "Light-map resolution must be 8 to 65536, not %s",
-                        v.c_str());
+                message(kMsgError, 6, "Light-map resolution must be 8 to 65536, not %s", v.c_str());
                 return false;
             }
         } else if (a == "--lightmap-padding") {
@@ -233,13 +236,13 @@ std::vector<std::string> describeModel(const ImportedModel &model) {
         BBox b = s.bounds();
         std::string sets;
         for (const std::string &n : s.uvSetNames) sets += (sets.empty() ? "" : ", ") + n;
-        lines.push_back(format("  %s: %zu vertices, %zu triangles, UV sets [%s]%s",
-                               s.name.c_str(), s.positions.size(), s.triangleCount(),
-                               sets.c_str(), s.hasColors() ? ", vertex colours" : ""));
+        lines.push_back(format("  %s: %zu vertices, %zu triangles, UV sets [%s]%s", s.name.c_str(),
+                               s.positions.size(), s.triangleCount(), sets.c_str(),
+                               s.hasColors() ? ", vertex colours" : ""));
         lines.push_back("    box " + formatVec(b.min) + " - " + formatVec(b.max));
         for (const ImportedGroup &g : s.groups)
-            lines.push_back(format("    material %s: %zu triangles", g.material.c_str(),
-                                   g.indices.size() / 3));
+            lines.push_back(
+                format("    material %s: %zu triangles", g.material.c_str(), g.indices.size() / 3));
     }
     lines.push_back(format("Materials: %zu", model.materials.size()));
     for (const ImportedMaterial &m : model.materials) {
@@ -253,7 +256,8 @@ std::vector<std::string> describeModel(const ImportedModel &model) {
             if (ch->embeddedImage >= 0 && size_t(ch->embeddedImage) < model.images.size())
                 line += format(", %s map %s (stored in the model)", name,
                                model.images[size_t(ch->embeddedImage)].fileName.c_str());
-            if (!ch->fileTexture.empty()) line += format(", %s map %s", name, ch->fileTexture.c_str());
+            if (!ch->fileTexture.empty())
+                line += format(", %s map %s", name, ch->fileTexture.c_str());
             if (name != std::string("diffuse") && ch->fileTexture.empty() && ch->scale > 0.0f)
                 line += format(", %s (%g, %g, %g)", name, ch->color.r, ch->color.g, ch->color.b);
         }
@@ -269,27 +273,27 @@ std::vector<std::string> describeModel(const ImportedModel &model) {
             if (s.name == in.shape) {
                 BBox b = s.bounds();
                 for (int k = 0; k < 8 && !b.isEmpty(); ++k)
-                    all.extend(m.transformPoint(Vec3(k & 1 ? b.max.x : b.min.x,
-                                                     k & 2 ? b.max.y : b.min.y,
-                                                     k & 4 ? b.max.z : b.min.z)));
+                    all.extend(
+                        m.transformPoint(Vec3(k & 1 ? b.max.x : b.min.x, k & 2 ? b.max.y : b.min.y,
+                                              k & 4 ? b.max.z : b.min.z)));
             }
     }
     lines.push_back(format("Cameras: %zu", model.cameras.size()));
     for (const ImportedCamera &c : model.cameras) {
         const Mtx4 &m = c.objectToWorld;
-        lines.push_back(format("  %s: %s at (%g, %g, %g) looking along (%g, %g, %g)",
-                               c.name.c_str(),
-                               c.type == ImportedCameraType::kOrtho ? "orthographic" : "perspective",
-                               m.m[3][0], m.m[3][1], m.m[3][2], -m.m[2][0], -m.m[2][1], -m.m[2][2]));
+        lines.push_back(
+            format("  %s: %s at (%g, %g, %g) looking along (%g, %g, %g)", c.name.c_str(),
+                   c.type == ImportedCameraType::kOrtho ? "orthographic" : "perspective", m.m[3][0],
+                   m.m[3][1], m.m[3][2], -m.m[2][0], -m.m[2][1], -m.m[2][2]));
     }
-    static const char *kLightNames[] = {"point", "directional", "spot", "area", "window",
-                                        "environment"};
+    static const char *kLightNames[] = {"point", "directional", "spot",
+                                        "area",  "window",      "environment"};
     lines.push_back(format("Lights: %zu", model.lights.size()));
     for (const ImportedLight &l : model.lights) {
         const Mtx4 &m = l.objectToWorld;
         lines.push_back(format("  %s: %s, colour (%g, %g, %g) at (%g, %g, %g)", l.name.c_str(),
-                               kLightNames[int(l.type)], l.color.r, l.color.g, l.color.b,
-                               m.m[3][0], m.m[3][1], m.m[3][2]));
+                               kLightNames[int(l.type)], l.color.r, l.color.g, l.color.b, m.m[3][0],
+                               m.m[3][1], m.m[3][2]));
     }
     if (!all.isEmpty())
         lines.push_back("Scene box " + formatVec(all.min) + " - " + formatVec(all.max));
@@ -306,7 +310,8 @@ void reportStats(const ImportStats &s) {
         message(kMsgWarning, 6, "Dropped %llu faces with NaN or infinite positions",
                 (unsigned long long)s.nonFiniteFaces);
     if (s.pointsAndLines)
-        message(kMsgWarning, 6, "Dropped %llu points and lines", (unsigned long long)s.pointsAndLines);
+        message(kMsgWarning, 6, "Dropped %llu points and lines",
+                (unsigned long long)s.pointsAndLines);
     if (s.polygonsTriangulated)
         message(kMsgWarning, 6, "Triangulated %llu polygons of more than three corners",
                 (unsigned long long)s.polygonsTriangulated);
@@ -366,7 +371,8 @@ int runImport(const ImportCommand &command, const std::function<void(float)> &pr
             }
     }
     fs::create_directories(model.images.empty() ? dir : textureDir, ec);
-    if (!fs::is_directory(dir, ec) || (!model.images.empty() && !fs::is_directory(textureDir, ec))) {
+    if (!fs::is_directory(dir, ec) ||
+        (!model.images.empty() && !fs::is_directory(textureDir, ec))) {
         message(kMsgError, 6, "Cannot create output directory %s", command.outputDir.c_str());
         return kImportFailed;
     }
@@ -383,8 +389,9 @@ int runImport(const ImportCommand &command, const std::function<void(float)> &pr
         for (ImportedChannel *ch : {&m.diffuse, &m.ambient, &m.transparency, &m.emissive,
                                     &m.specular, &m.reflection, &m.normal})
             if (ch->embeddedImage >= 0 && size_t(ch->embeddedImage) < imagePaths.size())
-                ch->fileTexture =
-                    fs::absolute(imagePaths[size_t(ch->embeddedImage)], ec).lexically_normal().string();
+                ch->fileTexture = fs::absolute(imagePaths[size_t(ch->embeddedImage)], ec)
+                                      .lexically_normal()
+                                      .string();
     if (!writeSceneXml(scenePath, model)) return kImportFailed;
     size_t triangles = 0;
     for (const ImportedShape &s : model.shapes) triangles += s.triangleCount();

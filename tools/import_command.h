@@ -15,8 +15,8 @@ namespace ox {
 /// Exit statuses of thevorn-import.
 enum ImportExitStatus : int {
     kImportOk = 0,
-    kImportFailed = 1,      ///< the model could not be read or a file could not be written
-    kImportUsage = 2,       ///< the command line was wrong
+    kImportFailed = 1,          ///< the model could not be read or a file could not be written
+    kImportUsage = 2,           ///< the command line was wrong
     kImportWouldOverwrite = 3,  ///< an output file exists and --force was not given
 };
 
@@ -29,7 +29,7 @@ struct ImportCommand {
     bool list = false;
     bool force = false;
     bool quiet = false;
-    int progressMode = 0;  ///< 0 automatic (large files), 1 always, -1 never
+    int progressMode = 0;        ///< 0 automatic (large files), 1 always, -1 never
     int lightmapResolution = 0;  ///< 0 = no light-map UVs are generated
     LightmapOptions lightmap;
 };

@@ -175,8 +175,8 @@ uint32_t buildCharts(const std::vector<Vec3> &positions, const std::vector<uint3
     std::stable_sort(order.begin(), order.end(),
                      [&](uint32_t a, uint32_t b) { return area[a] > area[b]; });
 
-    const float cosLimit = std::cos(std::clamp(maxAngleDegrees, 0.0f, 89.0f) *
-                                    std::numbers::pi_v<float> / 180.0f);
+    const float cosLimit =
+        std::cos(std::clamp(maxAngleDegrees, 0.0f, 89.0f) * std::numbers::pi_v<float> / 180.0f);
     uint32_t charts = 0;
     ChartGrid grid(cell);
     std::vector<uint32_t> queuedFor(triCount, kNone);
@@ -258,7 +258,8 @@ bool packRectangles(std::vector<PackRect> &rects, float texelsPerUnit, int resol
                 covered = sky[k].x + sky[k].width - x;
             }
             if (y + h > limit) continue;
-            if (y + h < bestTop || (y + h == bestTop && x < bestX)) bestTop = y + h, bestX = x, bestSeg = s;
+            if (y + h < bestTop || (y + h == bestTop && x < bestX))
+                bestTop = y + h, bestX = x, bestSeg = s;
         }
         if (bestTop == std::numeric_limits<int64_t>::max()) return false;
         rects[i].x = int32_t(bestX);
@@ -341,8 +342,9 @@ bool generateLightmapLayout(const std::vector<Vec3> &positions,
                 pts.push_back(local[3 * t + k]);
             }
         // Convex hull (monotone chain) for the rotation search.
-        std::sort(pts.begin(), pts.end(),
-                  [](const Vec2 &a, const Vec2 &b) { return a.x < b.x || (a.x == b.x && a.y < b.y); });
+        std::sort(pts.begin(), pts.end(), [](const Vec2 &a, const Vec2 &b) {
+            return a.x < b.x || (a.x == b.x && a.y < b.y);
+        });
         std::vector<Vec2> hull(2 * pts.size() + 1);
         size_t k = 0;
         for (size_t i = 0; i < pts.size(); ++i) {
@@ -364,7 +366,8 @@ bool generateLightmapLayout(const std::vector<Vec3> &positions,
             float x0 = 1e30f, x1 = -1e30f, y0 = 1e30f, y1 = -1e30f;
             for (const Vec2 &p : hull) {
                 float x = p.x * cs + p.y * sn, y = -p.x * sn + p.y * cs;
-                x0 = std::min(x0, x), x1 = std::max(x1, x), y0 = std::min(y0, y), y1 = std::max(y1, y);
+                x0 = std::min(x0, x), x1 = std::max(x1, x), y0 = std::min(y0, y),
+                y1 = std::max(y1, y);
             }
             double rect = double(x1 - x0) * double(y1 - y0);
             if (rect < bestRect) bestRect = rect, bestCos = cs, bestSin = sn;
@@ -374,7 +377,8 @@ bool generateLightmapLayout(const std::vector<Vec3> &positions,
             for (int j = 0; j < 3; ++j) {
                 Vec2 &p = local[3 * t + j];
                 p = Vec2(p.x * bestCos + p.y * bestSin, -p.x * bestSin + p.y * bestCos);
-                x0 = std::min(x0, p.x), x1 = std::max(x1, p.x), y0 = std::min(y0, p.y), y1 = std::max(y1, p.y);
+                x0 = std::min(x0, p.x), x1 = std::max(x1, p.x), y0 = std::min(y0, p.y),
+                y1 = std::max(y1, p.y);
             }
         // Charts lie wider than tall, which suits the skyline packer.
         const bool turn = (y1 - y0) > (x1 - x0);
@@ -399,8 +403,10 @@ bool generateLightmapLayout(const std::vector<Vec3> &positions,
     while (packRectangles(rects, float(hi), res, pad) && hi < 1e30) lo = hi, hi *= 2.0;
     for (int i = 0; i < 40 && hi - lo > lo * 1e-4; ++i) {
         double mid = 0.5 * (lo + hi);
-        if (packRectangles(rects, float(mid), res, pad)) lo = mid;
-        else hi = mid;
+        if (packRectangles(rects, float(mid), res, pad))
+            lo = mid;
+        else
+            hi = mid;
     }
     packRectangles(rects, float(lo), res, pad);
     out.texelsPerUnit = float(lo);
@@ -413,9 +419,8 @@ bool generateLightmapLayout(const std::vector<Vec3> &positions,
         const PackRect &r = rects[out.chartOf[t]];
         for (int k = 0; k < 3; ++k) {
             const Vec2 &p = local[3 * t + k];
-            out.cornerUVs[3 * t + k] =
-                Vec2((float(r.x) + p.x * out.texelsPerUnit) * inv,
-                     (float(r.y) + p.y * out.texelsPerUnit) * inv);
+            out.cornerUVs[3 * t + k] = Vec2((float(r.x) + p.x * out.texelsPerUnit) * inv,
+                                            (float(r.y) + p.y * out.texelsPerUnit) * inv);
         }
         const Vec2 *q = &out.cornerUVs[3 * t];
         covered += 0.5 * std::fabs(cross2(q[0], q[1], q[2]));

@@ -21,10 +21,10 @@ struct LightmapOptions {
 
 /// A generated layout and what it achieved.
 struct LightmapLayout {
-    std::vector<Vec2> cornerUVs;   ///< three per triangle, in triangle order
+    std::vector<Vec2> cornerUVs;    ///< three per triangle, in triangle order
     std::vector<uint32_t> chartOf;  ///< chart index of each triangle
     uint32_t chartCount = 0;
-    double coverage = 0.0;      ///< share of the unit square the triangles cover
+    double coverage = 0.0;        ///< share of the unit square the triangles cover
     float largestStretch = 1.0f;  ///< largest ratio of the two singular values of a triangle's map
     float texelsPerUnit = 0.0f;   ///< texels per scene unit, the same in every chart
 };
@@ -38,8 +38,7 @@ struct PackRect {
 /// Places the rectangles, scaled by texelsPerUnit, into a square of resolution texels so that
 /// blocks of floor(size * scale) + 1 + padding texels do not overlap and leave padding texels at
 /// the lower and left border. Returns false when they do not fit.
-bool packRectangles(std::vector<PackRect> &rects, float texelsPerUnit, int resolution,
-                    int padding);
+bool packRectangles(std::vector<PackRect> &rects, float texelsPerUnit, int resolution, int padding);
 
 /// Splits triangles into charts: connected over shared edges (by position), each triangle
 /// within maxAngleDegrees of the chart's first triangle, with no two triangles of a chart

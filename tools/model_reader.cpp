@@ -2,13 +2,13 @@
 
 #include <assimp/DefaultIOSystem.h>
 #include <assimp/MemoryIOWrapper.h>
-#include <assimp/ProgressHandler.hpp>
 #include <assimp/config.h>
 #include <assimp/postprocess.h>
 #include <assimp/scene.h>
 
 #include <algorithm>
 #include <assimp/Importer.hpp>
+#include <assimp/ProgressHandler.hpp>
 #include <cerrno>
 #include <cmath>
 #include <cstdio>
@@ -85,18 +85,24 @@ bool filterObjFaces(const std::string &text, std::string &filtered, uint64_t &dr
     };
     forEachLine([&](std::string_view line, size_t) {
         std::string_view k = keyword(line);
-        if (k == "v") ++totals[0];
-        else if (k == "vt") ++totals[1];
-        else if (k == "vn") ++totals[2];
+        if (k == "v")
+            ++totals[0];
+        else if (k == "vt")
+            ++totals[1];
+        else if (k == "vn")
+            ++totals[2];
     });
     dropped = 0;
     uint64_t seen[3] = {0, 0, 0};
     std::vector<std::pair<size_t, size_t>> cut;  // byte ranges to take out
     forEachLine([&](std::string_view line, size_t begin) {
         std::string_view k = keyword(line);
-        if (k == "v") ++seen[0];
-        else if (k == "vt") ++seen[1];
-        else if (k == "vn") ++seen[2];
+        if (k == "v")
+            ++seen[0];
+        else if (k == "vt")
+            ++seen[1];
+        else if (k == "vn")
+            ++seen[2];
         if (k != "f" && k != "l" && k != "p") return;
         const size_t restAt = line.find(k) + k.size();
         std::string_view rest = line.substr(restAt);
@@ -108,9 +114,8 @@ bool filterObjFaces(const std::string &text, std::string &filtered, uint64_t &dr
             pos = rest.find_first_not_of(" \t\r", pos);
             if (pos == std::string_view::npos) break;
             size_t stop = rest.find_first_of(" \t\r", pos);
-            std::string_view corner = rest.substr(pos, stop == std::string_view::npos
-                                                            ? std::string_view::npos
-                                                            : stop - pos);
+            std::string_view corner = rest.substr(
+                pos, stop == std::string_view::npos ? std::string_view::npos : stop - pos);
             // Relative indices count back from the vertices defined so far.
             uint64_t limit[3] = {totals[0], totals[1], totals[2]};
             if (corner.find('-') != std::string_view::npos)
@@ -278,8 +283,8 @@ private:
     Vec3 ownPosition(const aiString &name, const aiVector3D &position) const {
         Vec3 p = toVec3(position);
         const aiNode *node = scene_.mRootNode ? scene_.mRootNode->FindNode(name) : nullptr;
-        if (gltf_ && node && p == Vec3(node->mTransformation.a4, node->mTransformation.b4,
-                                       node->mTransformation.c4))
+        if (gltf_ && node &&
+            p == Vec3(node->mTransformation.a4, node->mTransformation.b4, node->mTransformation.c4))
             return Vec3();
         return p;
     }
@@ -308,7 +313,7 @@ private:
             } else {
                 shapeIndex = model.shapes.size();
                 std::string base = node.mName.length ? node.mName.C_Str()
-                                                      : scene_.mMeshes[meshes[0]]->mName.C_Str();
+                                                     : scene_.mMeshes[meshes[0]]->mName.C_Str();
                 model.shapes.push_back(
                     buildShape(uniqueName(prefixed(base, stem_), shapeNames_), meshes, model));
                 shapeOf_.emplace(meshes, shapeIndex);
@@ -385,13 +390,16 @@ private:
                 if (face.mNumIndices != 3) continue;
                 uint32_t i0 = base + face.mIndices[0], i1 = base + face.mIndices[1],
                          i2 = base + face.mIndices[2];
-                group.indices.insert(group.indices.end(), {i0, mirror_ ? i2 : i1, mirror_ ? i1 : i2});
+                group.indices.insert(group.indices.end(),
+                                     {i0, mirror_ ? i2 : i1, mirror_ ? i1 : i2});
             }
             // Meshes of one material are kept in one group.
-            auto same = std::find_if(shape.groups.begin(), shape.groups.end(),
-                                     [&](const ImportedGroup &g) { return g.material == group.material; });
+            auto same =
+                std::find_if(shape.groups.begin(), shape.groups.end(),
+                             [&](const ImportedGroup &g) { return g.material == group.material; });
             if (same != shape.groups.end())
-                same->indices.insert(same->indices.end(), group.indices.begin(), group.indices.end());
+                same->indices.insert(same->indices.end(), group.indices.begin(),
+                                     group.indices.end());
             else
                 shape.groups.push_back(std::move(group));
         }
@@ -487,9 +495,24 @@ private:
                 return -1;
             }
             const uint16_t w = uint16_t(texture.mWidth), h = uint16_t(texture.mHeight);
-            const unsigned char header[18] = {0, 0, 2, 0, 0, 0, 0, 0, 0, 0, 0, 0,
-                                              uint8_t(w & 0xff), uint8_t(w >> 8),
-                                              uint8_t(h & 0xff), uint8_t(h >> 8), 32, 0x28};
+            const unsigned char header[18] = {0,
+                                              0,
+                                              2,
+                                              0,
+                                              0,
+                                              0,
+                                              0,
+                                              0,
+                                              0,
+                                              0,
+                                              0,
+                                              0,
+                                              uint8_t(w & 0xff),
+                                              uint8_t(w >> 8),
+                                              uint8_t(h & 0xff),
+                                              uint8_t(h >> 8),
+                                              32,
+                                              0x28};
             image.bytes.assign(reinterpret_cast<const char *>(header), sizeof header);
             // The texels are blue, green, red, alpha from the top row down, as the header says.
             image.bytes.append(reinterpret_cast<const char *>(texture.pcData),
@@ -532,7 +555,8 @@ private:
         readTexture(mat, aiTextureType_AMBIENT, out.ambient);
 
         float opacity = 1.0f;
-        if (mat.Get(AI_MATKEY_OPACITY, opacity) == AI_SUCCESS && opacity < 1.0f && opacity >= 0.0f) {
+        if (mat.Get(AI_MATKEY_OPACITY, opacity) == AI_SUCCESS && opacity < 1.0f &&
+            opacity >= 0.0f) {
             float t = 1.0f - opacity;
             out.transparency.color = Color(t, t, t, 1.0f);
             out.transparency.scale = 1.0f;
@@ -597,8 +621,10 @@ private:
         ImportedLight out;
         out.name = uniqueName(prefixed(light.mName.C_Str(), "light"), lightNames_);
         out.color = toColor(light.mColorDiffuse);
-        if (light.mAttenuationQuadratic > 0.0f) out.falloffExponent = 2.0f;
-        else if (light.mAttenuationLinear > 0.0f) out.falloffExponent = 1.0f;
+        if (light.mAttenuationQuadratic > 0.0f)
+            out.falloffExponent = 2.0f;
+        else if (light.mAttenuationLinear > 0.0f)
+            out.falloffExponent = 1.0f;
         Vec3 x, y, z;
         switch (light.mType) {
             case aiLightSource_POINT:
@@ -619,7 +645,8 @@ private:
                 out.objectToWorld = rowsMatrix(x, y, z, p);
                 // glTF files give the angle from the axis to the edge; the others the full cone.
                 const float factor = gltf_ ? 2.0f : 1.0f;
-                float inner = light.mAngleInnerCone * factor, outer = light.mAngleOuterCone * factor;
+                float inner = light.mAngleInnerCone * factor,
+                      outer = light.mAngleOuterCone * factor;
                 if (!(outer > 0.0f) || !std::isfinite(outer)) outer = std::numbers::pi_v<float> / 4;
                 if (!(inner >= 0.0f) || inner > outer) inner = outer;
                 const float toDegrees = 180.0f / std::numbers::pi_v<float>;
@@ -691,12 +718,17 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
                 bool bad = false, nonFinite = false;
                 for (unsigned k = 0; k < face.mNumIndices; ++k) {
                     unsigned i = face.mIndices[k];
-                    if (i >= mesh->mNumVertices) bad = true;
-                    else if (!finite[i]) nonFinite = true;
+                    if (i >= mesh->mNumVertices)
+                        bad = true;
+                    else if (!finite[i])
+                        nonFinite = true;
                 }
-                if (bad) ++stats.badIndexFaces, drop = true;
-                else if (nonFinite) ++stats.nonFiniteFaces, drop = true;
-                else if (face.mNumIndices > 3) ++stats.polygonsTriangulated;
+                if (bad)
+                    ++stats.badIndexFaces, drop = true;
+                else if (nonFinite)
+                    ++stats.nonFiniteFaces, drop = true;
+                else if (face.mNumIndices > 3)
+                    ++stats.polygonsTriangulated;
             }
             if (drop) continue;
             // Swapping keeps every index array owned by exactly one face of the array.
@@ -733,7 +765,8 @@ Mtx4 conversionMatrix(const ImportOptions &options) {
     }
     Mtx4 mirror;
     if (options.flipHandedness) mirror.m[2][2] = -1.0f;
-    return mirror * axes * Mtx4::scale(Vec3(options.unitScale, options.unitScale, options.unitScale));
+    return mirror * axes *
+           Mtx4::scale(Vec3(options.unitScale, options.unitScale, options.unitScale));
 }
 
 std::string sanitizeName(const std::string &name, const std::string &fallback) {

@@ -32,14 +32,14 @@ struct ImportOptions {
 
 /// What was repaired or dropped while reading; the counts go into warnings.
 struct ImportStats {
-    uint64_t badIndexFaces = 0;       ///< faces that named a vertex that does not exist
-    uint64_t nonFiniteFaces = 0;      ///< faces with a NaN or infinite corner
+    uint64_t badIndexFaces = 0;         ///< faces that named a vertex that does not exist
+    uint64_t nonFiniteFaces = 0;        ///< faces with a NaN or infinite corner
     uint64_t polygonsTriangulated = 0;  ///< faces of more than three corners
-    uint64_t pointsAndLines = 0;      ///< faces of one or two corners (dropped)
-    uint64_t emptyMeshes = 0;         ///< meshes with no triangle left
-    uint64_t missingTextures = 0;     ///< texture files that were not found
-    uint64_t unsupportedLights = 0;   ///< lights of a kind the scene cannot show
-    uint64_t embeddedTextures = 0;    ///< images stored inside the model (written as files)
+    uint64_t pointsAndLines = 0;        ///< faces of one or two corners (dropped)
+    uint64_t emptyMeshes = 0;           ///< meshes with no triangle left
+    uint64_t missingTextures = 0;       ///< texture files that were not found
+    uint64_t unsupportedLights = 0;     ///< lights of a kind the scene cannot show
+    uint64_t embeddedTextures = 0;      ///< images stored inside the model (written as files)
 };
 
 /// The row-vector matrix that takes model coordinates to scene coordinates under the options.

@@ -80,9 +80,9 @@ void writeMaterial(SceneWriter &w, const ImportedMaterial &m) {
     w.begin("Material");
     w.text("Name", m.name);
     w.boolean("Twosided", m.twosided);
-    for (const char *key : {"PrimaryGIIntensity", "PrimaryGISaturation", "SecondaryGIIntensity",
-                            "SecondaryGISaturation", "DiffuseGIBoost", "EmissiveGIScale",
-                            "SpecularGIScale"})
+    for (const char *key :
+         {"PrimaryGIIntensity", "PrimaryGISaturation", "SecondaryGIIntensity",
+          "SecondaryGISaturation", "DiffuseGIBoost", "EmissiveGIScale", "SpecularGIScale"})
         w.number(key, 1.0);
     w.boolean("DiffuseAlphaAsTransparency", false);
     w.number("Shininess", m.shininess);
@@ -105,14 +105,26 @@ void writeInstance(SceneWriter &w, const ImportedInstance &in) {
     w.emptyList("LightLinkedLights");
     w.emptyList("MaterialOverrides");
     w.begin("RenderStats");
-    const std::pair<const char *, bool> stats[] = {
-        {"PrimaryVisibility", true}, {"CastShadows", true},      {"ReceiveShadows", true},
-        {"SelfOcclusion", true},     {"MotionBlur", true},       {"SmoothShading", true},
-        {"VisibleInReflections", true}, {"VisibleInRefractions", true}, {"VisibleInFG", true},
-        {"DoubleSided", true},       {"Opposite", false},        {"CastGI", true},
-        {"ReceiveGI", true},         {"StaticGI", false},        {"SmoothGI", true},
-        {"CastOcclusion", true},     {"ReceiveOcclusion", true}, {"Envelop", false},
-        {"IsImagePlane", false},     {"ShadowBias", false}};
+    const std::pair<const char *, bool> stats[] = {{"PrimaryVisibility", true},
+                                                   {"CastShadows", true},
+                                                   {"ReceiveShadows", true},
+                                                   {"SelfOcclusion", true},
+                                                   {"MotionBlur", true},
+                                                   {"SmoothShading", true},
+                                                   {"VisibleInReflections", true},
+                                                   {"VisibleInRefractions", true},
+                                                   {"VisibleInFG", true},
+                                                   {"DoubleSided", true},
+                                                   {"Opposite", false},
+                                                   {"CastGI", true},
+                                                   {"ReceiveGI", true},
+                                                   {"StaticGI", false},
+                                                   {"SmoothGI", true},
+                                                   {"CastOcclusion", true},
+                                                   {"ReceiveOcclusion", true},
+                                                   {"Envelop", false},
+                                                   {"IsImagePlane", false},
+                                                   {"ShadowBias", false}};
     for (const auto &[key, value] : stats) w.boolean(key, value);
     w.end();
     w.begin("VertexBakeSamplingOptions");

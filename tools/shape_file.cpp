@@ -36,8 +36,8 @@ bool writeShapeFile(const std::string &path, const ImportedShape &shape) {
     mesh.vertices.reserve(order.size() * floats);
     mesh.uvs.reserve(order.size() * shape.uvSets.size() * 2);
     for (uint32_t i : order) {
-        for (const Vec3 *v : {&shape.positions[i], &shape.normals[i], &shape.tangents[i],
-                              &shape.bitangents[i]})
+        for (const Vec3 *v :
+             {&shape.positions[i], &shape.normals[i], &shape.tangents[i], &shape.bitangents[i]})
             mesh.vertices.insert(mesh.vertices.end(), {v->x, v->y, v->z});
         if (mesh.colors) {
             const Color &c = shape.colors[i];

@@ -5,11 +5,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <assimp/Importer.hpp>
 #include <cmath>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
-#include <assimp/Importer.hpp>
 #include <fstream>
 #include <map>
 #include <sstream>
@@ -62,7 +62,8 @@ void writeText(const fs::path &p, const std::string &text) {
 
 size_t countOf(const std::string &text, const std::string &what) {
     size_t n = 0;
-    for (size_t pos = text.find(what); pos != std::string::npos; pos = text.find(what, pos + 1)) ++n;
+    for (size_t pos = text.find(what); pos != std::string::npos; pos = text.find(what, pos + 1))
+        ++n;
     return n;
 }
 
@@ -284,14 +285,15 @@ TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
 
     std::string xml = readBytes(path("out/quad.xml"));
     EXPECT_NE(xml.find("<Name>lvl_Tiles</Name>"), std::string::npos);
-    EXPECT_NE(xml.find("<FileTexture>" + fs::canonical(path("tiles.png")).string() +
-                       "</FileTexture>"),
-              std::string::npos)
+    EXPECT_NE(
+        xml.find("<FileTexture>" + fs::canonical(path("tiles.png")).string() + "</FileTexture>"),
+        std::string::npos)
         << xml;
     EXPECT_NE(xml.find("<UseVertexColor>false</UseVertexColor>"), std::string::npos);
     // Translation (1, 2, 3) in the last row of the instance matrix.
-    EXPECT_NE(xml.find("<r>\n\t\t\t\t<c>1</c>\n\t\t\t\t<c>2</c>\n\t\t\t\t<c>3</c>\n\t\t\t\t<c>1</c>"),
-              std::string::npos);
+    EXPECT_NE(
+        xml.find("<r>\n\t\t\t\t<c>1</c>\n\t\t\t\t<c>2</c>\n\t\t\t\t<c>3</c>\n\t\t\t\t<c>1</c>"),
+        std::string::npos);
     EXPECT_NE(xml.find("<Name>lvl_Cam</Name>"), std::string::npos);
     EXPECT_NE(xml.find("<Type>SPOT</Type>"), std::string::npos);
 
@@ -365,11 +367,11 @@ TEST_F(ImportTest, PlyVertexColours) {
 TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
     writeText(path("bad.obj"),
               "v 0 0 0\nv 1 0 0\nv 1 1 0\nv 0 1 0\nv nan 0 1\n"
-              "f 1 2 3 4\n"    // a quad: two triangles
-              "f 1 2 9\n"      // index out of range
-              "f 1 -9 2\n"     // relative index out of range
-              "f 1 2 5\n"      // NaN corner
-              "l 1 3\n"        // a line
+              "f 1 2 3 4\n"  // a quad: two triangles
+              "f 1 2 9\n"    // index out of range
+              "f 1 -9 2\n"   // relative index out of range
+              "f 1 2 5\n"    // NaN corner
+              "l 1 3\n"      // a line
               "f 2 3 4 # a comment, which the reader would refuse\n");
     RunResult r = runImport(path("bad.obj") + " --list");
     ASSERT_EQ(r.status, 0) << r.output;
@@ -409,8 +411,9 @@ TEST_F(ImportTest, UnreadableModelGivesOneError) {
 
 // Existing files are kept unless --force is given; a refusal writes nothing at all.
 TEST_F(ImportTest, RefusesToOverwrite) {
-    writeText(path("a.obj"), "o a\nv 0 0 0\nv 1 0 0\nv 0 1 0\nf 1 2 3\no b\nv 0 0 1\nv 1 0 1\n"
-                             "v 0 1 1\nf 4 5 6\n");
+    writeText(path("a.obj"),
+              "o a\nv 0 0 0\nv 1 0 0\nv 0 1 0\nf 1 2 3\no b\nv 0 0 1\nv 1 0 1\n"
+              "v 0 1 1\nf 4 5 6\n");
     ASSERT_EQ(runImport(path("a.obj") + " -o " + path("out")).status, 0);
     writeText(path("out/b.vtm"), "mine");
     const std::string sceneBefore = readBytes(path("out/a.xml"));
@@ -444,9 +447,12 @@ TEST_F(ImportTest, UnitsAxesHandednessAndWelding) {
     ASSERT_EQ(model.shapes.size(), 1u);
     ox::BBox b = model.shapes[0].bounds();
     // z up becomes y up: (x, y, z) -> (x, z, -y), then scaled.
-    EXPECT_NEAR(b.min.x, 0, 1e-6); EXPECT_NEAR(b.max.x, 1, 1e-6);
-    EXPECT_NEAR(b.min.y, 0, 1e-6); EXPECT_NEAR(b.max.y, 3, 1e-6);
-    EXPECT_NEAR(b.min.z, -2, 1e-6); EXPECT_NEAR(b.max.z, 0, 1e-6);
+    EXPECT_NEAR(b.min.x, 0, 1e-6);
+    EXPECT_NEAR(b.max.x, 1, 1e-6);
+    EXPECT_NEAR(b.min.y, 0, 1e-6);
+    EXPECT_NEAR(b.max.y, 3, 1e-6);
+    EXPECT_NEAR(b.min.z, -2, 1e-6);
+    EXPECT_NEAR(b.max.z, 0, 1e-6);
     EXPECT_EQ(model.shapes[0].positions.size(), 4u);
 
     // Mirrored: z is negated and the winding turns, so the face normal and the stored vertex
@@ -487,8 +493,8 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
             libTriangles += mesh->mNumFaces;
             libUvSets = std::max(libUvSets, mesh->GetNumUVChannels());
             for (unsigned v = 0; v < mesh->mNumVertices; ++v)
-                libBox.extend(ox::Vec3(mesh->mVertices[v].x, mesh->mVertices[v].y,
-                                       mesh->mVertices[v].z));
+                libBox.extend(
+                    ox::Vec3(mesh->mVertices[v].x, mesh->mVertices[v].y, mesh->mVertices[v].z));
         }
         const bool lightmap = libUvSets < 2;
 
@@ -527,8 +533,9 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
             ASSERT_TRUE(reader);
             std::unique_ptr<ox::Shape> shape;
             std::string failure;
-            ASSERT_EQ(ox::buildTempShape(*reader, materials, ox::MeshBuildOptions(), shape, failure),
-                      ox::ShapeBuildStatus::kBuilt)
+            ASSERT_EQ(
+                ox::buildTempShape(*reader, materials, ox::MeshBuildOptions(), shape, failure),
+                ox::ShapeBuildStatus::kBuilt)
                 << failure;
             builtTriangles += shape->triangles().size();
             EXPECT_EQ(shape->vertices().uvSetNames(), mesh.uvSetNames);

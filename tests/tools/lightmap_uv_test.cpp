@@ -75,7 +75,8 @@ bool overlap(const Vec2 *a, const Vec2 *b) {
             double a0 = 1e30, a1 = -1e30, b0 = 1e30, b1 = -1e30;
             for (int i = 0; i < 3; ++i) {
                 double da = a[i].x * nx + a[i].y * ny, db = b[i].x * nx + b[i].y * ny;
-                a0 = std::min(a0, da), a1 = std::max(a1, da), b0 = std::min(b0, db), b1 = std::max(b1, db);
+                a0 = std::min(a0, da), a1 = std::max(a1, da), b0 = std::min(b0, db),
+                b1 = std::max(b1, db);
             }
             // Touching within rounding (a millionth of the square) does not count.
             double eps = 1e-6 * std::sqrt(nx * nx + ny * ny);
@@ -91,8 +92,10 @@ void checkLayout(const Mesh &m, const ox::LightmapOptions &o, const ox::Lightmap
     ASSERT_EQ(l.cornerUVs.size(), tris * 3);
     ASSERT_EQ(l.chartOf.size(), tris);
     for (const Vec2 &uv : l.cornerUVs) {
-        EXPECT_GE(uv.x, 0.0f); EXPECT_LE(uv.x, 1.0f);
-        EXPECT_GE(uv.y, 0.0f); EXPECT_LE(uv.y, 1.0f);
+        EXPECT_GE(uv.x, 0.0f);
+        EXPECT_LE(uv.x, 1.0f);
+        EXPECT_GE(uv.y, 0.0f);
+        EXPECT_LE(uv.y, 1.0f);
     }
     for (size_t a = 0; a < tris; ++a)
         for (size_t b = a + 1; b < tris; ++b)
@@ -109,7 +112,8 @@ void checkLayout(const Mesh &m, const ox::LightmapOptions &o, const ox::Lightmap
             r[2] = std::max(r[2], x), r[3] = std::max(r[3], y);
         }
     for (uint32_t a = 0; a < l.chartCount; ++a) {
-        EXPECT_GE(range[a][0], o.padding); EXPECT_GE(range[a][1], o.padding);
+        EXPECT_GE(range[a][0], o.padding);
+        EXPECT_GE(range[a][1], o.padding);
         EXPECT_LT(range[a][2], o.resolution - o.padding + 1);
         for (uint32_t b = a + 1; b < l.chartCount; ++b) {
             const auto &p = range[a], &q = range[b];
@@ -184,7 +188,8 @@ TEST(LightmapUv, DegenerateTrianglesAndTinyResolutions) {
     for (int i = 0; i < 200; ++i) {
         uint32_t b = uint32_t(many.positions.size());
         float x = float(i) * 3.0f;
-        many.positions.insert(many.positions.end(), {Vec3(x, 0, 0), Vec3(x + 1, 0, 0), Vec3(x, 1, 0)});
+        many.positions.insert(many.positions.end(),
+                              {Vec3(x, 0, 0), Vec3(x + 1, 0, 0), Vec3(x, 1, 0)});
         many.triangles.insert(many.triangles.end(), {b, b + 1, b + 2});
     }
     o.resolution = 16;
@@ -215,13 +220,17 @@ TEST(LightmapUv, PackedRectanglesKeepTheirGutters) {
     const float scale = 2.0f;
     ASSERT_TRUE(ox::packRectangles(rects, scale, res, pad));
     for (size_t a = 0; a < rects.size(); ++a) {
-        int w = int(std::floor(rects[a].width * scale)) + 1, h = int(std::floor(rects[a].height * scale)) + 1;
-        EXPECT_GE(rects[a].x, pad); EXPECT_GE(rects[a].y, pad);
-        EXPECT_LE(rects[a].x + w + pad, res); EXPECT_LE(rects[a].y + h + pad, res);
+        int w = int(std::floor(rects[a].width * scale)) + 1,
+            h = int(std::floor(rects[a].height * scale)) + 1;
+        EXPECT_GE(rects[a].x, pad);
+        EXPECT_GE(rects[a].y, pad);
+        EXPECT_LE(rects[a].x + w + pad, res);
+        EXPECT_LE(rects[a].y + h + pad, res);
         for (size_t b = a + 1; b < rects.size(); ++b) {
             int wb = int(std::floor(rects[b].width * scale)) + 1;
             int hb = int(std::floor(rects[b].height * scale)) + 1;
-            bool apart = rects[b].x >= rects[a].x + w + pad || rects[a].x >= rects[b].x + wb + pad ||
+            bool apart = rects[b].x >= rects[a].x + w + pad ||
+                         rects[a].x >= rects[b].x + wb + pad ||
                          rects[b].y >= rects[a].y + h + pad || rects[a].y >= rects[b].y + hb + pad;
             EXPECT_TRUE(apart) << a << " " << b;
         }
