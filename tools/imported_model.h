@@ -90,8 +90,8 @@ enum class ImportedLightType : int {
     kEnvironment = 5
 };
 
-/// A light. Directional lights shine along their local -y axis, spot lights along local -z,
-/// area lights cover the local square from -1 to 1 in x and y and face along local -z.
+/// A light. Directional and spot lights shine along their local -y axis; area lights cover the
+/// local square from -1 to 1 in x and y and shine along local +z.
 struct ImportedLight {
     std::string name;
     ImportedLightType type = ImportedLightType::kPoint;

@@ -632,17 +632,18 @@ private:
                 out.objectToWorld = Mtx4::translation(p);
                 break;
             case aiLightSource_DIRECTIONAL: {
-                // Directional lights shine along local -y: y is the negated direction.
+                // Directional lights shine along local -y: row 1 is the negated direction.
                 out.type = ImportedLightType::kDirectional;
                 out.falloffExponent = 0.0f;
                 frameFromForward(dir, up, x, y, z);
-                out.objectToWorld = rowsMatrix(x, -z, y, p);
+                out.objectToWorld = rowsMatrix(x, z, -y, p);
                 break;
             }
             case aiLightSource_SPOT: {
+                // Spot lights too shine along local -y.
                 out.type = ImportedLightType::kSpot;
                 frameFromForward(dir, up, x, y, z);
-                out.objectToWorld = rowsMatrix(x, y, z, p);
+                out.objectToWorld = rowsMatrix(x, z, -y, p);
                 // glTF files give the angle from the axis to the edge; the others the full cone.
                 const float factor = gltf_ ? 2.0f : 1.0f;
                 float inner = light.mAngleInnerCone * factor,
@@ -660,7 +661,8 @@ private:
                 float scale = std::cbrt(std::fabs(convert_.determinant3()));
                 float w = light.mSize.x > 0.0f ? light.mSize.x * scale : scale;
                 float h = light.mSize.y > 0.0f ? light.mSize.y * scale : scale;
-                out.objectToWorld = rowsMatrix(x * (0.5f * w), y * (0.5f * h), z, p);
+                // The square's normal, local +z, is the direction it shines in.
+                out.objectToWorld = rowsMatrix(x * (0.5f * w), -y * (0.5f * h), -z, p);
                 break;
             }
             case aiLightSource_AMBIENT:

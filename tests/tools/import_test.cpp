@@ -16,10 +16,9 @@
 #include <string>
 #include <vector>
 
-#include "raytrace/instance.h"
-#include "scene/temp_shape.h"
+#include "scene/loader.h"
+#include "scene/scene.h"
 #include "scene/vtm.h"
-#include "shading/material.h"
 #include "tools/import_command.h"
 #include "tools/model_reader.h"
 
@@ -187,22 +186,6 @@ std::map<std::string, ox::Mtx4> instancePlacements(const std::string &file) {
     return out;
 }
 
-// Resolves only the materials the scene file defines.
-class SceneMaterials : public ox::ShapeMaterialResolverInterface {
-public:
-    explicit SceneMaterials(const std::string &xml) : xml_(xml) {}
-    const ox::Material *resolve(const std::string &name,
-                                const std::vector<std::string> &) override {
-        return xml_.find("<Material>\n\t\t<Name>" + name + "</Name>") != std::string::npos
-                   ? &material_
-                   : nullptr;
-    }
-
-private:
-    std::string xml_;
-    ox::Material material_{nullptr, nullptr};
-};
-
 }  // namespace
 
 // One triangle with a UV set and a normal: the mesh file is checked byte for byte.
@@ -310,8 +293,9 @@ TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
     const ox::ImportedLight &spot = model.lights[0];
     EXPECT_EQ(spot.type, ox::ImportedLightType::kSpot);
     EXPECT_FLOAT_EQ(spot.color.g, 1.0f);  // colour times intensity
-    // Turned to shine down: local -z maps to -y. Cone angles are full angles in degrees.
-    EXPECT_NEAR(spot.objectToWorld.m[2][1], 1.0f, 1e-5f);
+    // Turned to shine down: local -y maps to world -y. Cone angles are full angles in degrees.
+    EXPECT_NEAR(spot.objectToWorld.transformVector(ox::Vec3(0, -1, 0)).y, -1.0f, 1e-5f);
+    EXPECT_NEAR(spot.objectToWorld.determinant3(), 1.0f, 1e-5f);
     EXPECT_NEAR(spot.objectToWorld.m[3][1], 4.0f, 1e-5f);
     EXPECT_NEAR(spot.coneAngleDegrees, 28.6479f, 1e-3f);
     EXPECT_NEAR(spot.penumbraAngleDegrees, 14.3239f, 1e-3f);
@@ -504,7 +488,6 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
         const std::string scenePath =
             (fs::path(out) / (fs::path(file).stem().string() + ".xml")).string();
         std::map<std::string, ox::Mtx4> placement = instancePlacements(scenePath);
-        SceneMaterials materials(readBytes(scenePath));
         size_t triangles = 0, builtTriangles = 0;
         ox::BBox box, builtBox;
         for (const auto &e : fs::directory_iterator(out)) {
@@ -528,22 +511,57 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
                     EXPECT_TRUE(u > 0 && u < 1 && w > 0 && w < 1) << u << " " << w;
                 }
             }
-            // The scene's own shape building takes the file as it stands.
-            auto reader = vtm::TempMeshReaderFactory::instance().open(e.path().string());
-            ASSERT_TRUE(reader);
-            std::unique_ptr<ox::Shape> shape;
-            std::string failure;
-            ASSERT_EQ(
-                ox::buildTempShape(*reader, materials, ox::MeshBuildOptions(), shape, failure),
-                ox::ShapeBuildStatus::kBuilt)
-                << failure;
-            builtTriangles += shape->triangles().size();
-            EXPECT_EQ(shape->vertices().uvSetNames(), mesh.uvSetNames);
-            builtBox.extend(ox::transformBox(shape->bounds(), m));
         }
+        // The scene loader takes the files as they stand.
+        std::vector<std::string> inputs{scenePath};
+        for (const auto &e : fs::directory_iterator(out))
+            if (e.path().extension() == ".vtm") inputs.push_back(e.path().string());
+        ox::Scene loaded;
+        std::string error;
+        ASSERT_TRUE(ox::ZPXLoader().load(inputs, ox::SceneLoadSettings(), loaded, error)) << error;
+        for (const auto &instance : loaded.instances()) {
+            builtTriangles += instance->shape().triangles().size();
+            EXPECT_EQ(instance->shape().vertices().uvSetNames().size(), lightmap ? 2u : libUvSets);
+        }
+        builtBox = loaded.instanceBounds();
         EXPECT_EQ(builtTriangles, libTriangles) << file;
         EXPECT_EQ(builtBox, libBox) << file;
         EXPECT_EQ(triangles, libTriangles) << file;
         EXPECT_EQ(box, libBox) << file;
     }
+}
+
+// The Cornell box example imports and loads: its walls, blocks and light patch, the camera and
+// the area light of the view file, every shape with its light-map set.
+TEST_F(ImportTest, CornellExampleLoads) {
+    // The source tree: the test data folder is tests/data in it.
+    const std::string example =
+        (fs::path(OX_TEST_DATA_DIR).parent_path().parent_path() / "examples" / "cornell").string();
+    RunResult r =
+        runImport(example + "/cornell.obj -o " + path("out") + " --scale 0.001 --lightmap-uv 256");
+    ASSERT_EQ(r.status, 0) << r.output;
+    EXPECT_NE(r.output.find("Light-map UVs for tall_block: 5 charts"), std::string::npos)
+        << r.output;
+    std::vector<std::string> inputs{path("out/cornell.xml"), example + "/cornell_view.xml"};
+    for (const auto &e : fs::directory_iterator(path("out")))
+        if (e.path().extension() == ".vtm") inputs.push_back(e.path().string());
+    ox::Scene scene;
+    std::string error;
+    ASSERT_TRUE(ox::ZPXLoader().load(inputs, ox::SceneLoadSettings(), scene, error)) << error;
+    EXPECT_EQ(scene.instances().size(), 8u);
+    size_t triangles = 0;
+    for (const auto &instance : scene.instances()) {
+        triangles += instance->shape().triangles().size();
+        EXPECT_EQ(instance->shape().vertices().uvSetNames(),
+                  (std::vector<std::string>{"uv0", "lightmap"}));
+    }
+    EXPECT_EQ(triangles, 32u);
+    EXPECT_TRUE(scene.findCamera("cornell_camera"));
+    EXPECT_TRUE(scene.findLight("cornell_light"));
+    const ox::BBox box = scene.instanceBounds();
+    EXPECT_NEAR(box.min.x, 0.0f, 1e-6f);
+    EXPECT_NEAR(box.max.x, 0.556f, 1e-6f);
+    EXPECT_NEAR(box.max.y, 0.5488f, 1e-6f);
+    EXPECT_NEAR(box.max.z, 0.5592f, 1e-6f);
+    EXPECT_TRUE(scene.findShape("light"));
 }
