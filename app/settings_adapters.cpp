@@ -43,6 +43,17 @@ SceneLoadSettings sceneLoadSettings(const OXConfigBase &config, int threadCount)
     return s;
 }
 
+ADSParameters adsParameters(const ADSSettingsBase &ads) {
+    ADSParameters p;
+    p.gridMaxDepth = ads.gridMaxDepth();
+    p.gridThreshold = ads.gridThreshold();
+    p.gridDensity = ads.gridDensity();
+    p.useSSE = ads.useSSE();
+    p.useInstancing = ads.useInstancing.value();
+    p.instancingThreshold = ads.instancingThreshold();
+    return p;
+}
+
 MotionBlurHandler motionBlurHandler(const RenderSettingsBase &render) {
     return MotionBlurHandler(render.motionBlur.value(), render.motionSteps(), render.shutterOpen(),
                              render.shutterClose());

@@ -33,7 +33,7 @@ public:
 };
 
 /// How instances are chosen for instancing (values as the settings number them).
-enum InstancingType : int { kInstancingNever = 0, kInstancingAutoDetect = 1, kInstancingAlways = 2 };
+enum GridInstancing : int { kInstancingNever = 0, kInstancingAutoDetect = 1, kInstancingAlways = 2 };
 
 /// The settings of the acceleration structure, as plain values.
 struct ADSParameters {

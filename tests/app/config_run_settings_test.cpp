@@ -277,12 +277,21 @@ TEST_F(ConfigRun, SceneAndTracerRecordsFollowTheSettings) {
     EXPECT_EQ(d.environment.rtEnvironment, plain.environment.rtEnvironment);
     EXPECT_EQ(d.environment.iblImageFile, plain.environment.iblImageFile);
     EXPECT_EQ(d.environment.iblGIEnvBlur, plain.environment.iblGIEnvBlur);
+    const ox::ADSParameters a = ox::adsParameters(config.ADSSettings), plainAds;
+    EXPECT_EQ(a.gridMaxDepth, plainAds.gridMaxDepth);
+    EXPECT_EQ(a.gridThreshold, plainAds.gridThreshold);
+    EXPECT_EQ(a.gridDensity, plainAds.gridDensity);
+    EXPECT_EQ(a.useSSE, plainAds.useSSE);
+    EXPECT_EQ(a.useInstancing, plainAds.useInstancing);
+    EXPECT_EQ(a.instancingThreshold, plainAds.instancingThreshold);
 
     write("s.xml", R"(<OXConfig><FrameSettings><renderType>PointCloudBake</renderType>
   </FrameSettings><RenderSettings><vertexMergeThreshold>0.25</vertexMergeThreshold>
   <tsOddUVFlipping>false</tsOddUVFlipping><tsVertexNormalization>false</tsVertexNormalization>
   <bias>0</bias><motionBlur>3D</motionBlur><motionSteps>4</motionSteps>
   <shutterOpen>0.25</shutterOpen></RenderSettings>
+  <ADSSettings><gridThreshold>7</gridThreshold><useSSE>false</useSSE>
+  <useInstancing>Always</useInstancing></ADSSettings>
   <EnvironmentSettings><rtEnvironment>SkyLight</rtEnvironment>
   <skyLightColor><r>0.5</r><g>0.25</g><b>1</b><a>1</a></skyLightColor>
   <iblTurnDome>90</iblTurnDome><iblEmitPhotons>true</iblEmitPhotons></EnvironmentSettings>
@@ -302,6 +311,12 @@ TEST_F(ConfigRun, SceneAndTracerRecordsFollowTheSettings) {
     EXPECT_EQ(s.environment.skyLightColor, ox::Color(0.5f, 0.25f, 1.0f, 1.0f));
     EXPECT_EQ(s.environment.iblTurnDome, 90.0f);
     EXPECT_TRUE(s.environment.iblEmitPhotons);
+    const ox::ADSParameters ads = ox::adsParameters(config.ADSSettings);
+    EXPECT_EQ(ads.gridThreshold, 7u);
+    EXPECT_FALSE(ads.useSSE);
+    EXPECT_EQ(ads.useInstancing, ox::kInstancingAlways);
+    EXPECT_EQ(ads.gridMaxDepth, 4u);
+    EXPECT_EQ(ads.instancingThreshold, 500u);
     const ox::MotionBlurHandler motion = ox::motionBlurHandler(config.RenderSettings);
     EXPECT_TRUE(motion.threeD());
     EXPECT_EQ(motion.steps(), 4u);
