@@ -128,6 +128,10 @@ TEST_F(ConfigRun, DefaultsWrittenByTheProgramValidateAndReadBackUnchanged) {
     ASSERT_EQ(std::system("xmllint --noout --schema config.xsd config.xml > lint.txt 2>&1"), 0)
         << read("lint.txt");
     EXPECT_EQ(read("c.txt").find("[WARNING]"), std::string::npos);
+    // The program reads its own file without a word (the run then stops: no driver here).
+    std::system((program + " s.xml -x config.xml -od out > x.txt").c_str());
+    EXPECT_EQ(read("x.txt").find("arning"), std::string::npos) << read("x.txt");
+    EXPECT_TRUE(fs::is_directory("out/GI/fgMaps"));
 
     ox::ConfigRunSettings settings;
     CaptureStdout();
