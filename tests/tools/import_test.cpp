@@ -150,9 +150,9 @@ std::string gltfQuad() {
     return g.str();
 }
 
-// Instance name -> placement, read from a scene file with libxml2.
-std::map<std::string, ox::Mtx4> instancePlacements(const std::string &file) {
-    std::map<std::string, ox::Mtx4> out;
+// Shape name -> placements of its instances, read from a scene file with libxml2.
+std::map<std::string, std::vector<ox::Mtx4>> instancePlacements(const std::string &file) {
+    std::map<std::string, std::vector<ox::Mtx4>> out;
     xmlDocPtr doc = xmlReadFile(file.c_str(), nullptr, 0);
     if (!doc) return out;
     auto text = [](xmlNodePtr n) {
@@ -180,7 +180,7 @@ std::map<std::string, ox::Mtx4> instancePlacements(const std::string &file) {
                 ++i;
             }
         }
-        out[shape] = m;
+        out[shape].push_back(m);
     }
     xmlFreeDoc(doc);
     return out;
@@ -458,7 +458,16 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
               "o box\nv -1 -1 -1\nv 1 -1 -1\nv 1 1 -1\nv -1 1 -1\nv -1 -1 1\nv 1 -1 1\nv 1 1 1\n"
               "v -1 1 1\nf 1 4 3 2\nf 5 6 7 8\nf 1 2 6 5\nf 3 4 8 7\nf 2 3 7 6\nf 1 5 8 4\n"
               "o plane\nv -5 -1 -5\nv 5 -1 -5\nv 5 -1 5\nv -5 -1 5\nf 9 12 11 10\n");
-    for (const std::string file : {"quad.gltf", "boxes.obj"}) {
+    // The quad placed twice: one shape, two instances.
+    std::string twice = gltfQuad();
+    const std::string nodes = "\"scenes\":[{\"nodes\":[0,1,2]}],\n\"nodes\":[";
+    ASSERT_NE(twice.find(nodes), std::string::npos);
+    twice.replace(twice.find(nodes), nodes.size(),
+                  "\"scenes\":[{\"nodes\":[0,1,2,3]}],\n\"nodes\":["
+                  "{\"name\":\"Again\",\"mesh\":0,\"translation\":[-4,0,0],"
+                  "\"scale\":[1,2,1]},");
+    writeText(path("twice.gltf"), twice);
+    for (const std::string file : {"quad.gltf", "boxes.obj", "twice.gltf"}) {
         // What the library reports, with every node's placement applied.
         Assimp::Importer importer;
         const aiScene *scene =
@@ -482,7 +491,7 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
         ASSERT_EQ(r.status, 0) << r.output;
         const std::string scenePath =
             (fs::path(out) / (fs::path(file).stem().string() + ".xml")).string();
-        std::map<std::string, ox::Mtx4> placement = instancePlacements(scenePath);
+        std::map<std::string, std::vector<ox::Mtx4>> placement = instancePlacements(scenePath);
         size_t triangles = 0, builtTriangles = 0;
         ox::BBox box, builtBox;
         for (const auto &e : fs::directory_iterator(out)) {
@@ -490,14 +499,14 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
             vtm::TempMesh mesh;
             ASSERT_TRUE(vtm::readTempMesh(e.path().string(), mesh)) << e.path();
             ASSERT_EQ(placement.count(mesh.name), 1u) << mesh.name;
-            const ox::Mtx4 &m = placement[mesh.name];
-            triangles += mesh.indices.size() / 3;
+            triangles += mesh.indices.size() / 3 * placement[mesh.name].size();
             EXPECT_EQ(mesh.uvSetNames.size(), lightmap ? 2u : libUvSets) << e.path();
             for (uint32_t i : mesh.indices) ASSERT_LT(i, mesh.vertexCount());
-            for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
-                const float *p = &mesh.vertices[v * (mesh.colors ? 16 : 12)];
-                box.extend(m.transformPoint(ox::Vec3(p[0], p[1], p[2])));
-            }
+            for (const ox::Mtx4 &m : placement[mesh.name])
+                for (uint32_t v = 0; v < mesh.vertexCount(); ++v) {
+                    const float *p = &mesh.vertices[v * (mesh.colors ? 16 : 12)];
+                    box.extend(m.transformPoint(ox::Vec3(p[0], p[1], p[2])));
+                }
             if (lightmap) {
                 // The generated light-map set lies inside the unit square.
                 EXPECT_EQ(mesh.uvSetNames[1], "lightmap");
@@ -520,6 +529,10 @@ TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
         }
         builtBox = loaded.instanceBounds();
         EXPECT_EQ(builtTriangles, libTriangles) << file;
+        if (file == "twice.gltf") {
+            EXPECT_EQ(loaded.instances().size(), 2u);
+            EXPECT_EQ(loaded.shapes().size(), 1u);
+        }
         EXPECT_EQ(builtBox, libBox) << file;
         EXPECT_EQ(triangles, libTriangles) << file;
         EXPECT_EQ(box, libBox) << file;
