@@ -245,10 +245,13 @@ bool packRectangles(std::vector<PackRect> &rects, float texelsPerUnit, int resol
         int64_t x, width, top;
     };
     std::vector<Segment> sky{{padding, limit - padding, padding}};
-    for (size_t i : order) {
-        const auto [w, h] = size[i];
-        int64_t bestTop = std::numeric_limits<int64_t>::max(), bestX = 0;
-        size_t bestSeg = 0;
+    struct Spot {
+        int64_t top = std::numeric_limits<int64_t>::max(), x = 0;
+        size_t seg = 0;
+    };
+    // The lowest place for a block of w x h on the skyline (leftmost among equals).
+    auto findSpot = [&](int64_t w, int64_t h) {
+        Spot best;
         for (size_t s = 0; s < sky.size(); ++s) {
             int64_t x = sky[s].x;
             if (x + w > limit) break;
@@ -258,10 +261,26 @@ bool packRectangles(std::vector<PackRect> &rects, float texelsPerUnit, int resol
                 covered = sky[k].x + sky[k].width - x;
             }
             if (y + h > limit) continue;
-            if (y + h < bestTop || (y + h == bestTop && x < bestX))
-                bestTop = y + h, bestX = x, bestSeg = s;
+            if (y + h < best.top || (y + h == best.top && x < best.x)) best = {y + h, x, s};
         }
-        if (bestTop == std::numeric_limits<int64_t>::max()) return false;
+        return best;
+    };
+    for (size_t i : order) {
+        auto [w, h] = size[i];
+        Spot spot = findSpot(w, h);
+        // A block turned by a quarter may sit lower.
+        rects[i].rotated = false;
+        if (w != h) {
+            Spot turned = findSpot(h, w);
+            if (turned.top < spot.top || (turned.top == spot.top && turned.x < spot.x)) {
+                spot = turned;
+                std::swap(w, h);
+                rects[i].rotated = true;
+            }
+        }
+        if (spot.top == std::numeric_limits<int64_t>::max()) return false;
+        const int64_t bestTop = spot.top, bestX = spot.x;
+        const size_t bestSeg = spot.seg;
         rects[i].x = int32_t(bestX);
         rects[i].y = int32_t(bestTop - h);
         // Replace the covered part of the skyline by one segment at the new top.
@@ -418,7 +437,9 @@ bool generateLightmapLayout(const std::vector<Vec3> &positions,
     for (size_t t = 0; t < triCount; ++t) {
         const PackRect &r = rects[out.chartOf[t]];
         for (int k = 0; k < 3; ++k) {
-            const Vec2 &p = local[3 * t + k];
+            // A turned chart is rotated by a quarter turn, which keeps the triangles' winding.
+            const Vec2 &q = local[3 * t + k];
+            const Vec2 p = r.rotated ? Vec2(r.height - q.y, q.x) : q;
             out.cornerUVs[3 * t + k] = Vec2((float(r.x) + p.x * out.texelsPerUnit) * inv,
                                             (float(r.y) + p.y * out.texelsPerUnit) * inv);
         }

@@ -33,11 +33,13 @@ struct LightmapLayout {
 struct PackRect {
     float width = 0.0f, height = 0.0f;  ///< extent in scene units
     int32_t x = 0, y = 0;               ///< lower-left texel of the placed block
+    bool rotated = false;  ///< placed turned by a quarter: width runs along v, height along u
 };
 
 /// Places the rectangles, scaled by texelsPerUnit, into a square of resolution texels so that
 /// blocks of floor(size * scale) + 1 + padding texels do not overlap and leave padding texels at
-/// the lower and left border. Returns false when they do not fit.
+/// the lower and left border. A block may be turned by a quarter when it fits lower that way.
+/// Returns false when they do not fit.
 bool packRectangles(std::vector<PackRect> &rects, float texelsPerUnit, int resolution, int padding);
 
 /// Splits triangles into charts: connected over shared edges (by position), each triangle
