@@ -45,15 +45,15 @@ struct EmbreeScene {
         auto start = std::chrono::steady_clock::now();
         scene = rtcNewScene(device);
         RTCGeometry g = rtcNewGeometry(device, RTC_GEOMETRY_TYPE_TRIANGLE);
-        auto *v = static_cast<float *>(rtcSetNewGeometryBuffer(
-            g, RTC_BUFFER_TYPE_VERTEX, 0, RTC_FORMAT_FLOAT3, 3 * sizeof(float),
-            m.positions.size()));
+        auto *v = static_cast<float *>(rtcSetNewGeometryBuffer(g, RTC_BUFFER_TYPE_VERTEX, 0,
+                                                               RTC_FORMAT_FLOAT3, 3 * sizeof(float),
+                                                               m.positions.size()));
         for (size_t i = 0; i < m.positions.size(); ++i)
             v[3 * i] = m.positions[i].x, v[3 * i + 1] = m.positions[i].y,
                   v[3 * i + 2] = m.positions[i].z;
-        auto *ix = static_cast<unsigned *>(rtcSetNewGeometryBuffer(
-            g, RTC_BUFFER_TYPE_INDEX, 0, RTC_FORMAT_UINT3, 3 * sizeof(unsigned),
-            m.triangleCount()));
+        auto *ix = static_cast<unsigned *>(
+            rtcSetNewGeometryBuffer(g, RTC_BUFFER_TYPE_INDEX, 0, RTC_FORMAT_UINT3,
+                                    3 * sizeof(unsigned), m.triangleCount()));
         for (size_t i = 0; i < m.indices.size(); ++i) ix[i] = m.indices[i];
         rtcCommitGeometry(g);
         rtcAttachGeometry(scene, g);

@@ -70,8 +70,8 @@ PerspectiveCamera::PerspectiveCamera(std::string name, const Mtx4 &objectToWorld
     l2_ = up_ * lens;
     // The lens radius is only meaningful with the lens on and a positive ratio and focus; any
     // other combination (the scene's cameras pass zeros) keeps the pinhole.
-    if (lensSwitch != 0 && lensRatio > 0.0f && focusDistance > 0.0f &&
-        std::isfinite(lensRatio) && std::isfinite(focusDistance)) {
+    if (lensSwitch != 0 && lensRatio > 0.0f && focusDistance > 0.0f && std::isfinite(lensRatio) &&
+        std::isfinite(focusDistance)) {
         float a = focusDistance * 0.5f / lensRatio;
         if (std::isfinite(a) && a > 0.0f) lensFactor_ = a;
     }

@@ -69,8 +69,8 @@ size_t addMotionTriangles(PrimitiveStore &store, std::vector<uint32_t> &codes,
     const MeshInput &mesh = in.mesh;
     for (size_t i = 0; i < mesh.triangleCount; ++i) {
         uint32_t ix[3] = {mesh.corner(i, 0), mesh.corner(i, 1), mesh.corner(i, 2)};
-        bool bad = ix[0] >= mesh.vertexCount || ix[1] >= mesh.vertexCount ||
-                   ix[2] >= mesh.vertexCount;
+        bool bad =
+            ix[0] >= mesh.vertexCount || ix[1] >= mesh.vertexCount || ix[2] >= mesh.vertexCount;
         for (const MeshInput &sm : in.stepMeshes)
             bad = bad || !sm.usable() || sm.triangleCount != mesh.triangleCount ||
                   sm.vertexCount != mesh.vertexCount;
@@ -170,7 +170,8 @@ size_t CompleteGrid::primitiveCount() const {
 size_t CompleteGrid::sizeBytes() const {
     size_t n = sizeof(*this) + store_.sizeBytes() + grid_.sizeBytes() + secondStore_.sizeBytes() +
                second_.sizeBytes();
-    for (const auto &s : shapes_) n += sizeof(ShapeGrid) + s->store.sizeBytes() + s->grid.sizeBytes();
+    for (const auto &s : shapes_)
+        n += sizeof(ShapeGrid) + s->store.sizeBytes() + s->grid.sizeBytes();
     return n;
 }
 
@@ -243,8 +244,8 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
             if (!sg) {
                 auto owned = std::make_unique<ShapeGrid>();
                 std::vector<uint32_t> shapeCodes;
-                skipped = addTriangles(owned->store, shapeCodes, in.mesh, Mtx4(), false, 0u,
-                                       kNoInstance);
+                skipped =
+                    addTriangles(owned->store, shapeCodes, in.mesh, Mtx4(), false, 0u, kNoInstance);
                 if (!owned->grid.build(owned->store, shapeCodes, unionOf(owned->store, shapeCodes),
                                        gp, 0, true))
                     return false;
@@ -256,16 +257,16 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
             ig.objectToWorld = in.objectToWorld;
             ig.worldToObject = inverses[i];
             ig.flags = in.flags;
-            ig.testFlags = in.objectToWorld.determinant3() < 0.0f ? in.flags ^ kFlagOpposite
-                                                                 : in.flags;
+            ig.testFlags =
+                in.objectToWorld.determinant3() < 0.0f ? in.flags ^ kFlagOpposite : in.flags;
             ig.instance = in.index;
             ig.grid = &sg->grid;
             ig.store = &sg->store;
             const BBox &sb = sg->grid.box();
             for (int c = 0; c < 8; ++c)
-                ig.box.extend(affinePoint(in.objectToWorld, {c & 1 ? sb.max.x : sb.min.x,
-                                                             c & 2 ? sb.max.y : sb.min.y,
-                                                             c & 4 ? sb.max.z : sb.min.z}));
+                ig.box.extend(affinePoint(in.objectToWorld,
+                                          {c & 1 ? sb.max.x : sb.min.x, c & 2 ? sb.max.y : sb.min.y,
+                                           c & 4 ? sb.max.z : sb.min.z}));
             if (!isFinite(ig.box.min) || !isFinite(ig.box.max)) {
                 message(kMsgWarning, 1,
                         "Instance %s has a singular or non-finite placement, skipped",
@@ -277,8 +278,8 @@ bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSP
         } else if (moving[i]) {
             skipped = addMotionTriangles(store_, codes, in, *motion);
         } else {
-            skipped = addTriangles(store_, codes, in.mesh, in.objectToWorld, true, in.flags,
-                                   in.index);
+            skipped =
+                addTriangles(store_, codes, in.mesh, in.objectToWorld, true, in.flags, in.index);
         }
         if (skipped)
             message(kMsgWarning, 1,

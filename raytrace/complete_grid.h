@@ -33,7 +33,11 @@ public:
 };
 
 /// How instances are chosen for instancing (values as the settings number them).
-enum GridInstancing : int { kInstancingNever = 0, kInstancingAutoDetect = 1, kInstancingAlways = 2 };
+enum GridInstancing : int {
+    kInstancingNever = 0,
+    kInstancingAutoDetect = 1,
+    kInstancingAlways = 2
+};
 
 /// The settings of the acceleration structure, as plain values.
 struct ADSParameters {
@@ -63,9 +67,7 @@ struct MeshInput {
         return triangleCount == 0 || (indices && (positions || (px && py && pz)));
     }
     /// Position of vertex i.
-    Vec3 position(size_t i) const {
-        return positions ? positions[i] : Vec3(px[i], py[i], pz[i]);
-    }
+    Vec3 position(size_t i) const { return positions ? positions[i] : Vec3(px[i], py[i], pz[i]); }
     /// Corner c of triangle t.
     uint32_t corner(size_t t, int c) const { return indices[t * indexStride + c]; }
 };
@@ -76,10 +78,10 @@ struct InstanceInput {
     uint64_t shape = 0;  ///< Shape identity: instances of one shape share it.
     MeshInput mesh;
     Mtx4 objectToWorld;
-    uint32_t flags = 0;               ///< RenderStats flag word.
-    uint32_t index = kNoInstance;     ///< Scene instance index reported in hits.
-    bool displaced = false;           ///< Material uses render-time displacement.
-    std::vector<Mtx4> stepTransforms;       ///< Per-step placements (motion), or empty.
+    uint32_t flags = 0;                 ///< RenderStats flag word.
+    uint32_t index = kNoInstance;       ///< Scene instance index reported in hits.
+    bool displaced = false;             ///< Material uses render-time displacement.
+    std::vector<Mtx4> stepTransforms;   ///< Per-step placements (motion), or empty.
     std::vector<MeshInput> stepMeshes;  ///< Per-step deformed meshes (same topology), or empty.
 };
 
@@ -101,14 +103,13 @@ public:
 
     bool intersect(const Ray &ray, Hit &hit, float tmax, RayCounter *counter) const override;
     using ADSInterface::intersect;
-    bool intersectSecond(const Ray &ray, Hit &hit, float tmax,
-                         RayCounter *counter) const override;
+    bool intersectSecond(const Ray &ray, Hit &hit, float tmax, RayCounter *counter) const override;
     BBox bounds() const override { return box_; }
     bool occluded(const Ray &ray, float tmax, RayCounter *counter) const override;
 
     /// Whether the instance was chosen for instancing (before the displacement/motion copy rule).
-    static bool choosesInstancing(int useInstancing, uint32_t instancingThreshold,
-                                  size_t shapeUses, size_t shapeTriangles);
+    static bool choosesInstancing(int useInstancing, uint32_t instancingThreshold, size_t shapeUses,
+                                  size_t shapeTriangles);
 
     /// Number of primitives in the top-level store (triangles, moving triangles, instances).
     size_t primitiveCount() const;

@@ -15,8 +15,8 @@ namespace {
 constexpr double kMaxCells = double(1u << 28);
 
 bool boxesOverlap(const BBox &a, const BBox &b) {
-    return a.min.x <= b.max.x && a.max.x >= b.min.x && a.min.y <= b.max.y &&
-           a.max.y >= b.min.y && a.min.z <= b.max.z && a.max.z >= b.min.z;
+    return a.min.x <= b.max.x && a.max.x >= b.min.x && a.min.y <= b.max.y && a.max.y >= b.min.y &&
+           a.min.z <= b.max.z && a.max.z >= b.min.z;
 }
 
 struct D3 {
@@ -145,8 +145,8 @@ bool Grid::build(const PrimitiveStore &store, const std::vector<uint32_t> &prims
     return true;
 }
 
-bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &prims,
-                   const BBox &box, const GridParams &params, uint32_t depth, bool widenBox) {
+bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &prims, const BBox &box,
+                   const GridParams &params, uint32_t depth, bool widenBox) {
     store_ = &store;
     params_ = params;
     params_.maxDepth = std::min(params.maxDepth, kMaxDepthLimit);
@@ -213,7 +213,8 @@ BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
 }
 
 bool Grid::overlaps(uint32_t code, const BBox &b, const BBox &cell) const {
-    BBox grown(cell.min - Vec3(margin_, margin_, margin_), cell.max + Vec3(margin_, margin_, margin_));
+    BBox grown(cell.min - Vec3(margin_, margin_, margin_),
+               cell.max + Vec3(margin_, margin_, margin_));
     if (!boxesOverlap(b, grown)) return false;
     if ((code >> kItemIndexBits) == kItemTriangle) {
         const IntersectTriangle &t = store_->triangles[code & kItemIndexMask];
@@ -267,8 +268,8 @@ void Grid::refine() {
                     std::vector<uint32_t> cellPrims(buildItems_.begin() + buildBegin_[c],
                                                     buildItems_.begin() + buildBegin_[c + 1]);
                     auto child = std::make_unique<Grid>();
-                    if (!child->prepare(*store_, cellPrims, cellBox(x, y, z), params_,
-                                        depth_ + 1, false))
+                    if (!child->prepare(*store_, cellPrims, cellBox(x, y, z), params_, depth_ + 1,
+                                        false))
                         continue;
                     uint64_t occupied = 0, refs = 0;
                     size_t childCells = size_t(child->nx_ * child->ny_ * child->nz_);
@@ -334,7 +335,8 @@ void Grid::finalize() {
             cells_[c].first = items_[cellBegin[c]];
         } else {
             cells_[c].first = uint32_t(lists.size());
-            lists.insert(lists.end(), items_.begin() + cellBegin[c], items_.begin() + cellBegin[c + 1]);
+            lists.insert(lists.end(), items_.begin() + cellBegin[c],
+                         items_.begin() + cellBegin[c + 1]);
         }
     }
     items_.swap(lists);
@@ -427,7 +429,8 @@ void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
         }
         if (grouped) {
             for (uint32_t j = count; j < 4; ++j)
-                for (int a = 0; a < 3; ++a) group.lo[a][j] = group.lo[a][0], group.hi[a][j] = group.hi[a][0];
+                for (int a = 0; a < 3; ++a)
+                    group.lo[a][j] = group.lo[a][0], group.hi[a][j] = group.hi[a][0];
             std::memcpy(static_cast<void *>(blob_.data() + groupOffset), &group, sizeof group);
             items_.push_back(itemCode(kItemGroup, groupOffset));
         }
@@ -441,7 +444,8 @@ void Grid::computeDistances() {
     for (size_t c = 0; c < ncells; ++c)
         if (cells_[c].count) distance_[c] = 0;
     auto pass = [&](int dir) {
-        int64_t zs = dir > 0 ? 0 : nz_ - 1, ys0 = dir > 0 ? 0 : ny_ - 1, xs0 = dir > 0 ? 0 : nx_ - 1;
+        int64_t zs = dir > 0 ? 0 : nz_ - 1, ys0 = dir > 0 ? 0 : ny_ - 1,
+                xs0 = dir > 0 ? 0 : nx_ - 1;
         for (int64_t z = zs; z >= 0 && z < nz_; z += dir)
             for (int64_t y = ys0; y >= 0 && y < ny_; y += dir)
                 for (int64_t x = xs0; x >= 0 && x < nx_; x += dir) {
@@ -481,8 +485,7 @@ uint32_t Grid::nestingDepth() const {
 
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cells_.capacity() * sizeof(CellRef) + items_.capacity() * 4 +
-               distance_.capacity() +
-               blob_.capacity() * sizeof(Block) +
+               distance_.capacity() + blob_.capacity() * sizeof(Block) +
                children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
@@ -669,8 +672,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             step[a] = 0;
             next[a] = 0;
         }
-        tNext[a] = step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a]
-                           : kInfiniteDistance;
+        tNext[a] =
+            step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
     }
     int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
     const uint8_t *distance = distance_.data();
@@ -709,8 +712,9 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 } else {
                     float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * tExit;
                     // Stay inside the cube (rounding must not skip a cell beside it).
-                    idx[a] = std::clamp<int64_t>(cellCoord(p, a), std::max<int64_t>(0, idx[a] - reach),
-                                                 std::min<int64_t>(n[a] - 1, idx[a] + reach));
+                    idx[a] =
+                        std::clamp<int64_t>(cellCoord(p, a), std::max<int64_t>(0, idx[a] - reach),
+                                            std::min<int64_t>(n[a] - 1, idx[a] + reach));
                 }
                 if (step[a]) {
                     next[a] = step[a] > 0 ? idx[a] + 1 : idx[a];

@@ -28,8 +28,8 @@ enum ItemKind : uint32_t {
 struct alignas(16) PacketGroup {
     float lo[3][4];
     float hi[3][4];
-    uint32_t first = 0;   ///< Block offset of the first packet (the packets follow the group).
-    uint32_t count = 0;   ///< Number of packets (1 to 4).
+    uint32_t first = 0;  ///< Block offset of the first packet (the packets follow the group).
+    uint32_t count = 0;  ///< Number of packets (1 to 4).
     uint32_t reserved[2] = {0, 0};
 };
 constexpr uint32_t kItemIndexBits = 29;
@@ -59,10 +59,10 @@ struct IntersectInstanceGrid {
     uint32_t flags = 0;      ///< The instance's flag word (reported in hits).
     uint32_t testFlags = 0;  ///< The flags its triangles are tested with (Opposite toggled when
                              ///< the placement mirrors, so the same faces are culled as a copy).
-    uint32_t instance = kNoInstance;  ///< Scene instance index.
-    const Grid *grid = nullptr;       ///< The shape grid (owned by the complete grid).
+    uint32_t instance = kNoInstance;        ///< Scene instance index.
+    const Grid *grid = nullptr;             ///< The shape grid (owned by the complete grid).
     const PrimitiveStore *store = nullptr;  ///< The shape grid's triangles.
-    BBox box;                         ///< World-space box.
+    BBox box;                               ///< World-space box.
 };
 
 /// Everything a hierarchy of grids indexes: world (or object) triangles, moving triangles and
@@ -81,10 +81,10 @@ struct PrimitiveStore {
 
 /// Parameters shared by a grid and its nested grids.
 struct GridParams {
-    float density = 1.0f;        ///< Cells per primitive (not positive or NaN: 1).
-    uint32_t threshold = 25;     ///< Primitives per cell before refinement.
-    uint32_t maxDepth = 4;       ///< Nesting limit (clamped to 16).
-    bool sse = true;             ///< Pack triangles four to a block; four times the threshold.
+    float density = 1.0f;     ///< Cells per primitive (not positive or NaN: 1).
+    uint32_t threshold = 25;  ///< Primitives per cell before refinement.
+    uint32_t maxDepth = 4;    ///< Nesting limit (clamped to 16).
+    bool sse = true;          ///< Pack triangles four to a block; four times the threshold.
 };
 
 /// Cell counts of a grid.

@@ -19,9 +19,9 @@ constexpr float kInfiniteDistance = 3.4028235e38f;
 
 /// Ray data prepared once per query (and once per instance in object space).
 struct TraceRay {
-    Vec3 o, d, inv;          ///< Origin, direction and its component-wise reciprocal.
-    uint32_t required = 0;   ///< Flag bits of which a visible object needs one.
-    float time = 0.0f;       ///< Shutter time in [0, 1].
+    Vec3 o, d, inv;              ///< Origin, direction and its component-wise reciprocal.
+    uint32_t required = 0;       ///< Flag bits of which a visible object needs one.
+    float time = 0.0f;           ///< Shutter time in [0, 1].
     bool overrideFlags = false;  ///< Inside an instance: test every triangle with instFlags.
     uint32_t instFlags = 0;
     float4 ox, oy, oz, dx, dy, dz, ix, iy, iz;
@@ -63,13 +63,13 @@ struct TraceState {
     float limit = kInfiniteDistance;
     bool found = false;
     float u = 0.0f, v = 0.0f;
-    uint8_t kind = 0;        ///< Item kind of the hit (see Grid::ItemKind).
-    uint32_t prim = 0;       ///< Index of the triangle (or motion triangle) in its store.
-    uint32_t inst = 0;       ///< For hits through an instance: the instance's index in the store.
-    uint32_t id = 0;         ///< Triangle hit: its index inside its shape (from the packet).
+    uint8_t kind = 0;   ///< Item kind of the hit (see Grid::ItemKind).
+    uint32_t prim = 0;  ///< Index of the triangle (or motion triangle) in its store.
+    uint32_t inst = 0;  ///< For hits through an instance: the instance's index in the store.
+    uint32_t id = 0;    ///< Triangle hit: its index inside its shape (from the packet).
     uint32_t instance = kNoInstance;  ///< Triangle hit: its scene instance (from the packet).
-    uint32_t flags = 0;      ///< Triangle hit: its flag word (from the packet).
-    bool fromPacket = false;  ///< id, instance and flags are set.
+    uint32_t flags = 0;               ///< Triangle hit: its flag word (from the packet).
+    bool fromPacket = false;          ///< id, instance and flags are set.
 };
 
 /// True when an object with these flags is seen by rays that need one of the required bits.
@@ -80,8 +80,8 @@ struct IntersectTriangle {
     static constexpr int kKind = 3;
     Vec3 p0, e1, e2;
     uint32_t flags = 0;
-    uint32_t id = 0;                 ///< Triangle index inside its shape.
-    uint32_t instance = kNoInstance; ///< Scene instance the triangle came from.
+    uint32_t id = 0;                  ///< Triangle index inside its shape.
+    uint32_t instance = kNoInstance;  ///< Scene instance the triangle came from.
     uint32_t reserved = 0;
 
     /// Bounding box of the three corners.
@@ -128,8 +128,8 @@ inline bool intersectTriangle(const Vec3 &p0, const Vec3 &e1, const Vec3 &e2, ui
 }
 
 /// The single-triangle test on a stored triangle, with the flags the ray context chooses.
-inline bool intersectTriangle(const IntersectTriangle &tri, const TraceRay &r, float tmax,
-                              float &t, float &u, float &v) {
+inline bool intersectTriangle(const IntersectTriangle &tri, const TraceRay &r, float tmax, float &t,
+                              float &u, float &v) {
     return intersectTriangle(tri.p0, tri.e1, tri.e2, r.overrideFlags ? r.instFlags : tri.flags, r,
                              tmax, t, u, v);
 }
@@ -140,8 +140,8 @@ struct alignas(16) IntersectSSETriangle {
     float e1[3][4];
     float e2[3][4];
     uint32_t flags[4];
-    uint32_t prim[4];    ///< Store index of each lane's triangle (0xFFFFFFFF for unused lanes).
-    uint32_t id[4];      ///< Triangle index inside its shape.
+    uint32_t prim[4];      ///< Store index of each lane's triangle (0xFFFFFFFF for unused lanes).
+    uint32_t id[4];        ///< Triangle index inside its shape.
     uint32_t instance[4];  ///< Scene instance of each lane.
 };
 
@@ -154,10 +154,8 @@ __attribute__((always_inline)) inline int intersectPacket(const IntersectSSETria
     int4 zero(0);
     // Lanes whose flags lack every required bit are invisible.
     float4 invisible = asFloat(cmpeq(flags & r.required4, zero));
-    float4 e1x = float4::load(pk.e1[0]), e1y = float4::load(pk.e1[1]),
-           e1z = float4::load(pk.e1[2]);
-    float4 e2x = float4::load(pk.e2[0]), e2y = float4::load(pk.e2[1]),
-           e2z = float4::load(pk.e2[2]);
+    float4 e1x = float4::load(pk.e1[0]), e1y = float4::load(pk.e1[1]), e1z = float4::load(pk.e1[2]);
+    float4 e2x = float4::load(pk.e2[0]), e2y = float4::load(pk.e2[1]), e2z = float4::load(pk.e2[2]);
     float4 px = r.dy * e2z - r.dz * e2y;
     float4 py = r.dz * e2x - r.dx * e2z;
     float4 pz = r.dx * e2y - r.dy * e2x;

@@ -41,8 +41,7 @@ void MotionBlurHandler::stepOf(uint32_t steps, float tau, uint32_t &k, float &w)
     w = (tau - a) / (b - a);
 }
 
-void MotionHitInterpolator::cornersAt(const Vec3 *corners, uint32_t steps, float tau,
-                                      Vec3 out[3]) {
+void MotionHitInterpolator::cornersAt(const Vec3 *corners, uint32_t steps, float tau, Vec3 out[3]) {
     uint32_t k;
     float w;
     MotionBlurHandler::stepOf(steps, tau, k, w);
@@ -60,8 +59,8 @@ Vec3 MotionHitInterpolator::interpolate(const Vec3 *corners, uint32_t steps, flo
     return p[0] * (1.0f - u - v) + p[1] * u + p[2] * v;
 }
 
-Vec3 MotionBlurHandler::MotionVectorExtractor::extract(const Vec3 *corners, uint32_t steps,
-                                                       float u, float v) {
+Vec3 MotionBlurHandler::MotionVectorExtractor::extract(const Vec3 *corners, uint32_t steps, float u,
+                                                       float v) {
     if (steps < 1) steps = 1;
     auto at = [&](uint32_t k) {
         const Vec3 *p = corners + k * 3;

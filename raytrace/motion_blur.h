@@ -34,7 +34,9 @@ public:
     float shutterClose() const { return shutterClose_; }
 
     /// Sets the handler's own per-step placements (N + 1 entries expected; others are clamped).
-    void setStepTransforms(std::vector<Mtx4> transforms) { stepTransforms_ = std::move(transforms); }
+    void setStepTransforms(std::vector<Mtx4> transforms) {
+        stepTransforms_ = std::move(transforms);
+    }
     /// The handler's own per-step placements.
     const std::vector<Mtx4> &stepTransforms() const { return stepTransforms_; }
 

@@ -49,8 +49,8 @@ enum RenderStatsFlag : uint32_t {
 
 /// Flag bits of which an object needs at least one to be seen by a ray type (0 = sees nothing).
 constexpr uint32_t rayTypeRequiredFlags(int type) {
-    constexpr uint32_t kTable[kRayTypeCount] = {0x1, 0x20, 0x40, 0x2, 0xC00, 0x80,
-                                                0x20, 0x0, 0x4000, 0x10000, 0x20000};
+    constexpr uint32_t kTable[kRayTypeCount] = {0x1,  0x20, 0x40,   0x2,     0xC00,  0x80,
+                                                0x20, 0x0,  0x4000, 0x10000, 0x20000};
     return type >= 0 && type < kRayTypeCount ? kTable[type] : 0u;
 }
 
@@ -60,11 +60,11 @@ const char *rayTypeName(int type);
 /// A ray with its type, time within the shutter interval and differentials.
 struct Ray {
     Vec3 origin;
-    Vec3 direction;           ///< Unit length for camera rays; any non-zero length is traced.
+    Vec3 direction;  ///< Unit length for camera rays; any non-zero length is traced.
     uint8_t type = kRayPrimary;
-    float time = 0.0f;        ///< Shutter time in [0, 1] (clamped by the tracer).
-    Vec3 dOdx, dOdy;          ///< Change of origin per unit image x and y.
-    Vec3 dDdx, dDdy;          ///< Change of direction per unit image x and y.
+    float time = 0.0f;  ///< Shutter time in [0, 1] (clamped by the tracer).
+    Vec3 dOdx, dOdy;    ///< Change of origin per unit image x and y.
+    Vec3 dDdx, dDdy;    ///< Change of direction per unit image x and y.
 };
 
 /// Instance index of a hit on geometry that belongs to no scene instance.
@@ -72,15 +72,15 @@ constexpr uint32_t kNoInstance = 0xFFFFFFFFu;
 
 /// Result of a closest-hit query.
 struct Hit {
-    float t = -1.0f;          ///< Distance along the ray in units of its direction; -1 = no hit.
-    float u = 0.0f, v = 0.0f; ///< Barycentrics: point = (1 - u - v) p0 + u p1 + v p2.
-    float w = 0.0f;           ///< Extra coordinate of non-triangle primitives (0 for triangles).
-    uint32_t id = 0;          ///< Primitive identifier: the triangle's index inside its shape.
+    float t = -1.0f;           ///< Distance along the ray in units of its direction; -1 = no hit.
+    float u = 0.0f, v = 0.0f;  ///< Barycentrics: point = (1 - u - v) p0 + u p1 + v p2.
+    float w = 0.0f;            ///< Extra coordinate of non-triangle primitives (0 for triangles).
+    uint32_t id = 0;           ///< Primitive identifier: the triangle's index inside its shape.
     uint32_t instance = kNoInstance;  ///< Index of the scene instance hit.
-    uint32_t flags = 0;       ///< Flag word of the object hit.
+    uint32_t flags = 0;               ///< Flag word of the object hit.
     /// The primitive hit: an IntersectTriangle, or a MotionTriangle when moving is set.
     const void *primitive = nullptr;
-    bool moving = false;      ///< True when the hit lies on a moving (motion-blurred) triangle.
+    bool moving = false;  ///< True when the hit lies on a moving (motion-blurred) triangle.
 
     bool found() const { return t >= 0.0f; }
 };

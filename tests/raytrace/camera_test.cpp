@@ -57,9 +57,12 @@ TEST(CameraTest, PerspectiveCentreShiftAndDifferentials) {
 
 TEST(CameraTest, LensIsUsedOnlyWhenSwitchedOnWithPositiveParameters) {
     EXPECT_FALSE(PerspectiveCamera("a", Mtx4(), nullptr, 1, 1, {0, 0}).usesLens());
-    EXPECT_FALSE(PerspectiveCamera("b", Mtx4(), nullptr, 1, 1, {0, 0}, 0, 1, 0.0f, 5.0f).usesLens());
-    EXPECT_FALSE(PerspectiveCamera("c", Mtx4(), nullptr, 1, 1, {0, 0}, 0, 1, 2.0f, -1.0f).usesLens());
-    EXPECT_FALSE(PerspectiveCamera("d", Mtx4(), nullptr, 1, 1, {0, 0}, 0, 0, 2.0f, 5.0f).usesLens());
+    EXPECT_FALSE(
+        PerspectiveCamera("b", Mtx4(), nullptr, 1, 1, {0, 0}, 0, 1, 0.0f, 5.0f).usesLens());
+    EXPECT_FALSE(
+        PerspectiveCamera("c", Mtx4(), nullptr, 1, 1, {0, 0}, 0, 1, 2.0f, -1.0f).usesLens());
+    EXPECT_FALSE(
+        PerspectiveCamera("d", Mtx4(), nullptr, 1, 1, {0, 0}, 0, 0, 2.0f, 5.0f).usesLens());
     PerspectiveCamera lens("e", Mtx4(), nullptr, 1, 1, {0, 0}, 3, 1, 2.0f, 5.0f);
     ASSERT_TRUE(lens.usesLens());
     EXPECT_FLOAT_EQ(lens.lensFactor(), 5.0f * 0.5f / 2.0f);

@@ -10,8 +10,8 @@
 #include "core/message.h"
 #include "raytrace/complete_grid.h"
 #include "raytrace/instance.h"
-#include "raytrace/shape.h"
 #include "raytrace/motion_blur.h"
+#include "raytrace/shape.h"
 #include "tests/raytrace/test_meshes.h"
 
 namespace ox {
@@ -136,8 +136,8 @@ TEST(CompleteGridTest, MatchesBruteForceOnOneMeshWithAndWithoutPackingAndNesting
     for (bool sse : {true, false})
         for (uint32_t depth : {0u, 4u})
             for (uint32_t flags : {kAllFlags, kAllFlags & ~kFlagDoubleSided}) {
-                SCOPED_TRACE(::testing::Message() << "sse " << sse << " depth " << depth
-                                                  << " flags " << flags);
+                SCOPED_TRACE(::testing::Message()
+                             << "sse " << sse << " depth " << depth << " flags " << flags);
                 ADSParameters p;
                 p.useSSE = sse;
                 p.gridMaxDepth = depth;
@@ -159,8 +159,8 @@ TEST(CompleteGridTest, MatchesBruteForceWithInstancesCopiedOrInstanced) {
     ins.push_back(instanceOf(blob, 0, rotationY(0.7f) * Mtx4::translation({2.5f, 0.5f, 0.0f}),
                              kAllFlags & ~kFlagDoubleSided, 1));
     ins.push_back(instanceOf(blob, 0, mirror, kAllFlags & ~kFlagDoubleSided, 2));
-    ins.push_back(instanceOf(coil, 1, Mtx4::scale({1.0f, 0.5f, 1.0f}), kAllFlags & ~kFlagCastShadows,
-                             3));
+    ins.push_back(
+        instanceOf(coil, 1, Mtx4::scale({1.0f, 0.5f, 1.0f}), kAllFlags & ~kFlagCastShadows, 3));
     ins.push_back(instanceOf(coil, 1, rotationY(1.3f) * Mtx4::translation({0.0f, 2.0f, 1.0f}),
                              (kAllFlags & ~kFlagDoubleSided) | kFlagOpposite, 4));
     for (int mode : {kInstancingNever, kInstancingAlways})
@@ -365,10 +365,10 @@ TEST(CompleteGridTest, InstancingDecisionsAndMessages) {
     EXPECT_EQ(b.shapeBaseGridCount(), 1u);
     EXPECT_EQ(b.primitiveCount(), 10u);
     for (const char *text :
-         {"Inserting Shapes into ADS", "Building ADS structure", "Building ADS: ",
-          "Built CompleteGrid with 10 primitives", "Number of shape grids      : 10",
-          "Number of shape base grids : 1", "Number of voxels                    : ",
-          "Max elements in a voxel             : "})
+         {"Inserting Shapes into ADS", "Building ADS structure",
+          "Building ADS: ", "Built CompleteGrid with 10 primitives",
+          "Number of shape grids      : 10", "Number of shape base grids : 1",
+          "Number of voxels                    : ", "Max elements in a voxel             : "})
         EXPECT_NE(out.find(text), std::string::npos) << text;
 
     // Displaced or moving instances are copied even when instancing is chosen.
@@ -472,19 +472,24 @@ TEST(MotionBlurTest, MovingTrianglesFollowTheRayTime) {
     r.origin = {0.2f, 0.2f, 10.0f};
     r.direction = {0, 0, -1};
     Hit h;
-    for (auto [time, z] : {std::pair{0.0f, 0.0f}, {0.25f, 0.5f}, {0.5f, 1.0f}, {0.75f, 2.5f},
-                           {1.0f, 4.0f}, {7.0f, 4.0f}, {-1.0f, 0.0f}}) {
+    for (auto [time, z] : {std::pair{0.0f, 0.0f},
+                           {0.25f, 0.5f},
+                           {0.5f, 1.0f},
+                           {0.75f, 2.5f},
+                           {1.0f, 4.0f},
+                           {7.0f, 4.0f},
+                           {-1.0f, 0.0f}}) {
         r.time = time;
         ASSERT_TRUE(g.intersect(r, h, nullptr)) << time;
         EXPECT_FLOAT_EQ(h.t, 10.0f - z) << time;
         EXPECT_TRUE(h.moving);
         const MotionTriangle *mt = static_cast<const MotionTriangle *>(h.primitive);
-        Vec3 p = MotionHitInterpolator::interpolate(&g.motionCorners(*mt), mt->steps, time, h.u,
-                                                    h.v);
+        Vec3 p =
+            MotionHitInterpolator::interpolate(&g.motionCorners(*mt), mt->steps, time, h.u, h.v);
         EXPECT_NEAR(p.z, z, 1e-5f);
         EXPECT_NEAR(p.x, 0.2f, 1e-6f);
         Vec3 mv = MotionBlurHandler::MotionVectorExtractor::extract(&g.motionCorners(*mt),
-                                                                     mt->steps, h.u, h.v);
+                                                                    mt->steps, h.u, h.v);
         EXPECT_EQ(mv, Vec3(0, 0, 4));
     }
     // Without the MotionBlur flag the instance stays put.
@@ -544,10 +549,52 @@ TEST(CompleteGridTest, BuildsFromSceneInstancesAndSharesTheirShapes) {
     ASSERT_TRUE(g.intersect(r, h, nullptr));
     EXPECT_EQ(h.instance, 2u);
     Vec3 p = r.origin + r.direction * h.t;
-    Vec3 q = owned[2]->objectToWorld().transformPoint(
-        shape.corner(h.id, 0) * (1 - h.u - h.v) + shape.corner(h.id, 1) * h.u +
-        shape.corner(h.id, 2) * h.v);
+    Vec3 q = owned[2]->objectToWorld().transformPoint(shape.corner(h.id, 0) * (1 - h.u - h.v) +
+                                                      shape.corner(h.id, 1) * h.u +
+                                                      shape.corner(h.id, 2) * h.v);
     EXPECT_NEAR((p - q).length(), 0.0f, 1e-5f);
+}
+
+}  // namespace
+}  // namespace ox
+
+namespace ox {
+namespace {
+
+TEST(CompleteGridTest, SecondStructureHoldsEnvelopeInstancesOnly) {
+    Mesh tri;
+    tri.positions = {{0, 0, 0}, {1, 0, 0}, {0, 1, 0}};
+    tri.indices = {0, 1, 2};
+    std::vector<InstanceInput> ins = {
+        instanceOf(tri, 0, Mtx4(), kAllFlags, 0, "plain"),
+        instanceOf(tri, 0, Mtx4::translation({0, 0, 2}), kAllFlags | kFlagEnvelop, 1, "cage")};
+    CompleteGrid g;
+    ASSERT_TRUE(g.build(ins, ADSParameters()));
+    Ray r;
+    r.origin = {0.2f, 0.2f, 5.0f};
+    r.direction = {0, 0, -1};
+    r.type = kRayEnvelope;
+    Hit h;
+    // Envelope rays see only the cage, in either structure.
+    ASSERT_TRUE(g.intersectSecond(r, h, kInfiniteDistance, nullptr));
+    EXPECT_EQ(h.instance, 1u);
+    EXPECT_FLOAT_EQ(h.t, 3.0f);
+    ASSERT_TRUE(g.intersect(r, h, nullptr));
+    EXPECT_EQ(h.instance, 1u);
+    // Primary rays see both in the main structure and only the cage in the second one.
+    r.type = kRayPrimary;
+    r.origin.z = 1.0f;
+    ASSERT_TRUE(g.intersect(r, h, nullptr));
+    EXPECT_EQ(h.instance, 0u);
+    EXPECT_FALSE(g.intersectSecond(r, h, kInfiniteDistance, nullptr));
+    r.origin.z = 5.0f;
+    ASSERT_TRUE(g.intersectSecond(r, h, kInfiniteDistance, nullptr));
+    EXPECT_EQ(h.instance, 1u);
+    ADSParameters none;
+    none.secondStructureMask = 0;
+    CompleteGrid empty;
+    ASSERT_TRUE(empty.build(ins, none));
+    EXPECT_FALSE(empty.intersectSecond(r, h, kInfiniteDistance, nullptr));
 }
 
 }  // namespace

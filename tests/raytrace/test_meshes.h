@@ -29,8 +29,8 @@ inline Mesh blob(uint32_t rings, uint32_t segments, float scale = 1.0f) {
                       0.08f * std::sin(11.0f * theta + 1.0f) * std::sin(7.0f * phi) +
                       0.02f * std::sin(37.0f * theta) * std::cos(29.0f * phi);
             // An "ear": a lobe stretched upwards on one side.
-            float ear = std::exp(-12.0f * ((theta - 0.5f) * (theta - 0.5f) +
-                                           (phi - 1.0f) * (phi - 1.0f)));
+            float ear =
+                std::exp(-12.0f * ((theta - 0.5f) * (theta - 0.5f) + (phi - 1.0f) * (phi - 1.0f)));
             r += 0.6f * ear;
             m.positions.push_back({scale * r * std::sin(theta) * std::cos(phi),
                                    scale * r * std::cos(theta),
@@ -87,7 +87,8 @@ struct Rng {
     }
     float uniform() { return float(next() & 0xFFFFFF) / float(0x1000000); }
     Vec3 inBox(const BBox &b) {
-        return {b.min.x + (b.max.x - b.min.x) * uniform(), b.min.y + (b.max.y - b.min.y) * uniform(),
+        return {b.min.x + (b.max.x - b.min.x) * uniform(),
+                b.min.y + (b.max.y - b.min.y) * uniform(),
                 b.min.z + (b.max.z - b.min.z) * uniform()};
     }
     Vec3 direction() {
