@@ -57,6 +57,7 @@ struct ImportedImage {
 struct ImportedMaterial {
     std::string name;
     bool twosided = true;
+    bool diffuseAlphaAsTransparency = false;
     float shininess = 1.0f;
     ImportedChannel diffuse, ambient, transparency, emissive, specular, reflection, normal;
 };

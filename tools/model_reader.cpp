@@ -561,7 +561,21 @@ private:
             out.transparency.color = Color(t, t, t, 1.0f);
             out.transparency.scale = 1.0f;
         }
-        readTexture(mat, aiTextureType_OPACITY, out.transparency);
+        ImportedChannel opacityMap;
+        if (readTexture(mat, aiTextureType_OPACITY, opacityMap)) {
+            // An opacity map that is the diffuse image's own alpha is said so; any other is an
+            // opacity (white = solid) where the channel wants transparency (white = clear).
+            if (!opacityMap.fileTexture.empty() &&
+                opacityMap.fileTexture == out.diffuse.fileTexture) {
+                out.diffuseAlphaAsTransparency = true;
+            } else {
+                message(kMsgWarning, 6,
+                        "Material %s: its opacity map is used as the transparency map, where "
+                        "white means clear",
+                        out.name.c_str());
+                out.transparency = opacityMap;
+            }
+        }
 
         if (mat.Get(AI_MATKEY_COLOR_EMISSIVE, c) == AI_SUCCESS && (c.r > 0 || c.g > 0 || c.b > 0))
             out.emissive.color = toColor(c), out.emissive.scale = 1.0f;

@@ -55,6 +55,7 @@ bool appendMaterial(const ImportedMaterial &m, std::string &out) {
     XMLMaterialBase &x = doc.object;
     x.Name = m.name;
     x.Twosided = m.twosided;
+    x.DiffuseAlphaAsTransparency = m.diffuseAlphaAsTransparency;
     x.Shininess = m.shininess;
     fillChannel(x.Diffuse, m.diffuse);
     fillChannel(x.Ambient, m.ambient);

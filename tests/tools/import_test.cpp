@@ -573,3 +573,27 @@ TEST_F(ImportTest, CornellExampleLoads) {
     EXPECT_NEAR(box.max.z, 0.5592f, 1e-6f);
     EXPECT_TRUE(scene.findShape("light"));
 }
+
+// An opacity map that is the diffuse image makes the diffuse alpha the transparency; another
+// opacity map goes into the transparency channel with a warning.
+TEST_F(ImportTest, OpacityMaps) {
+    writeText(path("op.mtl"),
+              "newmtl leaf\nKd 1 1 1\nmap_Kd leaf.png\nmap_d leaf.png\n"
+              "newmtl glass\nKd 1 1 1\nmap_d mask.png\n");
+    writeText(path("leaf.png"), "x");
+    writeText(path("mask.png"), "x");
+    writeText(path("op.obj"),
+              "mtllib op.mtl\nv 0 0 0\nv 1 0 0\nv 0 1 0\nvt 0 0\nvt 1 0\nvt 0 1\n"
+              "usemtl leaf\nf 1/1 2/2 3/3\nusemtl glass\nf 1/1 3/3 2/2\n");
+    ox::ImportedModel model;
+    ox::ImportStats stats;
+    ASSERT_TRUE(ox::readModel(path("op.obj"), ox::ImportOptions(), model, stats));
+    ASSERT_EQ(model.materials.size(), 2u);
+    const ox::ImportedMaterial &leaf = model.materials[0], &glass = model.materials[1];
+    EXPECT_EQ(leaf.name, "leaf");
+    EXPECT_TRUE(leaf.diffuseAlphaAsTransparency);
+    EXPECT_TRUE(leaf.transparency.fileTexture.empty());
+    EXPECT_FALSE(glass.diffuseAlphaAsTransparency);
+    EXPECT_EQ(glass.transparency.fileTexture, fs::canonical(path("mask.png")).string());
+    EXPECT_EQ(glass.transparency.scale, 1.0f);
+}
