@@ -536,6 +536,8 @@ public:
     const T &operator[](size_t i) const {
         return static_cast<const OXCType<T> &>(*elements_[i]).get();
     }
+    /// Mutable value of entry i.
+    T &ref(size_t i) { return static_cast<OXCType<T> &>(*elements_[i]).ref(); }
     /// Appends a value.
     void push(T v) { elements_.push_back(std::make_unique<OXCType<T>>("element", std::move(v))); }
     /// All values in order.
