@@ -34,11 +34,14 @@ sanitize: deps
 	cd $(SAN_DIR) && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
 		ctest --output-on-failure -j $(JOBS) --timeout 900
 
-# ThreadSanitizer over the tests.
+# ThreadSanitizer over the test programs of the threads, locks, work server and tile renderer.
+TSAN_TESTS ?= platform render
 tsan: deps
 	cmake -S . -B $(TSAN_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Debug -DOX_SANITIZE=thread -DOX_BUILD_BENCH=OFF
-	cmake --build $(TSAN_DIR) -j $(JOBS)
-	cd $(TSAN_DIR) && TSAN_OPTIONS=halt_on_error=1 ctest --output-on-failure -j $(JOBS) --timeout 900
+	cmake --build $(TSAN_DIR) -j $(JOBS) --target $(addsuffix _tests,$(TSAN_TESTS))
+	set -e; for t in $(TSAN_TESTS); do \
+		TSAN_OPTIONS="halt_on_error=1 second_deadlock_stack=1" $(TSAN_DIR)/tests/$$t/$${t}_tests; \
+	done
 
 clean:
 	rm -rf $(BUILD_DIR) $(SAN_DIR) $(TSAN_DIR)

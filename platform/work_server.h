@@ -97,8 +97,9 @@ private:
     friend class WorkThread;
     /// The dispatcher: pairs queued items with idle workers.
     void run() override;
-    /// Called by a worker after its item ran and was deleted.
-    void finished(WorkThread *thread, bool ok, const std::string &error);
+    /// Called by a worker after its item ran and was deleted; returns the next queued item
+    /// for that worker (which then stays busy), or null when it went idle.
+    Work *finished(WorkThread *thread, bool ok, const std::string &error);
     bool allDone() const { return queue_.empty() && busy_.empty(); }
     void runInline(float step);
 

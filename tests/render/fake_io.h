@@ -1,0 +1,46 @@
+#pragma once
+
+#include <atomic>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "core/render_io.h"
+
+namespace oxtest {
+
+/// Records what a run reports; can abort itself after a number of progress reports.
+class FakeIO : public ox::RenderIOInterface {
+public:
+    bool isAborted() const override { return aborted.load(); }
+    bool isReleased() override { return false; }
+    void setProgressTitle(const std::string &title) override {
+        std::lock_guard<std::mutex> lock(mutex);
+        events.push_back("title " + title);
+    }
+    void beginCommand() override { record("begin"); }
+    void endCommand() override { record("end"); }
+    void finish() override { record("finish"); }
+    void setProgress(float fraction) override {
+        std::lock_guard<std::mutex> lock(mutex);
+        progress.push_back(fraction);
+        if (abortAfter > 0 && int(progress.size()) >= abortAfter) aborted = true;
+    }
+    void abort() override { aborted = true; }
+    void release() override {}
+    void clearRelease() override {}
+    void refreshDisplay() override {}
+
+    void record(const char *e) {
+        std::lock_guard<std::mutex> lock(mutex);
+        events.push_back(e);
+    }
+
+    std::mutex mutex;
+    std::vector<std::string> events;
+    std::vector<float> progress;
+    std::atomic<bool> aborted{false};
+    int abortAfter = 0;
+};
+
+}  // namespace oxtest

@@ -1,0 +1,123 @@
+#include "render/tile_renderer.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <mutex>
+#include <thread>
+#include <vector>
+
+#include "tests/render/fake_io.h"
+
+namespace {
+
+/// Counts how often each pixel is rendered; fails on a chosen tile.
+class CountingRenderer : public ox::TileRenderer {
+public:
+    CountingRenderer(int w, int h, int failAt = -1)
+        : w_(w), pixels_(size_t(w) * size_t(h)), failAt_(failAt) {}
+
+    std::vector<std::atomic<int>> &pixels() { return pixels_; }
+    std::atomic<int> tilesRendered{0};
+    std::vector<int> finishedOrder;
+    int prepared = 0;
+    bool released = false;
+    std::vector<int> tilesPerThread;
+
+protected:
+    bool prepare(int threadCount) override {
+        prepared = threadCount;
+        tilesPerThread.assign(size_t(threadCount), 0);
+        return true;
+    }
+    bool renderTile(int thread, const ox::Tile &tile) override {
+        int n = tilesRendered.fetch_add(1);
+        if (n == failAt_) return false;
+        for (uint32_t y = tile.yMin; y <= tile.yMax; ++y)
+            for (uint32_t x = tile.xMin; x <= tile.xMax; ++x)
+                pixels_[size_t(y) * size_t(w_) + x].fetch_add(1);
+        ++tilesPerThread[size_t(thread)];  // each thread owns its slot
+        std::this_thread::yield();
+        return true;
+    }
+    void threadFinished(int thread) override { finishedOrder.push_back(thread); }
+    void release() override { released = true; }
+
+private:
+    int w_;
+    std::vector<std::atomic<int>> pixels_;
+    int failAt_;
+};
+
+ox::TileRunSettings settingsFor(int w, int h, int tile, int scheme, int threads) {
+    ox::TileRunSettings s;
+    s.xMin = 0, s.xMax = uint32_t(w - 1), s.yMin = 0, s.yMax = uint32_t(h - 1);
+    s.tileWidth = s.tileHeight = tile;
+    s.scheme = scheme;
+    s.threadCount = threads;
+    return s;
+}
+
+TEST(TileRendererTest, EveryPixelOnceWithMoreThreadsThanCores) {
+    for (int scheme = 0; scheme < 4; ++scheme) {
+        CountingRenderer r(61, 47);
+        oxtest::FakeIO io;
+        ASSERT_TRUE(r.run(settingsFor(61, 47, 4, scheme, 8), io));
+        EXPECT_EQ(r.prepared, 8);
+        EXPECT_TRUE(r.released);
+        for (auto &p : r.pixels()) ASSERT_EQ(p.load(), 1) << "scheme " << scheme;
+        EXPECT_EQ(r.finishedOrder, (std::vector<int>{0, 1, 2, 3, 4, 5, 6, 7}));
+        int total = 0;
+        for (int n : r.tilesPerThread) total += n;
+        EXPECT_EQ(total, 16 * 12);
+        // Progress reports never go down and end at 1.
+        ASSERT_EQ(io.progress.size(), size_t(16 * 12));
+        for (size_t i = 1; i < io.progress.size(); ++i)
+            ASSERT_GT(io.progress[i], io.progress[i - 1]);
+        EXPECT_EQ(io.progress.back(), 1.0f);
+        EXPECT_EQ(r.tiles(), nullptr);
+    }
+}
+
+TEST(TileRendererTest, AbortStopsBetweenTiles) {
+    CountingRenderer r(64, 64);
+    oxtest::FakeIO io;
+    io.abortAfter = 10;
+    ASSERT_TRUE(r.run(settingsFor(64, 64, 4, ox::kTileHilbert, 6), io));
+    EXPECT_TRUE(io.isAborted());
+    // Threads that already held a tile finish it; nobody takes a new one.
+    EXPECT_GE(r.tilesRendered.load(), 10);
+    EXPECT_LE(r.tilesRendered.load(), 10 + 6);
+    int rendered = 0;
+    for (auto &p : r.pixels()) {
+        ASSERT_LE(p.load(), 1);
+        rendered += p.load();
+    }
+    EXPECT_EQ(rendered, r.tilesRendered.load() * 16);
+}
+
+TEST(TileRendererTest, FailingTileStopsTheRun) {
+    CountingRenderer r(64, 64, 5);
+    oxtest::FakeIO io;
+    EXPECT_FALSE(r.run(settingsFor(64, 64, 4, ox::kTileRandom, 4), io));
+    EXPECT_LT(r.tilesRendered.load(), 256);
+    EXPECT_TRUE(r.released);
+    EXPECT_EQ(r.finishedOrder.size(), 4u);
+}
+
+TEST(TileRendererTest, FewTilesAndNoTiles) {
+    CountingRenderer r(8, 8);
+    oxtest::FakeIO io;
+    ASSERT_TRUE(r.run(settingsFor(8, 8, 32, ox::kTileConcentric, 16), io));
+    EXPECT_EQ(r.threadCount(), 1);  // one tile needs one thread
+    EXPECT_EQ(r.pixels()[63].load(), 1);
+
+    CountingRenderer empty(1, 1);
+    ox::TileRunSettings s = settingsFor(1, 1, 32, 0, 4);
+    s.xMin = 5;  // xMax < xMin
+    ASSERT_TRUE(empty.run(s, io));
+    EXPECT_EQ(empty.tilesRendered.load(), 0);
+    EXPECT_TRUE(empty.released);
+}
+
+}  // namespace
