@@ -14,6 +14,7 @@
 #include <thread>
 
 #include "config/input_list.h"
+#include "config/ox_config.h"
 #include "config/type.h"
 #include "core/message.h"
 #include "tests/config/test_settings.h"
@@ -516,4 +517,47 @@ TEST_F(ConfigXml, StreamingReaderNeverExpandsEntities) {
     if (!names.empty()) {
         EXPECT_EQ(names[0], "x&y");  // predefined entities only
     }
+}
+
+namespace {
+
+/// Gives every vector of the tree (and of the entries it adds, to `depth` levels) one entry
+/// with defaults, so that every settings class of the configuration takes part.
+int fillVectors(ox::OXCTypeBase &v, int depth) {
+    int added = 0;
+    if (v.kind() == ox::OXCKind::Complex) {
+        for (const auto &m : static_cast<ox::OXCComplexType &>(v).members())
+            added += fillVectors(*m.value, depth);
+    } else if (v.kind() == ox::OXCKind::Vector && depth > 0) {
+        auto &vec = static_cast<ox::OXCTypeVector &>(v);
+        auto entry = vec.newElement();
+        if (entry->kind() == ox::OXCKind::String)
+            static_cast<ox::OXCType<std::string> &>(*entry).set("entry of " + vec.name());
+        added += 1 + fillVectors(*entry, depth - 1);
+        vec.append(std::move(entry));
+    }
+    return added;
+}
+
+}  // namespace
+
+TEST_F(ConfigXml, WholeConfigurationWithEveryVectorFilledRoundTrips) {
+    ox::OXConfig config;
+    int added = fillVectors(config, 3);
+    EXPECT_GT(added, 10);
+    ASSERT_TRUE(ox::writeSettings("full.xml", config));
+    ox::OXConfig loaded;
+    CaptureStdout();
+    ASSERT_TRUE(ox::loadSettings("full.xml", loaded));
+    EXPECT_EQ(GetCapturedStdout().find("[WARNING]"), std::string::npos);
+    ASSERT_TRUE(ox::writeSettings("again.xml", loaded));
+    EXPECT_EQ(readFile("full.xml"), readFile("again.xml"));
+    ASSERT_TRUE(ox::writeSchema("full.xsd", config));
+    int rc = std::system("xmllint --noout --schema full.xsd full.xml > lint.txt 2>&1");
+    EXPECT_EQ(rc, 0) << readFile("lint.txt");
+    // A clone writes the same file.
+    std::string a, b;
+    ASSERT_TRUE(ox::writeSettingsToString(a, config));
+    ASSERT_TRUE(ox::writeSettingsToString(b, *config.clone()));
+    EXPECT_EQ(a, b);
 }
