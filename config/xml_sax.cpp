@@ -1,6 +1,7 @@
 #include <libxml/entities.h>
 #include <libxml/parser.h>
 #include <libxml/parserInternals.h>
+#include <libxml/tree.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -169,6 +170,11 @@ bool runPushParse(Parse &p, const std::string &name,
     }
     bool wellFormed = ctxt->wellFormed != 0;
     p.ctxt = nullptr;
+    // Entity declarations make the library keep a document of its own even in SAX mode.
+    if (ctxt->myDoc) {
+        xmlFreeDoc(ctxt->myDoc);
+        ctxt->myDoc = nullptr;
+    }
     xmlFreeParserCtxt(ctxt);
 
     if (readError) return false;  // reported by the feeder
