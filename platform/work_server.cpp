@@ -95,7 +95,15 @@ WorkServer::WorkServer(int threadCount, bool threaded)
         threads_.push_back(std::make_unique<WorkThread>(*this, i));
         idle_.push_back(threads_.back().get());
     }
-    for (auto &t : threads_) t->start();
+    // A worker the system refuses to start is left out; with none at all the items run on
+    // the waiting thread instead.
+    for (auto &t : threads_) {
+        if (!t->start()) idle_.erase(std::find(idle_.begin(), idle_.end(), t.get()));
+    }
+    if (idle_.empty()) {
+        threaded_ = false;
+        return;
+    }
     dispatcher_ = createMiniThread(this, nullptr, true, "Work Dispatcher");
 }
 
@@ -129,10 +137,7 @@ bool WorkServer::start() {
     if (started_) return true;
     started_ = true;
     if (!threaded_) return true;
-    if (!dispatcher_->start()) {
-        started_ = false;
-        return false;
-    }
+    if (!dispatcher_->start()) threaded_ = false;  // the waiting thread runs the items
     return true;
 }
 

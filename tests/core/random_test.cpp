@@ -2,7 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdint>
+#include <thread>
 #include <vector>
 
 namespace {
@@ -91,6 +93,26 @@ TEST(RandomTest, IndexOfADrawIsClamped) {
         int64_t k = r.nextIndex(3);
         ASSERT_TRUE(k >= 0 && k < 3);
     }
+}
+
+TEST(RandomTest, ProcessGeneratorHandsEachDrawToOneThread) {
+    // Four threads drawing at once take disjoint pieces of one sequence: together they see
+    // exactly the draws of a single generator, none twice and none lost.
+    ox::reseedProcessRandom(12345);
+    std::vector<std::vector<float>> drawn(4);
+    std::vector<std::thread> threads;
+    for (auto &d : drawn)
+        threads.emplace_back([&d] {
+            for (int i = 0; i < 5000; ++i) d.push_back(ox::processRandom());
+        });
+    for (auto &t : threads) t.join();
+    std::vector<float> all, expected;
+    for (auto &d : drawn) all.insert(all.end(), d.begin(), d.end());
+    ox::Random single(12345);
+    for (int i = 0; i < 20000; ++i) expected.push_back(single.next());
+    std::sort(all.begin(), all.end());
+    std::sort(expected.begin(), expected.end());
+    EXPECT_EQ(all, expected);
 }
 
 }  // namespace
