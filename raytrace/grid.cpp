@@ -189,7 +189,7 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     float maxAbs = std::max({std::fabs(b.min.x), std::fabs(b.min.y), std::fabs(b.min.z),
                              std::fabs(b.max.x), std::fabs(b.max.y), std::fabs(b.max.z)});
     float minCell = std::min({cellSize_.x, cellSize_.y, cellSize_.z});
-    margin_ = std::min(tolerance_, 0.05f * minCell) + 4e-7f * maxAbs;
+    margin_ = std::min(tolerance_, 0.01f * minCell) + 4e-7f * maxAbs;
     insertAll(prims);
     return true;
 }
