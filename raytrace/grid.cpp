@@ -653,28 +653,23 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     }
     if (!(t0 <= t1)) return false;
 
-    // Per axis: the cell index, the step, the distance to the next cell plane, and what is
-    // needed to recompute that distance exactly from the plane index after each step.
+    // Per axis: the cell index, the step, the index of the next cell plane and the distance to
+    // it (recomputed exactly from the plane index after each step), and the distance between
+    // planes. An axis the ray does not move along has its next plane at infinity.
     int64_t idx[3], step[3], next[3];
-    float tNext[3], base[3];
+    float tNext[3], base[3], delta[3];
     const int64_t n[3] = {nx_, ny_, nz_};
     for (int a = 0; a < 3; ++a) {
         float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * t0;
         idx[a] = cellCoord(p, a);
         base[a] = box_.min[a] - r.o[a];
-        if (r.d[a] > 0.0f) {
-            step[a] = 1;
-            next[a] = idx[a] + 1;
-        } else if (r.d[a] < 0.0f) {
-            step[a] = -1;
-            next[a] = idx[a];
-        } else {
-            step[a] = 0;
-            next[a] = 0;
-        }
-        tNext[a] =
-            step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
+        step[a] = r.d[a] > 0.0f ? 1 : (r.d[a] < 0.0f ? -1 : 0);
+        next[a] = idx[a] + (step[a] > 0);
+        tNext[a] = step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a]
+                           : kInfiniteDistance;
+        delta[a] = step[a] ? cellSize_[a] * std::fabs(r.inv[a]) : kInfiniteDistance;
     }
+    const int64_t stride[3] = {1, nx_, nx_ * ny_};
     int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
     const uint8_t *distance = distance_.data();
     const CellRef *cells = cells_.data();
@@ -692,34 +687,26 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 found = true;
             }
         } else if (dist >= 2) {
-            // Every cell within dist - 1 of this one is empty: leave that cube in one jump.
-            int64_t reach = int64_t(dist) - 1;
-            int axis = -1;
-            float tExit = kInfiniteDistance;
-            for (int a = 0; a < 3; ++a) {
-                if (!step[a]) continue;
-                int64_t plane = step[a] > 0 ? idx[a] + reach + 1 : idx[a] - reach;
-                plane = std::clamp<int64_t>(plane, 0, n[a]);
-                float t = (base[a] + float(plane) * cellSize_[a]) * r.inv[a];
-                if (t < tExit) tExit = t, axis = a;
-            }
-            if (axis < 0 || tExit >= s.limit) break;
-            int64_t jumped = idx[axis] + step[axis] * (reach + 1);
-            if (jumped < 0 || jumped >= n[axis]) break;
-            for (int a = 0; a < 3; ++a) {
-                if (a == axis) {
-                    idx[a] = jumped;
-                } else {
-                    float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * tExit;
-                    // Stay inside the cube (rounding must not skip a cell beside it).
-                    idx[a] =
-                        std::clamp<int64_t>(cellCoord(p, a), std::max<int64_t>(0, idx[a] - reach),
-                                            std::min<int64_t>(n[a] - 1, idx[a] + reach));
+            // Every cell within dist - 1 of this one is empty: leave that cube in one jump
+            // through its nearest far face; the other axes catch up with ordinary steps.
+            float reach = float(dist - 1);
+            float e0 = tNext[0] + reach * delta[0], e1 = tNext[1] + reach * delta[1],
+                  e2 = tNext[2] + reach * delta[2];
+            int a = e0 < e1 ? (e0 < e2 ? 0 : 2) : (e1 < e2 ? 1 : 2);
+            float tExit = a == 0 ? e0 : a == 1 ? e1 : e2;
+            if (!(tExit < s.limit)) break;
+            idx[a] += step[a] * int64_t(dist);
+            if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
+            next[a] = idx[a] + (step[a] > 0);
+            tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
+            for (int b = 0; b < 3; ++b) {
+                if (b == a) continue;
+                for (uint32_t k = dist - 1; k > 0 && tNext[b] < tExit; --k) {
+                    idx[b] += step[b];
+                    next[b] += step[b];
+                    tNext[b] = (base[b] + float(next[b]) * cellSize_[b]) * r.inv[b];
                 }
-                if (step[a]) {
-                    next[a] = step[a] > 0 ? idx[a] + 1 : idx[a];
-                    tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
-                }
+                if (uint64_t(idx[b]) >= uint64_t(n[b])) return found;
             }
             cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
             continue;
@@ -730,7 +717,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         if (tNext[a] >= s.limit) break;
         idx[a] += step[a];
         if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
-        cell += a == 0 ? step[0] : a == 1 ? step[1] * nx_ : step[2] * nx_ * ny_;
+        cell += step[a] * stride[a];
         next[a] += step[a];
         tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
     }
