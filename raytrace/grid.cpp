@@ -536,13 +536,14 @@ inline bool testPacket(const IntersectSSETriangle &pk, const TraceRay &r, TraceS
     return true;
 }
 
-// Lanes of the group whose box the ray passes through between 0 and the limit.
-inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit) {
+// Lanes of the group whose box the ray passes through between 0 and the limit, and the
+// distances at which it enters them.
+inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit, float4 &tnear) {
     float4 t0x = (float4::load(g.lo[0]) - r.ox) * r.ix, t1x = (float4::load(g.hi[0]) - r.ox) * r.ix;
     float4 t0y = (float4::load(g.lo[1]) - r.oy) * r.iy, t1y = (float4::load(g.hi[1]) - r.oy) * r.iy;
     float4 t0z = (float4::load(g.lo[2]) - r.oz) * r.iz, t1z = (float4::load(g.hi[2]) - r.oz) * r.iz;
-    float4 tnear = _mm_max_ps(_mm_max_ps(_mm_min_ps(t0x, t1x), _mm_min_ps(t0y, t1y)),
-                              _mm_max_ps(_mm_min_ps(t0z, t1z), float4::zero()));
+    tnear = _mm_max_ps(_mm_max_ps(_mm_min_ps(t0x, t1x), _mm_min_ps(t0y, t1y)),
+                       _mm_max_ps(_mm_min_ps(t0z, t1z), float4::zero()));
     float4 tfar = _mm_min_ps(_mm_min_ps(_mm_max_ps(t0x, t1x), _mm_max_ps(t0y, t1y)),
                              _mm_min_ps(_mm_max_ps(t0z, t1z), float4(limit)));
     return movemask(_mm_cmple_ps(tnear, tfar)) & ((1 << g.count) - 1);
@@ -567,13 +568,16 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
             }
             case kItemGroup: {
                 const PacketGroup &g = *groupAt(index);
-                int mask = groupMask(g, r, s.limit);
+                float4 tnear;
+                int mask = groupMask(g, r, s.limit, tnear);
                 while (mask) {
                     int lane = __builtin_ctz(mask);
                     mask &= mask - 1;
                     if (testPacket<kAny>(*packetAt(g.first + lane * kPacketBlocks), r, s)) {
                         if constexpr (kAny) return true;
                         hit = true;
+                        // Boxes entered beyond the new closest hit cannot hold a closer one.
+                        mask &= movemask(_mm_cmple_ps(tnear, float4(s.limit)));
                     }
                 }
                 break;
