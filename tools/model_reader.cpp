@@ -15,6 +15,7 @@
 #include <cstring>
 #include <filesystem>
 #include <map>
+#include <new>
 #include <numbers>
 #include <string_view>
 #include <unordered_set>
@@ -768,6 +769,15 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
     }
 }
 
+const char *const kTooMuchMemory = "it asks for more memory than there is (a damaged file?)";
+
+// The reader's reason; a failed allocation (the library reports the exception's name) in words.
+std::string readerError(const Assimp::Importer &importer) {
+    std::string text = importer.GetErrorString();
+    if (text.find("bad_alloc") != std::string::npos) return kTooMuchMemory;
+    return text.empty() ? "unknown reason" : text;
+}
+
 }  // namespace
 
 Mtx4 conversionMatrix(const ImportOptions &options) {
@@ -841,7 +851,7 @@ bool readModel(const std::string &path, const ImportOptions &options, ImportedMo
         const aiScene *read = importer.ReadFile(path, 0);
         if (!read) {
             message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(),
-                    importer.GetErrorString());
+                    readerError(importer).c_str());
             return false;
         }
         sanitizeMeshes(*const_cast<aiScene *>(read), stats);
@@ -851,13 +861,16 @@ bool readModel(const std::string &path, const ImportOptions &options, ImportedMo
         const aiScene *scene = importer.ApplyPostProcessing(flags);
         if (!scene) {
             message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(),
-                    importer.GetErrorString());
+                    readerError(importer).c_str());
             return false;
         }
         ImportedModel result;
         ModelWalker walker(*scene, options, path, stats);
         walker.walk(result);
         model = std::move(result);
+    } catch (const std::bad_alloc &) {
+        message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), kTooMuchMemory);
+        return false;
     } catch (const std::exception &e) {
         message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), e.what());
         return false;
