@@ -7,6 +7,7 @@
 #include <thread>
 #include <vector>
 
+#include "core/render_io_console.h"
 #include "tests/render/fake_io.h"
 
 namespace {
@@ -118,6 +119,21 @@ TEST(TileRendererTest, FewTilesAndNoTiles) {
     ASSERT_TRUE(empty.run(s, io));
     EXPECT_EQ(empty.tilesRendered.load(), 0);
     EXPECT_TRUE(empty.released);
+}
+
+TEST(TileRendererTest, ConsoleProgressReachesOneHundredOnce) {
+    CountingRenderer r(100, 50);
+    ox::RioImpl io(0.1f);
+    testing::internal::CaptureStdout();
+    ASSERT_TRUE(r.run(settingsFor(100, 50, 3, ox::kTileRandom, 5), io));
+    io.finish();
+    std::string out = testing::internal::GetCapturedStdout();
+    std::vector<std::string> lines;
+    for (size_t p = 0; (p = out.find("Progress ", p)) != std::string::npos; ++p)
+        lines.push_back(out.substr(p, out.find('\n', p) - p));
+    ASSERT_EQ(lines.size(), 10u) << out;
+    EXPECT_EQ(lines.front(), "Progress 10.0%");
+    EXPECT_EQ(lines.back(), "Progress 100.0%");
 }
 
 }  // namespace
