@@ -1,7 +1,9 @@
 // Scheduler benchmarks: the cost of handing out tiles, and how a compute-bound tile loop
 // scales with threads.
 #include <benchmark/benchmark.h>
+#include <sys/resource.h>
 
+#include <chrono>
 #include <cmath>
 
 #include "core/message.h"
@@ -52,6 +54,13 @@ protected:
     }
 };
 
+double processCpuSeconds() {
+    rusage u{};
+    getrusage(RUSAGE_SELF, &u);
+    return double(u.ru_utime.tv_sec + u.ru_stime.tv_sec) +
+           double(u.ru_utime.tv_usec + u.ru_stime.tv_usec) * 1e-6;
+}
+
 ox::TileRunSettings region(uint32_t w, uint32_t h, int tile, int threads, int scheme) {
     ox::TileRunSettings s;
     s.xMax = w - 1;
@@ -89,8 +98,20 @@ void BM_ComputeTiles(benchmark::State &state) {
     SilentIO io;
     ComputeRenderer r;
     const auto s = region(256, 256, 16, threads, ox::kTileHilbert);
-    for (auto _ : state) r.run(s, io);
+    double cpu = 0.0, wall = 0.0;
+    for (auto _ : state) {
+        const double c0 = processCpuSeconds();
+        const auto w0 = std::chrono::steady_clock::now();
+        r.run(s, io);
+        wall += std::chrono::duration<double>(std::chrono::steady_clock::now() - w0).count();
+        cpu += processCpuSeconds() - c0;
+    }
     state.SetItemsProcessed(state.iterations() * 256 * 256);
+    // The cores the loop really got: on a busy machine two threads may share one core, and
+    // the real time then cannot show the scaling.
+    state.counters["cores_used"] = wall > 0.0 ? cpu / wall : 0.0;
+    // Pixels per CPU second: equal for 1 and 2 threads when the scheduler costs nothing.
+    state.counters["px_per_cpu_s"] = cpu > 0.0 ? double(state.iterations()) * 65536.0 / cpu : 0.0;
 }
 BENCHMARK(BM_ComputeTiles)->Arg(1)->Arg(2)->UseRealTime()->Unit(benchmark::kMillisecond);
 
