@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <cmath>
+#include <exception>
 #include <map>
 
 #include "core/message.h"
@@ -177,6 +178,22 @@ size_t CompleteGrid::sizeBytes() const {
 
 bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSParameters &params,
                          const MotionBlurHandler *motion) {
+    // Allocation failures of a scene too large for memory end the build with one message.
+    try {
+        return buildStructure(instances, params, motion);
+    } catch (const std::exception &) {
+        store_ = PrimitiveStore();
+        secondStore_ = PrimitiveStore();
+        shapes_.clear();
+        grid_.build(store_, {}, BBox(), GridParams());
+        second_.build(secondStore_, {}, BBox(), GridParams());
+        message(kMsgError, 1, "Not enough memory to build the acceleration structure");
+        return false;
+    }
+}
+
+bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,
+                                  const ADSParameters &params, const MotionBlurHandler *motion) {
     auto start = std::chrono::steady_clock::now();
     store_ = PrimitiveStore();
     secondStore_ = PrimitiveStore();

@@ -131,6 +131,8 @@ private:
         PrimitiveStore store;
         Grid grid;
     };
+    bool buildStructure(const std::vector<InstanceInput> &instances, const ADSParameters &params,
+                        const MotionBlurHandler *motion);
     template <bool kAny>
     bool query(const Grid &grid, const PrimitiveStore &store, const Ray &ray, Hit *hit, float tmax,
                RayCounter *counter) const;

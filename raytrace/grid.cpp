@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <stdexcept>
 #include <string>
 
 #include "core/message.h"
@@ -244,6 +245,8 @@ void Grid::insertAll(const std::vector<uint32_t> &prims) {
                     if (overlaps(code, b, cellBox(x, y, z)))
                         pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
     }
+    // Cell lists are indexed with 32 bits.
+    if (pairs.size() > 0xFFFFFFFFull) throw std::length_error("too many cell references");
     buildBegin_.assign(ncells + 1, 0);
     for (const auto &p : pairs) ++buildBegin_[p.first + 1];
     for (size_t i = 0; i < ncells; ++i) buildBegin_[i + 1] += buildBegin_[i];
@@ -390,6 +393,13 @@ void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
     Vec3 vpad(pad, pad, pad);
     BBox clip(cell.min - vpad, cell.max + vpad);
     size_t packetCount = (keyed.size() + 3) / 4;
+    // Item codes address at most 2^29 blocks; a structure that large keeps the remaining
+    // triangles unpacked (the same test, one triangle at a time).
+    size_t blocks = packetCount * kPacketBlocks + (packetCount + 3) / 4 * kGroupBlocks;
+    if (blob_.size() + blocks > kMaxItemIndex) {
+        for (const auto &k : keyed) items_.push_back(itemCode(kItemTriangle, k.second));
+        return;
+    }
     bool grouped = packetCount > 1;
     for (size_t g = 0; g < packetCount; g += 4) {
         uint32_t count = uint32_t(std::min<size_t>(4, packetCount - g));
@@ -669,8 +679,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         base[a] = box_.min[a] - r.o[a];
         step[a] = r.d[a] > 0.0f ? 1 : (r.d[a] < 0.0f ? -1 : 0);
         next[a] = idx[a] + (step[a] > 0);
-        tNext[a] = step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a]
-                           : kInfiniteDistance;
+        tNext[a] =
+            step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
         delta[a] = step[a] ? cellSize_[a] * std::fabs(r.inv[a]) : kInfiniteDistance;
     }
     const int64_t stride[3] = {1, nx_, nx_ * ny_};
