@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <charconv>
 #include <cstdio>
+#include <typeinfo>
 
 #include "core/message.h"
 
@@ -264,7 +265,7 @@ bool OXCTypeVector::add(const OXCTypeBase &entry) {
         message(kMsgWarning, 1, "Type error when assigning variable %s", entry.name().c_str());
         return false;
     }
-    elements_.push_back(entry.clone());
+    elements_.push_back(convert(entry));
     return true;
 }
 
@@ -274,8 +275,19 @@ bool OXCTypeVector::append(std::unique_ptr<OXCTypeBase> entry) {
                 entry ? entry->name().c_str() : "");
         return false;
     }
-    elements_.push_back(std::move(entry));
+    if (typeid(*entry) == typeid(*prototype_) && entry->name() == prototype_->name())
+        elements_.push_back(std::move(entry));
+    else
+        elements_.push_back(convert(*entry));
     return true;
+}
+
+std::unique_ptr<OXCTypeBase> OXCTypeVector::convert(const OXCTypeBase &entry) const {
+    // Entries are always made from the prototype: typed accessors rely on the C++ class of
+    // every entry, which an entry of another class with the same type name would not have.
+    std::unique_ptr<OXCTypeBase> e = newElement();
+    copyInto(*e, entry);
+    return e;
 }
 
 void OXCTypeVector::copyElementsFrom(const OXCTypeVector &other) {
@@ -333,7 +345,7 @@ void OXCAssignVisitor::visit(OXCTypeVector &value) {
     for (size_t i = 0; i < source.size(); ++i)
         if (!value.accepts(source.element(i))) return typeError();
     if (replaceVectors_) value.clear();
-    for (size_t i = 0; i < source.size(); ++i) value.append(source.element(i).clone());
+    for (size_t i = 0; i < source.size(); ++i) value.add(source.element(i));
 }
 
 void assign(OXCTypeBase &target, const OXCTypeBase &source) {

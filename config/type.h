@@ -513,6 +513,8 @@ public:
     std::unique_ptr<OXCTypeBase> clone() const override;
 
 protected:
+    /// A new entry of the prototype's class holding the content of `entry` (same type).
+    std::unique_ptr<OXCTypeBase> convert(const OXCTypeBase &entry) const;
     /// Deep copy of the entries of `other` (same element type) into this vector.
     void copyElementsFrom(const OXCTypeVector &other);
 
@@ -573,6 +575,7 @@ public:
     T &operator[](size_t i) { return static_cast<Element &>(*elements_[i]); }
     /// Entry i.
     const T &operator[](size_t i) const { return static_cast<const Element &>(*elements_[i]); }
+    using OXCTypeVector::append;
     /// Appends a new entry with defaults and returns it.
     T &append() {
         elements_.push_back(std::make_unique<Element>());

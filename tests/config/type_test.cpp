@@ -33,6 +33,14 @@ public:
     ox::OXCType<bool> undocumented{this, "plain", false, nullptr};
 };
 
+/// Another class with the type name of TargetBase (and one key more).
+class LookAlikeTargetBase : public ox::OXCComplexType {
+public:
+    LookAlikeTargetBase() : OXCComplexType("Target") {}
+    ox::OXCType<std::string> name{this, "name", "", "Target name"};
+    ox::OXCType<int32_t> extra{this, "extra", 0, "Not in TargetBase"};
+};
+
 }  // namespace
 
 static_assert(!std::is_copy_constructible_v<All> && !std::is_move_constructible_v<All>);
@@ -198,4 +206,35 @@ TEST(ConfigType, CloneIsDeepAndIndependent) {
     std::unique_ptr<ox::OXCTypeBase> vec = a.targets.clone();
     EXPECT_TRUE(ox::sameType(*vec, a.targets));
     EXPECT_EQ(static_cast<ox::OXCTypeVector &>(*vec).size(), 1u);
+}
+
+TEST(ConfigType, VectorEntriesAlwaysHaveTheElementClass) {
+    // Entries of another C++ class with the same type name are converted, never stored as they
+    // are: the typed accessors must see a TargetBase.
+    ox::OXCTypeVector lookAlikes(
+        "targets", std::make_unique<ox::OXCComplexTypeInstantiator<LookAlikeTargetBase>>());
+    ox::OXCComplexTypeInstantiator<LookAlikeTargetBase> one;
+    one.name = "converted";
+    one.extra = 5;
+    ASSERT_TRUE(lookAlikes.add(one));
+    All all;
+    CaptureStdout();
+    ox::assign(all.targets, lookAlikes);
+    EXPECT_EQ(
+        countOf(GetCapturedStdout(), "Unknown target for assignment extra in complex type Target"),
+        1);
+    ASSERT_EQ(all.targets.size(), 1u);
+    EXPECT_EQ(all.targets[0].name.get(), "converted");
+    EXPECT_NE(dynamic_cast<TargetBase *>(&all.targets.element(0)), nullptr);
+
+    CaptureStdout();
+    EXPECT_TRUE(all.targets.append(one.clone()));
+    GetCapturedStdout();
+    EXPECT_NE(dynamic_cast<TargetBase *>(&all.targets.element(1)), nullptr);
+    EXPECT_EQ(all.targets[1].name.get(), "converted");
+
+    // Scalar entries take the prototype's name.
+    ox::OXCType<std::string> named("whatever", "v");
+    ASSERT_TRUE(all.files.add(named));
+    EXPECT_EQ(all.files.element(0).name(), "element");
 }
