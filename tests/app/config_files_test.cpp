@@ -98,3 +98,13 @@ TEST_F(ConfigFiles, LoadingOverTheDefaults) {
             << bad.out;
     }
 }
+
+TEST_F(ConfigFiles, AFailedWriteReturnsTheSystemErrorAndLeavesNothingBehind) {
+    fs::create_directories(dir_ / "config.xml");
+    Outcome c = thevorn("-c");
+    EXPECT_EQ(c.exitCode, 21) << c.out;  // EISDIR
+    EXPECT_NE(c.out.find("Unable to write config.xml"), std::string::npos) << c.out;
+    EXPECT_TRUE(fs::is_directory(dir_ / "config.xml"));
+    for (const auto &e : fs::directory_iterator(dir_))
+        EXPECT_EQ(e.path().filename().string().find(".tmp"), std::string::npos);
+}
