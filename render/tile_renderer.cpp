@@ -55,8 +55,6 @@ void TileRenderer::renderThread(int threadIndex) {
     Tile tile;
     bool rendered = false;  // a tile was rendered and is not yet counted
     for (;;) {
-        // Aborts and failures take effect between tiles, never inside one.
-        const bool stop = io_->isAborted() || failed_.load(std::memory_order_relaxed);
         bool have = false;
         {
             // One visit to the tile mutex per tile: count the finished tile, report progress
@@ -66,6 +64,10 @@ void TileRenderer::renderThread(int threadIndex) {
                 tiles_->markFinished();
                 io_->setProgress(tiles_->progress());
             }
+            // Aborts and failures take effect between tiles, never inside one. The test comes
+            // after the report, under the mutex, so an abort raised by any report (this one
+            // included) stops every later hand-out.
+            const bool stop = io_->isAborted() || failed_.load(std::memory_order_relaxed);
             if (!stop) have = tiles_->nextTile(tile);
         }
         if (!have) return;
