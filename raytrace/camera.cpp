@@ -90,7 +90,9 @@ void PerspectiveCamera::generateRay(const Vec2 &image, const Vec2 &lens, Ray &ra
     } else {
         ray.dDdx = ray.dDdy = Vec3();
     }
-    if (lensFactor_ <= 0.0f) {
+    float along = dot(dir, cUnit_);
+    // Without a lens, or for a direction that never meets the focal plane, the pinhole ray.
+    if (lensFactor_ <= 0.0f || !(along > 0.0f)) {
         ray.origin = pos_;
         ray.direction = dir;
         return;
@@ -98,7 +100,7 @@ void PerspectiveCamera::generateRay(const Vec2 &image, const Vec2 &lens, Ray &ra
     float r, phi;
     squareToDisk(lens.x, lens.y, r, phi);
     Vec3 o = pos_ + (l1_ * std::cos(phi) + l2_ * std::sin(phi)) * (lensFactor_ * r);
-    Vec3 f = pos_ + dir * (focus_ / dot(dir, cUnit_));
+    Vec3 f = pos_ + dir * (focus_ / along);
     ray.origin = o;
     ray.direction = (f - o).normalized();
 }
