@@ -56,8 +56,8 @@ struct AnyMaterial : ox::ShapeMaterialResolverInterface {
 // vertices (about 0.5 vertices per triangle); otherwise every triangle has its own three, as
 // many exporters write them, and welding has to find the neighbours.
 std::string makeMesh(uint32_t w, uint32_t h, bool shared) {
-    std::string path = "/tmp/ox_mesh_bench_" + std::to_string(getpid()) +
-                       (shared ? "_shared.vtm" : "_soup.vtm");
+    std::string path =
+        "/tmp/ox_mesh_bench_" + std::to_string(getpid()) + (shared ? "_shared.vtm" : "_soup.vtm");
     auto writer = vtm::createWriter(path, 2);
     if (!writer) return {};
     const uint64_t tris = uint64_t(w) * h * 2;

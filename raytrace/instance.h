@@ -60,7 +60,9 @@ public:
     /// The replacing material, or null when the shape's own materials apply.
     const Material *overrideMaterial() const { return override_; }
     /// The material of triangle t of the shape as this instance shows it.
-    const Material *material(uint32_t t) const { return override_ ? override_ : shape_->material(t); }
+    const Material *material(uint32_t t) const {
+        return override_ ? override_ : shape_->material(t);
+    }
 
     /// Vertex-bake sampling options (null when none were attached).
     const VertexBakeSamplingOptions *vertexBakeSamplingOptions() const { return sampling_.get(); }

@@ -34,8 +34,7 @@ void LightLinkTable::build(const std::vector<LightLinkEntry> &instances,
 
     for (uint32_t i = 0; i < instances_; ++i) {
         const LightLinkEntry &inst = instances[i];
-        if (inst.mode != LinkMode::kInclusive && inst.mode != LinkMode::kExclusive)
-            continue;
+        if (inst.mode != LinkMode::kInclusive && inst.mode != LinkMode::kExclusive) continue;
         for (const std::string &name : inst.links) {
             auto it = lightIndex.find(name);
             if (it == lightIndex.end())

@@ -6,7 +6,8 @@
 
 namespace ox {
 
-/// How an instance or a light restricts light linking (the scene's LightLinkMode) ("INCLUSIVE" 0, "EXCLUSIVE" 1, "NONE" 2).
+/// How an instance or a light restricts light linking (the scene's LightLinkMode) ("INCLUSIVE" 0,
+/// "EXCLUSIVE" 1, "NONE" 2).
 enum class LinkMode : int32_t { kInclusive = 0, kExclusive = 1, kNone = 2 };
 
 /// The link settings of one instance (its light names) or one light (its instance names).
@@ -38,8 +39,12 @@ public:
     size_t sizeBytes() const { return bits_.size() * sizeof(uint64_t); }
 
 private:
-    void set(uint32_t i, uint32_t l) { bits_[size_t(i) * stride_ + l / 64] |= uint64_t(1) << (l % 64); }
-    void flip(uint32_t i, uint32_t l) { bits_[size_t(i) * stride_ + l / 64] ^= uint64_t(1) << (l % 64); }
+    void set(uint32_t i, uint32_t l) {
+        bits_[size_t(i) * stride_ + l / 64] |= uint64_t(1) << (l % 64);
+    }
+    void flip(uint32_t i, uint32_t l) {
+        bits_[size_t(i) * stride_ + l / 64] ^= uint64_t(1) << (l % 64);
+    }
     void invertRow(uint32_t i);
 
     uint32_t instances_ = 0, lights_ = 0;

@@ -17,9 +17,12 @@ constexpr float kDefaultBias = 0.005f;
 
 LinkMode linkMode(int32_t v) {
     switch (v) {
-        case 0: return LinkMode::kInclusive;
-        case 1: return LinkMode::kExclusive;
-        default: return LinkMode::kNone;
+        case 0:
+            return LinkMode::kInclusive;
+        case 1:
+            return LinkMode::kExclusive;
+        default:
+            return LinkMode::kNone;
     }
 }
 
@@ -39,7 +42,8 @@ std::unique_ptr<Instance> createInstance(const XMLInstanceCompact &r, const Shap
     if (!r.materialOverrides.empty() && !r.materialOverrides[0].empty()) {
         override = resolver.resolve(r.materialOverrides[0], shape.vertices().uvSetNames());
         if (!override)
-            message(kMsgWarning, 6, "Failed to find override material %s on instance %s, using default",
+            message(kMsgWarning, 6,
+                    "Failed to find override material %s on instance %s, using default",
                     r.materialOverrides[0].c_str(), r.name.c_str());
     }
     auto inst = Instance::create(r.name, r.objectToWorld, &shape, override, r.renderStats.flags);

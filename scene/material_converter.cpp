@@ -27,8 +27,8 @@ PhongParameters ZPXMaterialConverter::parameters(const XMLMaterialCompact &r) {
 }
 
 std::unique_ptr<Material> makePhongMaterial(std::unique_ptr<PhongShader> shader) {
-    auto photon = std::make_unique<PhongPhotonShader>(shader->name() + "_photon",
-                                                      shader->parameters());
+    auto photon =
+        std::make_unique<PhongPhotonShader>(shader->name() + "_photon", shader->parameters());
     return std::make_unique<Material>(std::move(shader), std::move(photon));
 }
 

@@ -263,8 +263,7 @@ void MeshBuilder::weld(std::vector<uint32_t> &remap, std::vector<uint32_t> &orde
                 ++compared;
                 if (r >= best) continue;
                 const Vec3 q = verts_.position(reps[r]);
-                const double dx = double(p.x) - q.x, dy = double(p.y) - q.y,
-                             dz = double(p.z) - q.z;
+                const double dx = double(p.x) - q.x, dy = double(p.y) - q.y, dz = double(p.z) - q.z;
                 const bool close = (p == q) || dx * dx + dy * dy + dz * dz < thr2;
                 if (close && attributesMatch(v, reps[r])) best = r;
             }

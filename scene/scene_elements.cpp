@@ -124,8 +124,8 @@ XMLGenericFactory<XMLMaterialCompact, OXCComplexTypeInstantiator<XMLMaterialBase
     c->specularGIScale = o.SpecularGIScale;
     c->diffuseAlphaAsTransparency = o.DiffuseAlphaAsTransparency;
     c->shininess = o.Shininess;
-    const XMLTextureBlockBase *blocks[7] = {&o.Diffuse,  &o.Ambient,    &o.Transparency,
-                                            &o.Emissive, &o.Specular,   &o.Reflection,
+    const XMLTextureBlockBase *blocks[7] = {&o.Diffuse,  &o.Ambient,  &o.Transparency,
+                                            &o.Emissive, &o.Specular, &o.Reflection,
                                             &o.Normal};
     for (int i = 0; i < 7; ++i) copyBlock(*blocks[i], c->channels[i]);
     return c;
@@ -157,7 +157,8 @@ namespace {
 
 using LightFactory =
     XMLGenericFactory<XMLLightSourceCompact, OXCComplexTypeInstantiator<XMLLightSourceBase>>;
-using CameraFactory = XMLGenericFactory<XMLCameraCompact, OXCComplexTypeInstantiator<XMLCameraBase>>;
+using CameraFactory =
+    XMLGenericFactory<XMLCameraCompact, OXCComplexTypeInstantiator<XMLCameraBase>>;
 using MaterialFactory =
     XMLGenericFactory<XMLMaterialCompact, OXCComplexTypeInstantiator<XMLMaterialBase>>;
 using InstanceFactory =
@@ -206,8 +207,8 @@ bool readScene(const std::string &label, std::vector<std::unique_ptr<SceneCompac
     }
     std::string name = root();
     if (name != "OXScene") {
-        error = "The scene file " + label + " has the root element \"" + name +
-                "\" instead of OXScene";
+        error =
+            "The scene file " + label + " has the root element \"" + name + "\" instead of OXScene";
         ox::messageText(ox::kMsgError, 6, error);
         return false;
     }
@@ -224,7 +225,8 @@ bool readSceneFile(const std::string &path, std::vector<std::unique_ptr<SceneCom
 }
 
 bool readSceneDocument(std::string_view document,
-                       std::vector<std::unique_ptr<SceneCompactBase>> &records, std::string &error) {
+                       std::vector<std::unique_ptr<SceneCompactBase>> &records,
+                       std::string &error) {
     return readScene(
         "noname.xml", records, error,
         [&](ox::XMLSAXDeserializer &sax) { return sax.parseMemory(document); },

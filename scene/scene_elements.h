@@ -91,13 +91,12 @@ public:
     ox::OXCType<int32_t> ShadowSamples{this, "ShadowSamples", 1, "Number of shadow samples"};
     ox::OXCType<uint32_t> MinShadowSamples{this, "MinShadowSamples", 0u,
                                            "Minimum number of shadow samples"};
-    ox::OXCEnum<SceneAttenuationType> AttenuationType{this, "AttenuationType",
-                                                      SceneAttenuationType::STANDARD,
-                                                      "Distance attenuation model"};
+    ox::OXCEnum<SceneAttenuationType> AttenuationType{
+        this, "AttenuationType", SceneAttenuationType::STANDARD, "Distance attenuation model"};
     ox::OXCEnum<SceneLightLinkMode> LightLinkMode{this, "LightLinkMode", SceneLightLinkMode::NONE,
                                                   "How LightLinkedInstances is used"};
-    ox::OXCTypedVector<std::string> LightLinkedInstances{
-        this, "LightLinkedInstances", "Instances linked to this light"};
+    ox::OXCTypedVector<std::string> LightLinkedInstances{this, "LightLinkedInstances",
+                                                         "Instances linked to this light"};
     ox::OXCType<ox::Mtx4> ObjectToWorld{this, "ObjectToWorld", ox::Mtx4(), "Light placement"};
 };
 
@@ -226,8 +225,7 @@ public:
                                                       "Lights linked to this instance"};
     ox::OXCTypedVector<std::string> MaterialOverrides{
         this, "MaterialOverrides", "Material used for the whole shape (only the first is used)"};
-    ox::OXCNested<XMLRenderStatsBase> RenderStats{this, "RenderStats",
-                                                  "Visibility and GI flags"};
+    ox::OXCNested<XMLRenderStatsBase> RenderStats{this, "RenderStats", "Visibility and GI flags"};
     ox::OXCNested<XMLVertexBakeSamplingOptionsBase> VertexBakeSamplingOptions{
         this, "VertexBakeSamplingOptions", "Per-instance vertex-bake sampling"};
 };

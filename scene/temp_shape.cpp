@@ -53,8 +53,8 @@ ShapeBuildStatus buildTempShape(vtm::VornTempMeshBase &reader,
             bool ok = reader.readVertex(rec);
             for (uint32_t k = 0; ok && k < u; ++k) ok = reader.readUV(&uvs[k].x);
             if (!ok)
-                return fail("Temporary mesh file " + reader.path() + " is damaged: " +
-                            reader.error());
+                return fail("Temporary mesh file " + reader.path() +
+                            " is damaged: " + reader.error());
             const Vec3 tangent(rec[6], rec[7], rec[8]), bitangent(rec[9], rec[10], rec[11]);
             if (tangent.lengthSquared() > 1e-5f || bitangent.lengthSquared() > 1e-5f)
                 givenFrames = true;
@@ -70,8 +70,8 @@ ShapeBuildStatus buildTempShape(vtm::VornTempMeshBase &reader,
             for (uint32_t i = 0; i < count; ++i, ++index) {
                 uint32_t tri[3];
                 if (!reader.readTriangle(tri))
-                    return fail("Temporary mesh file " + reader.path() + " is damaged: " +
-                                reader.error());
+                    return fail("Temporary mesh file " + reader.path() +
+                                " is damaged: " + reader.error());
                 for (uint32_t corner : tri)
                     if (corner >= v)
                         return fail("Triangle " + std::to_string(index) + " of shape " + name +

@@ -23,9 +23,9 @@ public:
 
 /// Result of building one shape from a mesh file.
 enum class ShapeBuildStatus {
-    kBuilt,    ///< the shape was made
-    kEmpty,    ///< the file holds nothing to build; no shape, no failure
-    kFailed,   ///< the shape failed; the failure text says why (already reported as an error)
+    kBuilt,   ///< the shape was made
+    kEmpty,   ///< the file holds nothing to build; no shape, no failure
+    kFailed,  ///< the shape failed; the failure text says why (already reported as an error)
 };
 
 /// Builds the shape of an opened mesh file (its header already read): resolves the materials

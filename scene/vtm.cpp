@@ -174,8 +174,8 @@ bool VornTempMeshBase::readString(std::string &s) {
         const unsigned char *start = buffer_.data() + bufPos_;
         size_t avail = bufEnd_ - bufPos_;
         const void *zero = std::memchr(start, 0, avail);
-        size_t take = zero ? static_cast<size_t>(static_cast<const unsigned char *>(zero) - start)
-                           : avail;
+        size_t take =
+            zero ? static_cast<size_t>(static_cast<const unsigned char *>(zero) - start) : avail;
         if (s.size() + take > kMaxStringLength) return fail("string longer than 4096 bytes");
         s.append(reinterpret_cast<const char *>(start), take);
         bufPos_ += take;

@@ -69,8 +69,7 @@ size_t Environment::size() const {
     return shaders_.size();
 }
 
-const EnvironmentShaderInterface *Environment::select(int32_t kind,
-                                                      const EnvironmentValues &values,
+const EnvironmentShaderInterface *Environment::select(int32_t kind, const EnvironmentValues &values,
                                                       std::string &error) {
     switch (static_cast<EnvironmentKind>(kind)) {
         case EnvironmentKind::kSkyLight: {
@@ -86,8 +85,7 @@ const EnvironmentShaderInterface *Environment::select(int32_t kind,
                 return nullptr;
             }
             return add(std::make_unique<IBLEnvironmentShader>(name, values.iblImageFile,
-                                                              values.iblTurnDome,
-                                                              values.iblSwapYZ,
+                                                              values.iblTurnDome, values.iblSwapYZ,
                                                               values.iblGIEnvBlur));
         }
         default:

@@ -14,7 +14,9 @@ namespace {
 constexpr float kDegToRad = 0.017453292519943295f;
 constexpr uint32_t kMaxShadowSamples = 256;
 
-BBox infiniteBox() { return BBox(Vec3(-FLT_MAX, -FLT_MAX, -FLT_MAX), Vec3(FLT_MAX, FLT_MAX, FLT_MAX)); }
+BBox infiniteBox() {
+    return BBox(Vec3(-FLT_MAX, -FLT_MAX, -FLT_MAX), Vec3(FLT_MAX, FLT_MAX, FLT_MAX));
+}
 
 // Box of a point set grown by r on every axis, computed in double and kept finite.
 BBox grownBox(const Vec3 *points, int n, float r) {
@@ -36,7 +38,8 @@ float checkedCutoff(const LightParameters &p) {
 }
 
 std::unique_ptr<AttenuationSettings> makeAttenuation(const LightParameters &p, float cutoff) {
-    if (p.attenuationType == 1) return std::make_unique<UnrealAttenuation>(p.falloffExponent, cutoff);
+    if (p.attenuationType == 1)
+        return std::make_unique<UnrealAttenuation>(p.falloffExponent, cutoff);
     if (p.decayClampToOne) return std::make_unique<ClampedStandardAttenuation>(p.falloffExponent);
     return std::make_unique<StandardAttenuation>(p.falloffExponent);
 }
@@ -152,8 +155,8 @@ SimpleDirectionalLight::SimpleDirectionalLight(const LightParameters &p)
     : SimpleLightSourceBase(p) {
     direction_ = -objectToWorld_.transformVector(Vec3(0, -1, 0)).normalized();
     bounds_ = infiniteBox();
-    shadow_ = samplerSettings(p, ShadowSamplerSettings::kDirectional,
-                              p.directionalLightShadowAngle);
+    shadow_ =
+        samplerSettings(p, ShadowSamplerSettings::kDirectional, p.directionalLightShadowAngle);
     photons_.power = photonPower(p, 300.0f);
 }
 
@@ -238,11 +241,16 @@ std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &value
 std::unique_ptr<LightSource> createLight(const LightParameters &p, bool &castShadows) {
     castShadows = p.castShadows;
     switch (static_cast<LightType>(p.type)) {
-        case LightType::kPoint: return std::make_unique<SimplePointLight>(p);
-        case LightType::kDirectional: return std::make_unique<SimpleDirectionalLight>(p);
-        case LightType::kSpot: return std::make_unique<SimpleSpotLight>(p);
-        case LightType::kArea: return std::make_unique<SimpleAreaLight>(p);
-        case LightType::kWindow: return std::make_unique<SimpleWindowLight>(p);
+        case LightType::kPoint:
+            return std::make_unique<SimplePointLight>(p);
+        case LightType::kDirectional:
+            return std::make_unique<SimpleDirectionalLight>(p);
+        case LightType::kSpot:
+            return std::make_unique<SimpleSpotLight>(p);
+        case LightType::kArea:
+            return std::make_unique<SimpleAreaLight>(p);
+        case LightType::kWindow:
+            return std::make_unique<SimpleWindowLight>(p);
         case LightType::kEnvironment:
             return std::make_unique<EnvironmentLight>(
                 p.name,

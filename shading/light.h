@@ -41,7 +41,8 @@ public:
 /// (max(0, 1 - (d / radius)^2)) ^ exponent: zero at and beyond the radius.
 class UnrealAttenuation : public AttenuationSettings {
 public:
-    UnrealAttenuation(float exponent, float radius) : AttenuationSettings(exponent), radius_(radius) {}
+    UnrealAttenuation(float exponent, float radius)
+        : AttenuationSettings(exponent), radius_(radius) {}
     float attenuate(float d) const override;
     float radius() const { return radius_; }
 

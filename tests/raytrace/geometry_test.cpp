@@ -81,8 +81,8 @@ TEST(Shape, MaterialsBoundsAndNormals) {
 
     // An instance override replaces every material of the shape; the shape keeps its own.
     const Material *o = reinterpret_cast<const Material *>(0x30);
-    auto inst = Instance::create("i", Mtx4::translation({1, 0, 0}), &shape, o,
-                                 RenderStats::kDefault);
+    auto inst =
+        Instance::create("i", Mtx4::translation({1, 0, 0}), &shape, o, RenderStats::kDefault);
     ASSERT_TRUE(inst);
     EXPECT_EQ(inst->material(0), o);
     EXPECT_EQ(shape.material(0), a);

@@ -53,8 +53,7 @@ std::string instance(const std::string &name, const std::string &shape,
     return "<Instance><Name>" + name + "</Name><Shape>" + shape + "</Shape>" + extra +
            "</Instance>\n";
 }
-std::string light(const std::string &name, const std::string &type,
-                  const std::string &extra = "") {
+std::string light(const std::string &name, const std::string &type, const std::string &extra = "") {
     return "<LightSource><Name>" + name + "</Name><Type>" + type + "</Type>" + extra +
            "</LightSource>\n";
 }
@@ -84,10 +83,10 @@ TEST(ZPXLoader, LoadsAWholeScene) {
     f.quad("a.vtm", "plane", "red");
     f.quad("b.vtm", "wall", "blue");
     f.xml("scene.xml",
-          material("red") + material("blue") + material("green") +
-              instance("floor", "plane") + instance("wall1", "wall",
-                                                    "<MaterialOverrides><element>green</element>"
-                                                    "<element>red</element></MaterialOverrides>") +
+          material("red") + material("blue") + material("green") + instance("floor", "plane") +
+              instance("wall1", "wall",
+                       "<MaterialOverrides><element>green</element>"
+                       "<element>red</element></MaterialOverrides>") +
               instance("wall2", "wall",
                        "<MaterialOverrides><element>nope</element></MaterialOverrides>"
                        "<RenderStats><CastShadows>false</CastShadows></RenderStats>") +
@@ -107,8 +106,9 @@ TEST(ZPXLoader, LoadsAWholeScene) {
     EXPECT_NE(out.find("[PROGRESS] Progress Title: Creating Temp Shapes"), std::string::npos);
     EXPECT_NE(out.find("[INFO]     Adding fake camera"), std::string::npos);
     EXPECT_NE(out.find("[PROGRESS] Successfully loaded ZPX-File"), std::string::npos);
-    EXPECT_EQ(test::countOf(out, "Provided more than one material override for instance wall1, "
-                                 "using only the first for the entire shape"),
+    EXPECT_EQ(test::countOf(out,
+                            "Provided more than one material override for instance wall1, "
+                            "using only the first for the entire shape"),
               1u);
     EXPECT_NE(out.find("Failed to find override material nope on instance wall2, using default"),
               std::string::npos);
@@ -177,8 +177,7 @@ TEST(ZPXLoader, FileKindsByExtension) {
     LoadResult r = load(inputs, scene, s);
     ASSERT_TRUE(r.ok) << r.error;
     for (const auto &p : inputs)
-        EXPECT_NE(r.out.find("[WARNING]  Don't know what to do with file: " + p),
-                  std::string::npos)
+        EXPECT_NE(r.out.find("[WARNING]  Don't know what to do with file: " + p), std::string::npos)
             << p;
     EXPECT_EQ(r.out.find("Adding fake camera"), std::string::npos);
     EXPECT_EQ(fileExtension("a/b.c/d"), "");
@@ -298,11 +297,11 @@ TEST(ZPXLoader, ShapesEdgeCases) {
     empty.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(0, 0, 0));
     f.mesh("e.vtm", empty.mesh);
     for (int i = 0; i < 6; ++i)
-        f.quad("v" + std::to_string(i) + ".vtm", "v" + std::to_string(i), "uvm",
-               {"x", "lightmap"});
+        f.quad("v" + std::to_string(i) + ".vtm", "v" + std::to_string(i), "uvm", {"x", "lightmap"});
     f.xml("s.xml", material("m") +
-                       material("uvm", "<Diffuse><UVLayerOverride>lightmap</UVLayerOverride>"
-                                       "<FileTexture>t.tga</FileTexture></Diffuse>") +
+                       material("uvm",
+                                "<Diffuse><UVLayerOverride>lightmap</UVLayerOverride>"
+                                "<FileTexture>t.tga</FileTexture></Diffuse>") +
                        material("m", "<Shininess>99</Shininess>") + instance("i", "s"));
     Scene scene;
     LoadResult r = load(f.inputs, scene);

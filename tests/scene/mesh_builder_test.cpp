@@ -112,17 +112,17 @@ TEST(MeshBuilder, WeldsByDistanceAndAttributes) {
     };
     const Color white(1, 1, 1, 1);
     const Vec3 up(0, 0, 1);
-    EXPECT_EQ(build(0, {1, 0}, white, up, 0.001f), 4u);         // same position: welded
-    EXPECT_EQ(build(0.0009f, {1, 0}, white, up, 0.001f), 4u);   // closer than the threshold
-    EXPECT_EQ(build(0.0011f, {1, 0}, white, up, 0.001f), 5u);   // farther
-    EXPECT_EQ(build(0.02f, {1, 0}, white, up, 0.05f), 4u);      // an absolute distance
-    EXPECT_EQ(build(0.0005f, {1, 0}, white, up, 0.0f), 5u);     // 0: exact positions only
+    EXPECT_EQ(build(0, {1, 0}, white, up, 0.001f), 4u);        // same position: welded
+    EXPECT_EQ(build(0.0009f, {1, 0}, white, up, 0.001f), 4u);  // closer than the threshold
+    EXPECT_EQ(build(0.0011f, {1, 0}, white, up, 0.001f), 5u);  // farther
+    EXPECT_EQ(build(0.02f, {1, 0}, white, up, 0.05f), 4u);     // an absolute distance
+    EXPECT_EQ(build(0.0005f, {1, 0}, white, up, 0.0f), 5u);    // 0: exact positions only
     EXPECT_EQ(build(0, {1, 0}, white, up, 0.0f), 4u);
-    EXPECT_EQ(build(0, {1, 1e-6f}, white, up, 0.001f), 5u);     // UVs differ
+    EXPECT_EQ(build(0, {1, 1e-6f}, white, up, 0.001f), 5u);  // UVs differ
     EXPECT_EQ(build(0, {1, 1e-8f}, white, up, 0.001f), 4u);
     EXPECT_EQ(build(0, {1, 0}, Color(1, 1, 1, 0.99998f), up, 0.001f), 5u);  // colours differ
     EXPECT_EQ(build(0, {1, 0}, Color(1, 1, 1, 0.999995f), up, 0.001f), 4u);
-    EXPECT_EQ(build(0, {1, 0}, white, Vec3(0, 0.002f, 1), 0.001f), 5u);    // normals differ
+    EXPECT_EQ(build(0, {1, 0}, white, Vec3(0, 0.002f, 1), 0.001f), 5u);  // normals differ
     EXPECT_EQ(build(0, {1, 0}, white, Vec3(0, 0.0005f, 1), 0.001f), 4u);
     EXPECT_EQ(build(0, {1, 0}, white, up, std::nanf("")), 4u);  // a bad threshold: exact only
 }

@@ -112,9 +112,8 @@ TEST(SceneElements, DefaultFlagWordAndBadDocuments) {
 
     // A document whose root is not OXScene fails instead of loading an empty scene.
     records.clear();
-    std::string out = test::captureMessages([&] {
-        EXPECT_FALSE(readSceneDocument("<Scene><Instance/></Scene>", records, error));
-    });
+    std::string out = test::captureMessages(
+        [&] { EXPECT_FALSE(readSceneDocument("<Scene><Instance/></Scene>", records, error)); });
     EXPECT_TRUE(records.empty());
     EXPECT_NE(error.find("has the root element \"Scene\" instead of OXScene"), std::string::npos);
     // Not well-formed, and a file that cannot be opened.

@@ -20,19 +20,19 @@ TEST(Scene, FirstNameWinsPerKind) {
         EXPECT_TRUE(scene.addShape(boxShape("s", {0, 0, 0}, {1, 1, 1})));
         EXPECT_FALSE(scene.addShape(boxShape("s", {5, 5, 5}, {6, 6, 6})));
         const Shape *s = scene.findShape("s");
-        EXPECT_TRUE(scene.addInstance(Instance::create("i", Mtx4(), s, nullptr, 1),
-                                      LinkMode::kNone, {}));
-        EXPECT_FALSE(scene.addInstance(Instance::create("i", Mtx4::translation({9, 9, 9}), s,
-                                                        nullptr, 1),
-                                       LinkMode::kNone, {}));
+        EXPECT_TRUE(
+            scene.addInstance(Instance::create("i", Mtx4(), s, nullptr, 1), LinkMode::kNone, {}));
+        EXPECT_FALSE(
+            scene.addInstance(Instance::create("i", Mtx4::translation({9, 9, 9}), s, nullptr, 1),
+                              LinkMode::kNone, {}));
         EXPECT_TRUE(scene.addLight(std::make_unique<SimpleAmbientLight>("l", Color(1, 1, 1, 1)),
                                    LinkMode::kNone, {}));
         EXPECT_FALSE(scene.addLight(std::make_unique<SimpleAmbientLight>("l", Color()),
                                     LinkMode::kNone, {}));
-        EXPECT_TRUE(scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr,
-                                                                  Vec2(1, 1))));
-        EXPECT_FALSE(scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr,
-                                                                   Vec2(2, 2))));
+        EXPECT_TRUE(
+            scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr, Vec2(1, 1))));
+        EXPECT_FALSE(
+            scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr, Vec2(2, 2))));
     });
     EXPECT_NE(out.find("[WARNING]  Duplicate shape name s, keeping the first one"),
               std::string::npos);

@@ -23,7 +23,8 @@ public:
     }
     ~TempDir() {
         std::string cmd = "rm -rf '" + path_ + "'";
-        if (!path_.empty()) [[maybe_unused]] int rc = std::system(cmd.c_str());
+        if (!path_.empty()) [[maybe_unused]]
+            int rc = std::system(cmd.c_str());
     }
     std::string file(const std::string &name) const { return path_ + "/" + name; }
     const std::string &path() const { return path_; }
@@ -69,8 +70,8 @@ struct MeshMaker {
     }
     uint32_t vertex(Vec3 p, Vec3 n = {0, 0, 1}, Vec3 t = {}, Vec3 b = {}, Color c = {},
                     std::vector<Vec2> uv = {}) {
-        float rec[16] = {p.x, p.y, p.z, n.x, n.y, n.z, t.x, t.y, t.z, b.x, b.y, b.z,
-                         c.r, c.g, c.b, c.a};
+        float rec[16] = {p.x, p.y, p.z, n.x, n.y, n.z, t.x, t.y,
+                         t.z, b.x, b.y, b.z, c.r, c.g, c.b, c.a};
         mesh.vertices.insert(mesh.vertices.end(), rec, rec + (mesh.colors ? 16 : 12));
         for (size_t k = 0; k < mesh.uvSetNames.size(); ++k) {
             Vec2 q = k < uv.size() ? uv[k] : Vec2(p.x, p.y);

@@ -80,8 +80,8 @@ TEST(Vtm, WriterEmitsTheExactLayout) {
     want.str("VTM").u32(2).str("c").u32(1).u32(0).u32(1).str("m").u32(0);
     for (float f : {1.f, 2.f, 3.f, 1.f, 2.f, 3.f}) want.f32(f);
     want.u32(1);
-    for (float f : {1.f, 2.f, 3.f, 0.f, 0.f, 1.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.1f, 0.2f, 0.3f,
-                    0.4f})
+    for (float f :
+         {1.f, 2.f, 3.f, 0.f, 0.f, 1.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.f, 0.1f, 0.2f, 0.3f, 0.4f})
         want.f32(f);
     EXPECT_EQ(test::readBytes(path), want.b);
 }
