@@ -124,7 +124,9 @@ uint64_t VornTempMeshBase::bytesLeft() const {
 bool VornTempMeshBase::fillBuffer() {
     if (!file_ || writing_) return false;
     bufPos_ = 0;
-    bufEnd_ = std::fread(buffer_.data(), 1, buffer_.size(), file_);
+    // The first read is small: a pre-open needs only the header, and there may be thousands.
+    const size_t want = consumed_ == 0 ? std::min<size_t>(16384, buffer_.size()) : buffer_.size();
+    bufEnd_ = std::fread(buffer_.data(), 1, want, file_);
     return bufEnd_ > 0;
 }
 
