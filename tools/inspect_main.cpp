@@ -1,0 +1,22 @@
+#include <cstdio>
+#include <string>
+#include <vector>
+
+#include "app/exit_status.h"
+#include "core/message.h"
+#include "tools/inspect_command.h"
+
+int main(int argc, char **argv) {
+    std::vector<std::string> args(argv + 1, argv + argc);
+    ox::InspectCommand command;
+    std::string error;
+    if (!ox::parseInspectCommand(args, command, error)) {
+        ox::messageText(ox::kMsgError, 6, error);
+        std::fputs(ox::kInspectUsage, stdout);
+        return ox::processExitCode(ox::kStatusSyntaxError);
+    }
+    std::string summary;
+    const int32_t status = ox::runInspect(command, summary);
+    if (status == ox::kStatusSuccess) std::fputs(summary.c_str(), stdout);
+    return ox::processExitCode(status);
+}
