@@ -218,6 +218,7 @@ void MeshBuilder::weld(std::vector<uint32_t> &remap, std::vector<uint32_t> &orde
     std::vector<Slot> table(slots);
     std::vector<uint32_t> next;
     std::vector<uint32_t> reps;
+    std::vector<WeldGrid::Key> repKeys;  // the cell of each representative
     size_t usedSlots = 0;
 
     auto findSlot = [&](const WeldGrid::Key &k, bool &found) -> size_t {
@@ -230,7 +231,7 @@ void MeshBuilder::weld(std::vector<uint32_t> &remap, std::vector<uint32_t> &orde
                 found = false;
                 return i;
             }
-            if (s.tag == tag && grid.key(verts_.position(reps[s.head])) == k) {
+            if (s.tag == tag && repKeys[s.head] == k) {
                 found = true;
                 return i;
             }
@@ -244,9 +245,8 @@ void MeshBuilder::weld(std::vector<uint32_t> &remap, std::vector<uint32_t> &orde
         table.assign(slots, Slot{});
         for (const Slot &s : old) {
             if (s.head == kNone) continue;
-            const WeldGrid::Key k = grid.key(verts_.position(reps[s.head]));
             bool found;
-            table[findSlot(k, found)] = s;
+            table[findSlot(repKeys[s.head], found)] = s;
         }
     };
 
@@ -282,9 +282,10 @@ void MeshBuilder::weld(std::vector<uint32_t> &remap, std::vector<uint32_t> &orde
             continue;
         }
         const uint32_t r = static_cast<uint32_t>(reps.size());
-        reps.push_back(v);
-        next.push_back(kNone);
         const WeldGrid::Key k = grid.key(p);
+        reps.push_back(v);
+        repKeys.push_back(k);
+        next.push_back(kNone);
         bool found;
         size_t si = findSlot(k, found);
         if (!found) {
