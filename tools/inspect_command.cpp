@@ -1,3 +1,5 @@
+#include "tools/inspect_command.h"
+
 #include <cstdio>
 
 #include "app/config_run_settings.h"
@@ -7,7 +9,6 @@
 #include "core/message.h"
 #include "platform/system.h"
 #include "scene/load_settings.h"
-#include "tools/inspect_command.h"
 
 namespace ox {
 

@@ -294,3 +294,48 @@ TEST(TempShape, KeepsColoursPerVertex) {
 
 }  // namespace
 }  // namespace ox
+
+namespace ox {
+namespace {
+
+TEST(TempShape, EveryDamagedByteFailsOrRepairsCleanly) {
+    // Each byte of a small valid file in turn set to 0xFF: the open fails, the build fails with
+    // a reason, or the shape is built from repaired data; nothing else may happen.
+    MeshMaker m("s", 2, true);
+    m.grid(2, 1, "a");
+    TempDir dir;
+    std::string path = dir.file("ok.vtm");
+    ASSERT_TRUE(vtm::writeTempMesh(path, m.mesh, 2));
+    const std::vector<unsigned char> good = test::readBytes(path);
+    FakeMaterials materials;
+    int built = 0, failed = 0;
+    std::string out = captureMessages([&] {
+        for (size_t i = 0; i < good.size(); ++i) {
+            std::vector<unsigned char> bad = good;
+            bad[i] = 0xFF;
+            test::writeBytes(path, bad);
+            auto reader = vtm::TempMeshReaderFactory::instance().open(path);
+            if (!reader) {
+                ++failed;
+                continue;
+            }
+            std::unique_ptr<Shape> shape;
+            std::string failure;
+            ShapeBuildStatus st = buildTempShape(*reader, materials, {}, shape, failure);
+            if (st == ShapeBuildStatus::kFailed) {
+                EXPECT_FALSE(failure.empty());
+                ++failed;
+            } else if (st == ShapeBuildStatus::kBuilt) {
+                ASSERT_TRUE(shape);
+                for (const Triangle &t : shape->triangles())
+                    for (uint32_t v : t.v) ASSERT_LT(v, shape->vertices().size());
+                ++built;
+            }
+        }
+    });
+    EXPECT_GT(built, 0);
+    EXPECT_GT(failed, 0);
+}
+
+}  // namespace
+}  // namespace ox

@@ -98,8 +98,9 @@ TEST_F(InspectTest, SummarisesALoadedScene) {
 
 TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
     std::string mesh = quad("s", "nope");
-    std::string xml = file("s.xml", "<OXScene><Instance><Name>i</Name><Shape>ghost</Shape>"
-                                    "</Instance></OXScene>");
+    std::string xml = file("s.xml",
+                           "<OXScene><Instance><Name>i</Name><Shape>ghost</Shape>"
+                           "</Instance></OXScene>");
     // A shape that no mesh file gives.
     RunResult r = runInspect(xml);
     EXPECT_EQ(r.status, 1);
