@@ -144,7 +144,7 @@ XMLGenericFactory<XMLInstanceCompact, OXCComplexTypeInstantiator<XMLInstanceBase
     c->lightLinkedLights = o.LightLinkedLights.values();
     c->materialOverrides = o.MaterialOverrides.values();
     c->renderStats.flags = renderStatsFlags(o.RenderStats);
-    const XMLVertexBakeSamplingOptionsBase &s = o.VertexBakeSamplingOptions;
+    const ox::VertexBakeSamplingOptionsBase &s = o.VertexBakeSamplingOptions;
     c->vertexBakeSamplingOptions.type = s.Type.value();
     c->vertexBakeSamplingOptions.minSamples = s.MinSamples;
     c->vertexBakeSamplingOptions.maxSamples = s.MaxSamples;

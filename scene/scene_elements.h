@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "config/settings_vertex.h"
 #include "config/type.h"
 #include "core/types.h"
 #include "shading/light.h"
@@ -27,9 +28,6 @@ OX_ENUM_NAMES(SceneCameraType, "CameraType", "PERSPECTIVE", "ORTHO", "ENVIRONMEN
 /// "EnvironmentType" (projection of an environment camera).
 enum class SceneEnvironmentType : int32_t { CUBEMAP, BALL, LATLONG };
 OX_ENUM_NAMES(SceneEnvironmentType, "EnvironmentType", "CUBEMAP", "BALL", "LATLONG");
-/// "VertexSamplingType".
-enum class SceneVertexSamplingType : int32_t { PerVertex, TriangleSubdiv };
-OX_ENUM_NAMES(SceneVertexSamplingType, "VertexSamplingType", "PerVertex", "TriangleSubdiv");
 
 /// One colour of a light's ramp ("RampColor").
 class XMLRampColorBase : public ox::OXCComplexType {
@@ -189,29 +187,6 @@ public:
     ox::OXCType<bool> ShadowBias{this, "ShadowBias", false, "Uses a shadow bias"};
 };
 
-/// Vertex-bake sampling of an instance ("VertexBakeSamplingOptions").
-class XMLVertexBakeSamplingOptionsBase : public ox::OXCComplexType {
-public:
-    XMLVertexBakeSamplingOptionsBase() : OXCComplexType("VertexBakeSamplingOptions") {}
-    ox::OXCEnum<SceneVertexSamplingType> Type{
-        this, "Type", SceneVertexSamplingType::TriangleSubdiv,
-        "Selects the algorithms used to sample the vertex colors"};
-    ox::OXCType<int32_t> MinSamples{
-        this, "MinSamples", 2,
-        "Sets the minimum number of samples to use per triangle if triangles sampling is used"};
-    ox::OXCType<int32_t> MaxSamples{
-        this, "MaxSamples", 8,
-        "Sets the maximum number of samples to use per triangle if triangles sampling is used"};
-    ox::OXCType<int32_t> SubDivStepSize{
-        this, "SubDivStepSize", 0,
-        "If set to >0 uses a new vertex subdivision measure based on triangle area in world "
-        "space"};
-    ox::OXCType<float> FootPrintScale{
-        this, "FootPrintScale", 1.0f,
-        "Scales the footprint of each vertex sample. This will affect the size of filters used "
-        "by GI and texture filtering e.t.c."};
-};
-
 /// A placement of a shape ("Instance" element, type "XMLInstance").
 class XMLInstanceBase : public ox::OXCComplexType {
 public:
@@ -226,7 +201,7 @@ public:
     ox::OXCTypedVector<std::string> MaterialOverrides{
         this, "MaterialOverrides", "Material used for the whole shape (only the first is used)"};
     ox::OXCNested<XMLRenderStatsBase> RenderStats{this, "RenderStats", "Visibility and GI flags"};
-    ox::OXCNested<XMLVertexBakeSamplingOptionsBase> VertexBakeSamplingOptions{
+    ox::OXCNested<ox::VertexBakeSamplingOptionsBase> VertexBakeSamplingOptions{
         this, "VertexBakeSamplingOptions", "Per-instance vertex-bake sampling"};
 };
 
