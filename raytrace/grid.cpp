@@ -328,22 +328,26 @@ void Grid::finalize() {
         stats_.maxElements = std::max(stats_.maxElements, elements);
     }
     cellBegin[ncells] = uint32_t(items_.size());
-    cells_.assign(ncells, CellRef());
+    cells_.assign(ncells, 0u);
     std::vector<uint32_t> lists;
     for (size_t c = 0; c < ncells; ++c) {
         uint32_t count = cellBegin[c + 1] - cellBegin[c];
         if (!count) continue;
-        cells_[c].count = count;
         if (count == 1) {
-            cells_[c].first = items_[cellBegin[c]];
+            cells_[c] = items_[cellBegin[c]];
         } else {
-            cells_[c].first = uint32_t(lists.size());
+            // List offsets share the 29 index bits of item codes.
+            if (lists.size() > kItemIndexMask) throw std::length_error("too many cell references");
+            cells_[c] = itemCode(kItemList, uint32_t(lists.size()));
+            lists.push_back(count);
             lists.insert(lists.end(), items_.begin() + cellBegin[c],
                          items_.begin() + cellBegin[c + 1]);
         }
     }
+    std::vector<uint32_t> occupied(cellBegin.size() - 1);
+    for (size_t c = 0; c < ncells; ++c) occupied[c] = cellBegin[c + 1] != cellBegin[c];
     items_.swap(lists);
-    computeDistances();
+    computeDistances(occupied);
     items_.shrink_to_fit();
     blob_.shrink_to_fit();
     std::vector<uint32_t>().swap(buildBegin_);
@@ -447,12 +451,12 @@ void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
     }
 }
 
-void Grid::computeDistances() {
+void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
     // Exact chessboard distance by two raster passes over the 26-neighbourhood.
     size_t ncells = cells_.size();
     distance_.assign(ncells, 255);
     for (size_t c = 0; c < ncells; ++c)
-        if (cells_[c].count) distance_[c] = 0;
+        if (occupied[c]) distance_[c] = 0;
     auto pass = [&](int dir) {
         int64_t zs = dir > 0 ? 0 : nz_ - 1, ys0 = dir > 0 ? 0 : ny_ - 1,
                 xs0 = dir > 0 ? 0 : nx_ - 1;
@@ -494,7 +498,7 @@ uint32_t Grid::nestingDepth() const {
 }
 
 size_t Grid::sizeBytes() const {
-    size_t n = sizeof(Grid) + cells_.capacity() * sizeof(CellRef) + items_.capacity() * 4 +
+    size_t n = sizeof(Grid) + cells_.capacity() * sizeof(uint32_t) + items_.capacity() * 4 +
                distance_.capacity() + blob_.capacity() * sizeof(Block) +
                children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
@@ -504,9 +508,11 @@ size_t Grid::sizeBytes() const {
 std::vector<uint32_t> Grid::cellItems(int64_t x, int64_t y, int64_t z) const {
     if (empty() || x < 0 || y < 0 || z < 0 || x >= nx_ || y >= ny_ || z >= nz_) return {};
     size_t c = size_t((z * ny_ + y) * nx_ + x);
-    const CellRef &ref = cells_[c];
-    if (ref.count == 1) return {ref.first};
-    return {items_.begin() + ref.first, items_.begin() + ref.first + ref.count};
+    if (distance_[c] != 0) return {};
+    uint32_t word = cells_[c];
+    if ((word >> kItemIndexBits) != kItemList) return {word};
+    const uint32_t *list = items_.data() + (word & kItemIndexMask);
+    return {list + 1, list + 1 + list[0]};
 }
 
 bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, TraceRay &local) {
@@ -522,7 +528,7 @@ namespace {
 
 // Runs the packet kernel and keeps the closest lane hit in the state.
 template <bool kAny>
-inline bool testPacket(const IntersectSSETriangle &pk, const TraceRay &r, TraceState &s) {
+__attribute__((always_inline)) inline bool testPacket(const IntersectSSETriangle &pk, const TraceRay &r, TraceState &s) {
     float4 t, u, v;
     int mask = intersectPacket(pk, r, s.limit, t, u, v);
     if (!mask) return false;
@@ -686,7 +692,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     const int64_t stride[3] = {1, nx_, nx_ * ny_};
     int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
     const uint8_t *distance = distance_.data();
-    const CellRef *cells = cells_.data();
+    const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
     bool found = false;
     // Every iteration advances at least one cell along the ray, so a walk needs at most
@@ -694,9 +700,13 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
         uint32_t dist = distance[cell];
         if (dist == 0) {
-            const CellRef &ref = cells[cell];
-            const uint32_t *first = ref.count == 1 ? &ref.first : items + ref.first;
-            if (testItems<kAny>(r, s, first, first + ref.count)) {
+            const uint32_t *first = cells + cell, *last = first + 1;
+            if ((*first >> kItemIndexBits) == kItemList) {
+                const uint32_t *list = items + (*first & kItemIndexMask);
+                first = list + 1;
+                last = first + *list;
+            }
+            if (testItems<kAny>(r, s, first, last)) {
                 if constexpr (kAny) return true;
                 found = true;
             }

@@ -21,6 +21,7 @@ enum ItemKind : uint32_t {
     kItemInstance = 3,  ///< An IntersectInstanceGrid of the store.
     kItemChild = 4,     ///< A DynamicVoxel: a nested grid of the grid itself.
     kItemGroup = 5,     ///< Up to four packets of the grid behind one four-wide box test.
+    kItemList = 7,      ///< A cell word only: offset of the cell's count and codes in the list.
 };
 
 /// Up to four consecutive packets with their boxes (clipped to the cell), tested together so
@@ -203,17 +204,14 @@ private:
     float tolerance_ = 0.001f;
     float margin_ = 0.0f;
     BBox box_;
-    // Per cell: the item count and either the only item's code (count 1) or the offset of the
-    // cell's items in items_, so that most cells reach their data without the item list.
-    struct CellRef {
-        uint32_t first = 0;
-        uint32_t count = 0;
-    };
-    std::vector<CellRef> cells_;
+    // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
+    // the cell's item count followed by its codes; most cells reach their data without the list.
+    // Empty cells (distance_ not 0) hold 0.
+    std::vector<uint32_t> cells_;
     // Per cell: 0 when it holds items, else the chessboard distance (in cells, at most 255) to
     // the nearest cell that does; the walk jumps over the empty cube this guarantees.
     std::vector<uint8_t> distance_;
-    void computeDistances();
+    void computeDistances(const std::vector<uint32_t> &occupied);
     std::vector<uint32_t> items_;
     // Packets and packet groups, 16-byte blocks; a group is followed by its packets so that
     // one cell's data lies together in memory. Item codes of both kinds hold block offsets.
