@@ -586,6 +586,13 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 const PacketGroup &g = *groupAt(index);
                 float4 tnear;
                 int mask = groupMask(g, r, s.limit, tnear);
+                // Start fetching every packet the ray may test, so their misses overlap.
+                for (int m = mask; m; m &= m - 1) {
+                    const char *p = reinterpret_cast<const char *>(
+                        packetAt(g.first + __builtin_ctz(m) * kPacketBlocks));
+                    for (int line = 0; line < int(sizeof(IntersectSSETriangle)); line += 64)
+                        __builtin_prefetch(p + line);
+                }
                 while (mask) {
                     int lane = __builtin_ctz(mask);
                     mask &= mask - 1;
@@ -700,6 +707,14 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
         uint32_t dist = distance[cell];
         if (dist == 0) {
+            // While this cell's items are tested, fetch the cell the walk is likely to enter next.
+            int na = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2)
+                                         : (tNext[1] < tNext[2] ? 1 : 2);
+            if (uint64_t(idx[na] + step[na]) < uint64_t(n[na])) {
+                int64_t nc = cell + step[na] * stride[na];
+                __builtin_prefetch(distance + nc);
+                __builtin_prefetch(cells + nc);
+            }
             const uint32_t *first = cells + cell, *last = first + 1;
             if ((*first >> kItemIndexBits) == kItemList) {
                 const uint32_t *list = items + (*first & kItemIndexMask);
