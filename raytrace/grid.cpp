@@ -705,16 +705,16 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     // Every iteration advances at least one cell along the ray, so a walk needs at most
     // nx + ny + nz of them.
     for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
+        // While this cell is looked at, fetch the cell the walk is likely to enter next.
+        int na = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2)
+                                     : (tNext[1] < tNext[2] ? 1 : 2);
+        if (uint64_t(idx[na] + step[na]) < uint64_t(n[na])) {
+            int64_t nc = cell + step[na] * stride[na];
+            __builtin_prefetch(distance + nc);
+            __builtin_prefetch(cells + nc);
+        }
         uint32_t dist = distance[cell];
         if (dist == 0) {
-            // While this cell's items are tested, fetch the cell the walk is likely to enter next.
-            int na = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2)
-                                         : (tNext[1] < tNext[2] ? 1 : 2);
-            if (uint64_t(idx[na] + step[na]) < uint64_t(n[na])) {
-                int64_t nc = cell + step[na] * stride[na];
-                __builtin_prefetch(distance + nc);
-                __builtin_prefetch(cells + nc);
-            }
             const uint32_t *first = cells + cell, *last = first + 1;
             if ((*first >> kItemIndexBits) == kItemList) {
                 const uint32_t *list = items + (*first & kItemIndexMask);
