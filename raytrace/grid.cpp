@@ -680,24 +680,29 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     }
     if (!(t0 <= t1)) return false;
 
-    // Per axis: the cell index, the step, the index of the next cell plane and the distance to
-    // it (recomputed exactly from the plane index after each step), and the distance between
-    // planes. An axis the ray does not move along has its next plane at infinity.
-    int64_t idx[3], step[3], next[3];
+    // Per axis: the step, the index of the next cell plane and the distance to it (recomputed
+    // exactly from the plane index after each step), and the distance between planes. The cell
+    // index is next - ahead; the walk leaves the grid when next reaches beyond. An axis the ray
+    // does not move along has its next plane at infinity and never leaves.
+    int64_t step[3], next[3], ahead[3], beyond[3], cellStep[3];
     float tNext[3], base[3], delta[3];
     const int64_t n[3] = {nx_, ny_, nz_};
+    const int64_t stride[3] = {1, nx_, nx_ * ny_};
+    int64_t cell = 0;
     for (int a = 0; a < 3; ++a) {
         float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * t0;
-        idx[a] = cellCoord(p, a);
+        int64_t idx = cellCoord(p, a);
+        cell += idx * stride[a];
         base[a] = box_.min[a] - r.o[a];
         step[a] = r.d[a] > 0.0f ? 1 : (r.d[a] < 0.0f ? -1 : 0);
-        next[a] = idx[a] + (step[a] > 0);
+        ahead[a] = step[a] > 0;
+        next[a] = idx + ahead[a];
+        beyond[a] = step[a] > 0 ? n[a] + 1 : (step[a] < 0 ? -1 : -2);
+        cellStep[a] = step[a] * stride[a];
         tNext[a] =
             step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
         delta[a] = step[a] ? cellSize_[a] * std::fabs(r.inv[a]) : kInfiniteDistance;
     }
-    const int64_t stride[3] = {1, nx_, nx_ * ny_};
-    int64_t cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
     const uint8_t *distance = distance_.data();
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
@@ -705,11 +710,11 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     // Every iteration advances at least one cell along the ray, so a walk needs at most
     // nx + ny + nz of them.
     for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
-        // While this cell is looked at, fetch the cell the walk is likely to enter next.
-        int na = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2)
-                                     : (tNext[1] < tNext[2] ? 1 : 2);
-        if (uint64_t(idx[na] + step[na]) < uint64_t(n[na])) {
-            int64_t nc = cell + step[na] * stride[na];
+        // The axis of the nearest cell plane; while this cell is looked at, fetch the cell the
+        // walk is likely to enter next.
+        int a = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2) : (tNext[1] < tNext[2] ? 1 : 2);
+        if (next[a] + step[a] != beyond[a]) {
+            int64_t nc = cell + cellStep[a];
             __builtin_prefetch(distance + nc);
             __builtin_prefetch(cells + nc);
         }
@@ -731,33 +736,29 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             float reach = float(dist - 1);
             float e0 = tNext[0] + reach * delta[0], e1 = tNext[1] + reach * delta[1],
                   e2 = tNext[2] + reach * delta[2];
-            int a = e0 < e1 ? (e0 < e2 ? 0 : 2) : (e1 < e2 ? 1 : 2);
-            float tExit = a == 0 ? e0 : a == 1 ? e1 : e2;
+            int j = e0 < e1 ? (e0 < e2 ? 0 : 2) : (e1 < e2 ? 1 : 2);
+            float tExit = j == 0 ? e0 : j == 1 ? e1 : e2;
             if (!(tExit < s.limit)) break;
-            idx[a] += step[a] * int64_t(dist);
-            if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
-            next[a] = idx[a] + (step[a] > 0);
-            tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
+            next[j] += step[j] * int64_t(dist);
+            if (uint64_t(next[j] - ahead[j]) >= uint64_t(n[j])) break;
+            tNext[j] = (base[j] + float(next[j]) * cellSize_[j]) * r.inv[j];
             for (int b = 0; b < 3; ++b) {
-                if (b == a) continue;
+                if (b == j) continue;
                 for (uint32_t k = dist - 1; k > 0 && tNext[b] < tExit; --k) {
-                    idx[b] += step[b];
                     next[b] += step[b];
                     tNext[b] = (base[b] + float(next[b]) * cellSize_[b]) * r.inv[b];
                 }
-                if (uint64_t(idx[b]) >= uint64_t(n[b])) return found;
+                if (uint64_t(next[b] - ahead[b]) >= uint64_t(n[b])) return found;
             }
-            cell = (idx[2] * ny_ + idx[1]) * nx_ + idx[0];
+            cell = ((next[2] - ahead[2]) * ny_ + (next[1] - ahead[1])) * nx_ + next[0] - ahead[0];
             continue;
         }
         // Step to the neighbour across the nearest cell plane. The best hit lies inside the
         // cells walked so far when that plane is beyond it: nothing further can be closer.
-        int a = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2) : (tNext[1] < tNext[2] ? 1 : 2);
         if (tNext[a] >= s.limit) break;
-        idx[a] += step[a];
-        if (uint64_t(idx[a]) >= uint64_t(n[a])) break;
-        cell += step[a] * stride[a];
         next[a] += step[a];
+        if (next[a] == beyond[a]) break;
+        cell += cellStep[a];
         tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
     }
     return found;
