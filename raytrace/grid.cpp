@@ -726,6 +726,17 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 first = list + 1;
                 last = first + *list;
             }
+            // Several items: start fetching the boxes and packets of all of them at once.
+            if (last - first > 1)
+                for (const uint32_t *k = first; k != last; ++k) {
+                    uint32_t kind = *k >> kItemIndexBits;
+                    if (kind == kItemGroup || kind == kItemPacket) {
+                        const char *p =
+                            reinterpret_cast<const char *>(blob_.data() + (*k & kItemIndexMask));
+                        __builtin_prefetch(p);
+                        __builtin_prefetch(p + 64);
+                    }
+                }
             if (testItems<kAny>(r, s, first, last)) {
                 if constexpr (kAny) return true;
                 found = true;
