@@ -584,6 +584,12 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
             }
             case kItemGroup: {
                 const PacketGroup &g = *groupAt(index);
+                // The first packet follows the group; fetch it while the boxes are tested.
+                const char *p0 = reinterpret_cast<const char *>(packetAt(index + kGroupBlocks));
+                __builtin_prefetch(p0);
+                __builtin_prefetch(p0 + 64);
+                __builtin_prefetch(p0 + 128);
+                __builtin_prefetch(p0 + 192);
                 float4 tnear;
                 int mask = groupMask(g, r, s.limit, tnear);
                 // Start fetching every packet the ray may test, so their misses overlap.
