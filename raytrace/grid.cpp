@@ -747,6 +747,17 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 if constexpr (kAny) return true;
                 found = true;
             }
+            // The next cell's word has arrived meanwhile: start fetching what it names.
+            if (next[a] + step[a] != beyond[a] && tNext[a] < s.limit) {
+                uint32_t word = cells[cell + cellStep[a]];
+                uint32_t kind = word >> kItemIndexBits;
+                const char *p = nullptr;
+                if (kind == kItemGroup || kind == kItemPacket)
+                    p = reinterpret_cast<const char *>(blob_.data() + (word & kItemIndexMask));
+                else if (kind == kItemList)
+                    p = reinterpret_cast<const char *>(items + (word & kItemIndexMask));
+                if (p) __builtin_prefetch(p);
+            }
         } else if (dist >= 2) {
             // Every cell within dist - 1 of this one is empty: leave that cube in one jump
             // through its nearest far face; the other axes catch up with ordinary steps.
