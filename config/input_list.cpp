@@ -5,9 +5,9 @@
 namespace ox {
 
 bool loadInputList(const std::string &file, std::vector<std::string> &out) {
-    InputSpecification spec;
-    if (!loadSettings(file, spec)) return false;
-    std::vector<std::string> entries = spec.filelist.values();
+    InputSpecification list;
+    if (!loadSettings(file, list)) return false;
+    std::vector<std::string> entries = list.filelist.values();
     out.insert(out.end(), entries.begin(), entries.end());
     return true;
 }

@@ -2,19 +2,8 @@
 
 namespace ox {
 
-SceneLoadSettings sceneLoadSettings(const OXConfigBase &config, int threadCount) {
-    SceneLoadSettings s;
-    const RenderSettingsBase &r = config.RenderSettings;
-    s.mesh.mergeThreshold = r.vertexMergeThreshold();
-    s.mesh.tangentSpace.oddUVFlipping = r.tsOddUVFlipping();
-    s.mesh.tangentSpace.orthogonalize = r.tsVertexOrthogonalization();
-    s.mesh.tangentSpace.normalize = r.tsVertexNormalization();
-    s.bias = r.bias();
-    s.threadCount = threadCount;
-    s.jobKind = config.FrameSettings.renderType.value();
-
-    const EnvironmentSettingsBase &e = config.EnvironmentSettings;
-    EnvironmentValues &v = s.environment;
+EnvironmentValues environmentValues(const EnvironmentSettingsBase &e) {
+    EnvironmentValues v;
     v.rtEnvironment = e.rtEnvironment.value();
     v.rtEnvironmentIntensity = e.rtEnvironmentIntensity();
     v.giEnvironment = e.giEnvironment.value();
@@ -37,6 +26,20 @@ SceneLoadSettings sceneLoadSettings(const OXConfigBase &config, int threadCount)
     v.iblGlobalPhotons = e.iblGlobalPhotons();
     v.iblPhotonEnergy = e.iblPhotonEnergy();
     v.iblGIEnvBlur = e.iblGIEnvBlur();
+    return v;
+}
+
+SceneLoadSettings sceneLoadSettings(const OXConfigBase &config, int threadCount) {
+    SceneLoadSettings s;
+    const RenderSettingsBase &r = config.RenderSettings;
+    s.mesh.mergeThreshold = r.vertexMergeThreshold();
+    s.mesh.tangentSpace.oddUVFlipping = r.tsOddUVFlipping();
+    s.mesh.tangentSpace.orthogonalize = r.tsVertexOrthogonalization();
+    s.mesh.tangentSpace.normalize = r.tsVertexNormalization();
+    s.bias = r.bias();
+    s.threadCount = threadCount > 0 ? threadCount : 1;
+    s.jobKind = config.FrameSettings.renderType.value();
+    s.environment = environmentValues(config.EnvironmentSettings);
     return s;
 }
 

@@ -194,7 +194,6 @@ bool MeshBuilder::attributesMatch(uint32_t a, uint32_t b) const {
 
 void MeshBuilder::weld(std::vector<uint32_t> &remap, std::vector<uint32_t> &order) {
     // order holds the referenced vertices (increasing); it is replaced by the representatives.
-    const uint32_t n = static_cast<uint32_t>(order.size());
     BBox box;
     for (uint32_t v : order) box.extend(verts_.position(v));
     const Vec3 c = box.center();

@@ -1,4 +1,4 @@
-#include "tools/inspect_command.h"
+#include "tools/scene_summary_command.h"
 
 #include <cstdio>
 

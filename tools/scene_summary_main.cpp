@@ -4,7 +4,7 @@
 
 #include "app/exit_status.h"
 #include "core/message.h"
-#include "tools/inspect_command.h"
+#include "tools/scene_summary_command.h"
 
 int main(int argc, char **argv) {
     std::vector<std::string> args(argv + 1, argv + argc);
