@@ -329,7 +329,7 @@ void Grid::finalize() {
     }
     cellBegin[ncells] = uint32_t(items_.size());
     cells_.assign(ncells, 0u);
-    std::vector<uint32_t> lists;
+    decltype(items_) lists;
     for (size_t c = 0; c < ncells; ++c) {
         uint32_t count = cellBegin[c + 1] - cellBegin[c];
         if (!count) continue;

@@ -7,6 +7,7 @@
 
 #include "core/types.h"
 #include "raytrace/intersect.h"
+#include "raytrace/large_allocator.h"
 
 namespace ox {
 
@@ -207,18 +208,18 @@ private:
     // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
     // the cell's item count followed by its codes; most cells reach their data without the list.
     // Empty cells (distance_ not 0) hold 0.
-    std::vector<uint32_t> cells_;
+    std::vector<uint32_t, LargeArrayAllocator<uint32_t>> cells_;
     // Per cell: 0 when it holds items, else the chessboard distance (in cells, at most 255) to
     // the nearest cell that does; the walk jumps over the empty cube this guarantees.
-    std::vector<uint8_t> distance_;
+    std::vector<uint8_t, LargeArrayAllocator<uint8_t>> distance_;
     void computeDistances(const std::vector<uint32_t> &occupied);
-    std::vector<uint32_t> items_;
+    std::vector<uint32_t, LargeArrayAllocator<uint32_t>> items_;
     // Packets and packet groups, 16-byte blocks; a group is followed by its packets so that
     // one cell's data lies together in memory. Item codes of both kinds hold block offsets.
     struct alignas(16) Block {
         float f[4];
     };
-    std::vector<Block> blob_;
+    std::vector<Block, LargeArrayAllocator<Block>> blob_;
     const PacketGroup *groupAt(uint32_t offset) const {
         return reinterpret_cast<const PacketGroup *>(blob_.data() + offset);
     }
