@@ -20,7 +20,7 @@ Grid orderOf(ox::TileInterface &t, int64_t nx, int64_t ny) {
 
 /// The Hilbert curve walked point by point, without skipping, filtered to the grid.
 struct NaiveHilbert {
-    int64_t nx, ny, x = 0, y = 0;
+    int64_t nx = 0, ny = 0, x = 0, y = 0;
     Grid out;
     void step(int m) {
         x += m == 3 ? 1 : m == 1 ? -1 : 0;
@@ -137,8 +137,12 @@ TEST(TileTest, EveryOrderHandsOutEachTileOnce) {
                 std::set<std::pair<int64_t, int64_t>> seen(g.begin(), g.end());
                 ASSERT_EQ(seen.size(), g.size());
                 for (auto &[x, y] : g) ASSERT_TRUE(x < nx && y < ny);
-                if (scheme < 0 || scheme > 3 || scheme == ox::kTileHilbert)
-                    ASSERT_EQ(g, (NaiveHilbert{nx, ny}.run())) << nx << "x" << ny;
+                if (scheme < 0 || scheme > 3 || scheme == ox::kTileHilbert) {
+                    NaiveHilbert naive;
+                    naive.nx = nx;
+                    naive.ny = ny;
+                    ASSERT_EQ(g, naive.run()) << nx << "x" << ny;
+                }
             }
         }
     }

@@ -64,7 +64,7 @@ TEST(SceneElements, ReadsEveryKindIntoCompactRecords) {
     EXPECT_EQ(inst->lightLinkedLights, (std::vector<std::string>{"sun", "lamp"}));
     EXPECT_EQ(inst->materialOverrides, std::vector<std::string>{"red"});
     EXPECT_EQ(inst->renderStats.flags,
-              RenderStats::kDefault & ~RenderStats::kCastShadows & ~RenderStats::kSelfOcclusion |
+              (RenderStats::kDefault & ~RenderStats::kCastShadows & ~RenderStats::kSelfOcclusion) |
                   RenderStats::kShadowBias);
     EXPECT_EQ(inst->vertexBakeSamplingOptions.type, 0);
     EXPECT_EQ(inst->vertexBakeSamplingOptions.maxSamples, 12);
