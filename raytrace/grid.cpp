@@ -528,7 +528,8 @@ namespace {
 
 // Runs the packet kernel and keeps the closest lane hit in the state.
 template <bool kAny>
-__attribute__((always_inline)) inline bool testPacket(const IntersectSSETriangle &pk, const TraceRay &r, TraceState &s) {
+__attribute__((always_inline)) inline bool testPacket(const IntersectSSETriangle &pk,
+                                                      const TraceRay &r, TraceState &s) {
     float4 t, u, v;
     int mask = intersectPacket(pk, r, s.limit, t, u, v);
     if (!mask) return false;

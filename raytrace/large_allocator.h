@@ -15,6 +15,7 @@ template <class T>
 struct LargeArrayAllocator {
     using value_type = T;
     static constexpr size_t kHugePage = size_t(2) << 20;
+    static constexpr std::align_val_t kSmallAlign{alignof(T) < 16 ? 16 : alignof(T)};
 
     LargeArrayAllocator() = default;
     template <class U>
@@ -22,11 +23,10 @@ struct LargeArrayAllocator {
 
     /// Storage for n values.
     T *allocate(size_t n) {
-        if (n > size_t(-1) / sizeof(T) - kHugePage) throw std::bad_alloc();
+        if (n > (size_t(-1) - kHugePage) / sizeof(T)) throw std::bad_alloc();
         size_t bytes = n * sizeof(T);
         if (bytes < kHugePage) {
-            return static_cast<T *>(::operator new(bytes, std::align_val_t(alignof(T) < 16 ? 16
-                                                                          : alignof(T))));
+            return static_cast<T *>(::operator new(bytes, kSmallAlign));
         }
         size_t rounded = (bytes + kHugePage - 1) / kHugePage * kHugePage;
         void *p = std::aligned_alloc(kHugePage, rounded);
@@ -38,7 +38,7 @@ struct LargeArrayAllocator {
     void deallocate(T *p, size_t n) {
         size_t bytes = n * sizeof(T);
         if (bytes < kHugePage)
-            ::operator delete(p, std::align_val_t(alignof(T) < 16 ? 16 : alignof(T)));
+            ::operator delete(p, kSmallAlign);
         else
             std::free(p);
     }

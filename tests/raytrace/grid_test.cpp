@@ -601,3 +601,19 @@ TEST(CompleteGridTest, SecondStructureHoldsEnvelopeInstancesOnly) {
 
 }  // namespace
 }  // namespace ox
+
+// Small arrays come from the ordinary heap, large ones 2 MiB aligned; both keep their contents
+// through growth and release cleanly (the sanitizer build checks the pairing).
+TEST(LargeArrayAllocator, AlignsAndKeepsContents) {
+    std::vector<uint32_t, ox::LargeArrayAllocator<uint32_t>> v(100);
+    EXPECT_EQ(reinterpret_cast<uintptr_t>(v.data()) % 16, 0u);
+    for (uint32_t i = 0; i < 100; ++i) v[i] = i * 7u;
+    v.resize(size_t(3) << 20);  // 12 MiB
+    EXPECT_EQ(reinterpret_cast<uintptr_t>(v.data()) % (size_t(2) << 20), 0u);
+    EXPECT_EQ(v[99], 693u);
+    v.resize(10);
+    v.shrink_to_fit();
+    EXPECT_EQ(v[9], 63u);
+    ox::LargeArrayAllocator<uint32_t> a;
+    EXPECT_THROW((void)a.allocate(size_t(-1) / 2), std::bad_alloc);
+}
