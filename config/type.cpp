@@ -60,52 +60,31 @@ void valueToString(float v, std::string &out) {
 
 void valueToString(const std::string &v, std::string &out) { out.assign(v); }
 
-void valueToString(const Color &v, std::string &out) {
+/// Writes "(a, b, ...)" with each component in the text form of append.
+template <typename Append, typename... T>
+void tupleToString(std::string &out, Append append, T... components) {
     out.assign("(");
-    appendFixed4(v.r, out);
-    out += ", ";
-    appendFixed4(v.g, out);
-    out += ", ";
-    appendFixed4(v.b, out);
-    out += ", ";
-    appendFixed4(v.a, out);
+    bool first = true;
+    ((out += first ? "" : ", ", first = false, append(components, out)), ...);
     out += ')';
+}
+
+void valueToString(const Color &v, std::string &out) {
+    tupleToString(out, appendFixed4, v.r, v.g, v.b, v.a);
 }
 
 void valueToString(const RGBf &v, std::string &out) {
-    out.assign("(");
-    appendFixed4(v.r, out);
-    out += ", ";
-    appendFixed4(v.g, out);
-    out += ", ";
-    appendFixed4(v.b, out);
-    out += ')';
+    tupleToString(out, appendFixed4, v.r, v.g, v.b);
 }
 
 void valueToString(const Vec2i &v, std::string &out) {
-    out.assign("(");
-    appendInteger(v.x, out);
-    out += ", ";
-    appendInteger(v.y, out);
-    out += ')';
+    tupleToString(out, [](int32_t c, std::string &o) { appendInteger(c, o); }, v.x, v.y);
 }
 
-void valueToString(const Vec2 &v, std::string &out) {
-    out.assign("(");
-    appendFloat(v.x, out);
-    out += ", ";
-    appendFloat(v.y, out);
-    out += ')';
-}
+void valueToString(const Vec2 &v, std::string &out) { tupleToString(out, appendFloat, v.x, v.y); }
 
 void valueToString(const Vec3 &v, std::string &out) {
-    out.assign("(");
-    appendFloat(v.x, out);
-    out += ", ";
-    appendFloat(v.y, out);
-    out += ", ";
-    appendFloat(v.z, out);
-    out += ')';
+    tupleToString(out, appendFloat, v.x, v.y, v.z);
 }
 
 void valueToString(const Mtx4 &v, std::string &out) {
