@@ -14,6 +14,7 @@
 #include "config/settings_checks.h"
 #include "config/xml.h"
 #include "core/message.h"
+#include "tests/support/test_support.h"
 
 namespace fs = std::filesystem;
 using testing::internal::CaptureStdout;
@@ -21,23 +22,9 @@ using testing::internal::GetCapturedStdout;
 
 namespace {
 
-class ConfigRun : public ::testing::Test {
+class ConfigRun : public oxtest::TempDirTest {
 protected:
-    void SetUp() override {
-        old_ = fs::current_path();
-        dir_ = fs::temp_directory_path() /
-               ("ox_cfgrun_test_" + std::to_string(::getpid()) + "_" +
-                ::testing::UnitTest::GetInstance()->current_test_info()->name());
-        fs::remove_all(dir_);
-        fs::create_directories(dir_);
-        fs::current_path(dir_);
-        ox::resetMessageFilters();
-    }
-    void TearDown() override {
-        ox::resetMessageFilters();
-        fs::current_path(old_);
-        fs::remove_all(dir_);
-    }
+    ConfigRun() : TempDirTest("ox_cfgrun_test_") {}
     static void write(const std::string &name, const std::string &text) {
         std::ofstream(name, std::ios::binary) << text;
     }
@@ -47,7 +34,6 @@ protected:
         s << in.rdbuf();
         return s.str();
     }
-    fs::path old_, dir_;
 };
 
 /// Remembers what the run handed over and the tree behind it.

@@ -12,30 +12,16 @@
 
 #include "app/exit_status.h"
 #include "core/message.h"
+#include "tests/support/test_support.h"
 
 namespace fs = std::filesystem;
 
 namespace {
 
 /// Runs the tests of one case in a fresh temporary directory and returns to the old one.
-class RunTest : public ::testing::Test {
+class RunTest : public oxtest::TempDirTest {
 protected:
-    void SetUp() override {
-        old_ = fs::current_path();
-        dir_ = fs::temp_directory_path() /
-               ("ox_run_test_" + std::to_string(::getpid()) + "_" +
-                ::testing::UnitTest::GetInstance()->current_test_info()->name());
-        fs::remove_all(dir_);
-        fs::create_directories(dir_);
-        fs::current_path(dir_);
-        ox::resetMessageFilters();
-    }
-    void TearDown() override {
-        ox::resetMessageFilters();
-        fs::current_path(old_);
-        fs::remove_all(dir_);
-    }
-    fs::path old_, dir_;
+    RunTest() : TempDirTest("ox_run_test_") {}
 };
 
 std::string readAll(const fs::path &p) {

@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "scene/loader.h"
+#include "tests/support/test_support.h"
 #include "scene/scene.h"
 #include "scene/vtm.h"
 #include "tools/import_command.h"
@@ -28,24 +29,10 @@ namespace {
 
 const std::string kImport = std::string(OX_BINARY_DIR) + "/tools/thevorn-import";
 
-struct RunResult {
-    int status = -1;
-    std::string output;
-};
+using oxtest::RunResult;
 
 // Runs thevorn-import with the arguments; stdout and stderr together.
-RunResult runImport(const std::string &args) {
-    RunResult r;
-    std::string cmd = kImport + " " + args + " 2>&1";
-    FILE *p = popen(cmd.c_str(), "r");
-    if (!p) return r;
-    char buf[4096];
-    size_t n;
-    while ((n = fread(buf, 1, sizeof buf, p)) > 0) r.output.append(buf, n);
-    int st = pclose(p);
-    r.status = WIFEXITED(st) ? WEXITSTATUS(st) : -1;
-    return r;
-}
+RunResult runImport(const std::string &args) { return oxtest::runProgram(kImport, args); }
 
 std::string readBytes(const fs::path &p) {
     std::ifstream f(p, std::ios::binary);

@@ -8,6 +8,7 @@
 #include <string>
 
 #include "scene/vtm.h"
+#include "tests/support/test_support.h"
 
 namespace {
 
@@ -15,23 +16,9 @@ namespace fs = std::filesystem;
 
 const std::string kInspect = std::string(OX_BINARY_DIR) + "/tools/thevorn-inspect";
 
-struct RunResult {
-    int status = -1;
-    std::string output;
-};
+using oxtest::RunResult;
 
-RunResult runInspect(const std::string &args) {
-    RunResult r;
-    std::string cmd = kInspect + " " + args + " 2>&1";
-    FILE *p = popen(cmd.c_str(), "r");
-    if (!p) return r;
-    char buf[4096];
-    size_t n;
-    while ((n = fread(buf, 1, sizeof buf, p)) > 0) r.output.append(buf, n);
-    int st = pclose(p);
-    r.status = WIFEXITED(st) ? WEXITSTATUS(st) : -1;
-    return r;
-}
+RunResult runInspect(const std::string &args) { return oxtest::runProgram(kInspect, args); }
 
 class InspectTest : public ::testing::Test {
 protected:

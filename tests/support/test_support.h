@@ -1,0 +1,60 @@
+#pragma once
+
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <string>
+
+#include "core/message.h"
+
+/// Helpers shared by the test programs: running a built program and a fresh working directory.
+namespace oxtest {
+
+/// What a program run printed (stdout and stderr together) and its exit status.
+struct RunResult {
+    int status = -1;
+    std::string output;
+};
+
+/// Runs a program of the build with a shell-quoted argument string.
+inline RunResult runProgram(const std::string &program, const std::string &args) {
+    RunResult r;
+    const std::string cmd = program + " " + args + " 2>&1";
+    FILE *p = popen(cmd.c_str(), "r");
+    if (!p) return r;
+    char buf[4096];
+    size_t n;
+    while ((n = fread(buf, 1, sizeof buf, p)) > 0) r.output.append(buf, n);
+    const int st = pclose(p);
+    r.status = WIFEXITED(st) ? WEXITSTATUS(st) : -1;
+    return r;
+}
+
+/// A fixture whose tests each run in a fresh temporary directory with the message filters of a
+/// new process; the old directory is restored and the temporary one removed afterwards.
+class TempDirTest : public ::testing::Test {
+protected:
+    explicit TempDirTest(const char *prefix) : prefix_(prefix) {}
+    void SetUp() override {
+        old_ = std::filesystem::current_path();
+        dir_ = std::filesystem::temp_directory_path() /
+               (prefix_ + std::to_string(::getpid()) + "_" +
+                ::testing::UnitTest::GetInstance()->current_test_info()->name());
+        std::filesystem::remove_all(dir_);
+        std::filesystem::create_directories(dir_);
+        std::filesystem::current_path(dir_);
+        ox::resetMessageFilters();
+    }
+    void TearDown() override {
+        ox::resetMessageFilters();
+        std::filesystem::current_path(old_);
+        std::filesystem::remove_all(dir_);
+    }
+    std::string prefix_;
+    std::filesystem::path old_, dir_;
+};
+
+}  // namespace oxtest
