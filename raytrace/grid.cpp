@@ -155,7 +155,8 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     mode_ = params.sse ? 3 : 2;
     cells_.clear();
     items_.clear();
-    blob_.clear();
+    packets_.clear();
+    groups_.clear();
     children_.clear();
     stats_ = GridStats();
     nx_ = ny_ = nz_ = 0;
@@ -296,7 +297,9 @@ void Grid::finalize() {
     if (refinedChild_.size() != ncells) refinedChild_.assign(ncells, 0xFFFFFFFFu);
     std::vector<uint32_t> cellBegin(ncells + 1, 0);
     items_.clear();
-    blob_.clear();
+    packets_.clear();
+    groups_.clear();
+    if (params_.sse) packTriangles();
     stats_ = GridStats();
     stats_.voxels = ncells;
     std::vector<uint32_t> tris, others;
@@ -319,7 +322,7 @@ void Grid::finalize() {
             }
             if (!tris.empty()) {
                 int64_t z = int64_t(c / size_t(nx_ * ny_)), rem = int64_t(c % size_t(nx_ * ny_));
-                packCell(tris, cellBox(rem % nx_, rem / nx_, z));
+                groupCell(tris, cellBox(rem % nx_, rem / nx_, z));
             }
             items_.insert(items_.end(), others.begin(), others.end());
         }
@@ -349,13 +352,29 @@ void Grid::finalize() {
     items_.swap(lists);
     computeDistances(occupied);
     items_.shrink_to_fit();
-    blob_.shrink_to_fit();
+    groups_.shrink_to_fit();
+    std::vector<std::pair<uint32_t, uint32_t>>().swap(packetOf_);
+    std::vector<uint32_t>().swap(packetOfDense_);
     std::vector<uint32_t>().swap(buildBegin_);
     std::vector<uint32_t>().swap(buildItems_);
     std::vector<uint32_t>().swap(refinedChild_);
 }
 
 namespace {
+
+// Interleaves the low 21 bits of x, y and z.
+uint64_t morton3x21(uint64_t x, uint64_t y, uint64_t z) {
+    auto spread = [](uint64_t v) {
+        v &= 0x1FFFFF;
+        v = (v | v << 32) & 0x1F00000000FFFFull;
+        v = (v | v << 16) & 0x1F0000FF0000FFull;
+        v = (v | v << 8) & 0x100F00F00F00F00Full;
+        v = (v | v << 4) & 0x10C30C30C30C30C3ull;
+        v = (v | v << 2) & 0x1249249249249249ull;
+        return v;
+    };
+    return spread(x) | spread(y) << 1 | spread(z) << 2;
+}
 
 // Interleaves the low ten bits of x, y and z.
 uint32_t morton3(uint32_t x, uint32_t y, uint32_t z) {
@@ -372,117 +391,193 @@ uint32_t morton3(uint32_t x, uint32_t y, uint32_t z) {
 
 }  // namespace
 
-void Grid::packCell(std::vector<uint32_t> &tris, const BBox &cell) {
-    // Neighbouring triangles share packets (Morton order of their centres), so that the
-    // packet boxes are small.
-    std::vector<std::pair<uint32_t, uint32_t>> keyed;
-    keyed.reserve(tris.size());
-    Vec3 ext = cell.extent();
-    for (uint32_t t : tris) {
+void Grid::packTriangles() {
+    // Every triangle of an unrefined cell with the first such cell (its home).
+    size_t ncells = size_t(nx_ * ny_ * nz_);
+    std::vector<std::pair<uint32_t, uint32_t>> home;
+    // Large grids mark the triangles seen in an array over the store; small ones sort.
+    bool dense = size_t(buildItems_.size()) * 8 >= store_->triangles.size();
+    std::vector<bool> seen(dense ? store_->triangles.size() : 0);
+    for (size_t c = 0; c < ncells; ++c) {
+        if (refinedChild_[c] != 0xFFFFFFFFu) continue;
+        for (uint32_t k = buildBegin_[c]; k < buildBegin_[c + 1]; ++k) {
+            if ((buildItems_[k] >> kItemIndexBits) != kItemTriangle) continue;
+            uint32_t t = buildItems_[k] & kItemIndexMask;
+            if (dense) {
+                if (seen[t]) continue;
+                seen[t] = true;
+            }
+            home.emplace_back(t, uint32_t(c));
+        }
+    }
+    if (!dense) {
+        std::sort(home.begin(), home.end());
+        home.erase(std::unique(home.begin(), home.end(),
+                               [](const auto &a, const auto &b) { return a.first == b.first; }),
+                   home.end());
+    }
+    // Order: Morton order of the home cells, then Morton order of the centres inside them, so
+    // that neighbouring triangles share packets and a packet rarely spans two cells.
+    struct Keyed {
+        uint64_t cell;
+        uint32_t inside, tri;
+        bool operator<(const Keyed &o) const {
+            return cell != o.cell ? cell < o.cell : (inside != o.inside ? inside < o.inside : tri < o.tri);
+        }
+    };
+    std::vector<Keyed> keyed;
+    keyed.reserve(home.size());
+    for (const auto &[t, c] : home) {
+        int64_t z = int64_t(c / size_t(nx_ * ny_)), rem = int64_t(c % size_t(nx_ * ny_));
+        int64_t x = rem % nx_, y = rem / nx_;
+        BBox cell = cellBox(x, y, z);
+        Vec3 ext = cell.extent();
         const IntersectTriangle &tri = store_->triangles[t];
-        Vec3 c = tri.p0 + (tri.e1 + tri.e2) * (1.0f / 3.0f);
+        Vec3 centre = tri.p0 + (tri.e1 + tri.e2) * (1.0f / 3.0f);
         uint32_t q[3];
         for (int a = 0; a < 3; ++a) {
-            float f = ext[a] > 0.0f ? (c[a] - cell.min[a]) / ext[a] * 1023.0f : 0.0f;
+            float f = ext[a] > 0.0f ? (centre[a] - cell.min[a]) / ext[a] * 1023.0f : 0.0f;
             f = f >= 0.0f ? (f <= 1023.0f ? f : 1023.0f) : 0.0f;
             q[a] = uint32_t(f);
         }
-        keyed.emplace_back(morton3(q[0], q[1], q[2]), t);
+        keyed.push_back({morton3x21(uint64_t(x), uint64_t(y), uint64_t(z)), morton3(q[0], q[1], q[2]), t});
     }
     std::sort(keyed.begin(), keyed.end());
     const float nan = std::numeric_limits<float>::quiet_NaN();
-    // Packet boxes are clipped to the cell (a hit is always found in the cell that holds its
-    // point) and padded beyond the cell margin against rounding in the slab test.
-    float pad = margin_ + 1e-3f * cell.extent().length();
-    Vec3 vpad(pad, pad, pad);
-    BBox clip(cell.min - vpad, cell.max + vpad);
-    size_t packetCount = (keyed.size() + 3) / 4;
-    // Item codes address at most 2^29 blocks; a structure that large keeps the remaining
-    // triangles unpacked (the same test, one triangle at a time).
-    size_t blocks = packetCount * kPacketBlocks + (packetCount + 3) / 4 * kGroupBlocks;
-    if (blob_.size() + blocks > kMaxItemIndex) {
-        for (const auto &k : keyed) items_.push_back(itemCode(kItemTriangle, k.second));
-        return;
+    packets_.assign((keyed.size() + 3) / 4, IntersectSSETriangle());
+    packetOf_.clear();
+    packetOf_.reserve(keyed.size());
+    for (size_t i = 0; i < packets_.size() * 4; ++i) {
+        IntersectSSETriangle &pk = packets_[i / 4];
+        int lane = int(i % 4);
+        bool used = i < keyed.size();
+        uint32_t index = used ? keyed[i].tri : 0xFFFFFFFFu;
+        const IntersectTriangle *t = used ? &store_->triangles[index] : nullptr;
+        for (int a = 0; a < 3; ++a) {
+            pk.p0[a][lane] = used ? t->p0[a] : nan;
+            pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
+            pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
+        }
+        pk.flags[lane] = used ? t->flags : 0u;
+        pk.prim[lane] = index;
+        pk.id[lane] = used ? t->id : 0u;
+        pk.instance[lane] = used ? t->instance : kNoInstance;
+        if (used) packetOf_.emplace_back(index, uint32_t(i / 4));
     }
-    bool grouped = packetCount > 1;
-    for (size_t g = 0; g < packetCount; g += 4) {
-        uint32_t count = uint32_t(std::min<size_t>(4, packetCount - g));
-        uint32_t groupOffset = uint32_t(blob_.size());
-        PacketGroup group;
-        if (grouped) {
-            blob_.resize(blob_.size() + kGroupBlocks);
-            group.first = uint32_t(blob_.size());
-            group.count = count;
-        }
-        for (uint32_t j = 0; j < count; ++j) {
-            size_t i = (g + j) * 4;
-            IntersectSSETriangle pk;
-            BBox box;
-            for (int lane = 0; lane < 4; ++lane) {
-                bool used = i + lane < keyed.size();
-                uint32_t index = used ? keyed[i + lane].second : 0xFFFFFFFFu;
-                const IntersectTriangle *t = used ? &store_->triangles[index] : nullptr;
-                for (int a = 0; a < 3; ++a) {
-                    pk.p0[a][lane] = used ? t->p0[a] : nan;
-                    pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
-                    pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
-                }
-                pk.flags[lane] = used ? t->flags : 0u;
-                pk.prim[lane] = index;
-                pk.id[lane] = used ? t->id : 0u;
-                pk.instance[lane] = used ? t->instance : kNoInstance;
-                if (used) box.extend(t->bounds());
-            }
-            box.min = vmax(box.min - vpad, clip.min);
-            box.max = vmin(box.max + vpad, clip.max);
-            for (int a = 0; a < 3; ++a) group.lo[a][j] = box.min[a], group.hi[a][j] = box.max[a];
-            uint32_t offset = uint32_t(blob_.size());
-            blob_.resize(blob_.size() + kPacketBlocks);
-            std::memcpy(static_cast<void *>(blob_.data() + offset), &pk, sizeof pk);
-            if (!grouped) items_.push_back(itemCode(kItemPacket, offset));
-        }
-        if (grouped) {
-            for (uint32_t j = count; j < 4; ++j)
-                for (int a = 0; a < 3; ++a)
-                    group.lo[a][j] = group.lo[a][0], group.hi[a][j] = group.hi[a][0];
-            std::memcpy(static_cast<void *>(blob_.data() + groupOffset), &group, sizeof group);
-            items_.push_back(itemCode(kItemGroup, groupOffset));
-        }
+    if (dense) {
+        packetOfDense_.assign(store_->triangles.size(), 0);
+        for (const auto &[t, p] : packetOf_) packetOfDense_[t] = p;
+        std::vector<std::pair<uint32_t, uint32_t>>().swap(packetOf_);
+    } else {
+        std::sort(packetOf_.begin(), packetOf_.end());
     }
 }
 
+uint32_t Grid::packetOf(uint32_t triangle) const {
+    if (!packetOfDense_.empty()) return packetOfDense_[triangle];
+    return std::lower_bound(packetOf_.begin(), packetOf_.end(), std::make_pair(triangle, 0u))
+        ->second;
+}
+
+void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
+    // The packets holding the cell's triangles, each with the box of those triangles.
+    std::vector<std::pair<uint32_t, uint32_t>> byPacket;
+    byPacket.reserve(tris.size());
+    for (uint32_t t : tris) byPacket.emplace_back(packetOf(t), t);
+    std::sort(byPacket.begin(), byPacket.end());
+    std::vector<std::pair<uint32_t, BBox>> used;
+    for (const auto &[p, t] : byPacket) {
+        const IntersectTriangle &tri = store_->triangles[t];
+        const Vec3 p1 = tri.p0 + tri.e1, p2 = tri.p0 + tri.e2;
+        Vec3 lo, hi;
+        for (int a = 0; a < 3; ++a) {
+            lo[a] = std::min({tri.p0[a], p1[a], p2[a]});
+            hi[a] = std::max({tri.p0[a], p1[a], p2[a]});
+        }
+        if (used.empty() || used.back().first != p) {
+            used.emplace_back(p, BBox(lo, hi));
+        } else {
+            BBox &b = used.back().second;
+            b.min = vmin(b.min, lo);
+            b.max = vmax(b.max, hi);
+        }
+    }
+    // Groups address packets with 29 bits; a structure that large keeps the remaining
+    // triangles unpacked (the same test, one triangle at a time).
+    size_t groupCount = (used.size() + 3) / 4;
+    if (groups_.size() + groupCount > kMaxItemIndex) {
+        for (uint32_t t : tris) items_.push_back(itemCode(kItemTriangle, t));
+        return;
+    }
+    if (used.size() == 1) {
+        items_.push_back(itemCode(kItemPacket, used[0].first));
+        return;
+    }
+    // Boxes are clipped to the cell (a hit is always found in the cell that holds its point)
+    // and padded beyond the cell margin against rounding in the slab test.
+    float pad = margin_ + 1e-3f * cell.extent().length();
+    Vec3 vpad(pad, pad, pad);
+    BBox clip(cell.min - vpad, cell.max + vpad);
+    uint32_t first = uint32_t(groups_.size());
+    for (size_t g = 0; g < groupCount; ++g) {
+        PacketGroup group;
+        group.count = uint32_t(std::min<size_t>(4, used.size() - 4 * g));
+        group.run = uint32_t(groupCount - g);
+        for (uint32_t j = 0; j < 4; ++j) {
+            const auto &[p, b] = used[4 * g + std::min(j, group.count - 1)];
+            Vec3 lo = vmax(b.min - vpad, clip.min), hi = vmin(b.max + vpad, clip.max);
+            for (int a = 0; a < 3; ++a) group.lo[a][j] = lo[a], group.hi[a][j] = hi[a];
+            group.packet[j] = p;
+        }
+        groups_.push_back(group);
+    }
+    items_.push_back(itemCode(kItemGroup, first));
+}
+
 void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
-    // Exact chessboard distance by two raster passes over the 26-neighbourhood.
-    size_t ncells = cells_.size();
-    distance_.assign(ncells, 255);
-    for (size_t c = 0; c < ncells; ++c)
-        if (occupied[c]) distance_[c] = 0;
-    auto pass = [&](int dir) {
-        int64_t zs = dir > 0 ? 0 : nz_ - 1, ys0 = dir > 0 ? 0 : ny_ - 1,
-                xs0 = dir > 0 ? 0 : nx_ - 1;
-        for (int64_t z = zs; z >= 0 && z < nz_; z += dir)
-            for (int64_t y = ys0; y >= 0 && y < ny_; y += dir)
-                for (int64_t x = xs0; x >= 0 && x < nx_; x += dir) {
+    // Per direction octant (signs of the ray direction), the side of the largest empty cube that
+    // starts at the cell and extends the way the ray goes; cells beyond the grid count as empty.
+    // One pass per octant against its direction: each cell takes one more than the smallest of
+    // its seven neighbours ahead, or kEmptyAhead when every cell ahead of it (the whole octant
+    // of cells whose coordinates lie on the ray's side) is empty.
+    size_t ncells = occupied.size();
+    distance_.assign(8 * ncells, 255);
+    const int64_t n[3] = {nx_, ny_, nz_};
+    for (int octant = 0; octant < 8; ++octant) {
+        uint8_t *d = distance_.data() + size_t(octant) * ncells;
+        int64_t s[3], start[3], stride[3] = {1, nx_, nx_ * ny_};
+        for (int a = 0; a < 3; ++a) {
+            s[a] = (octant >> a & 1) ? -1 : 1;
+            start[a] = s[a] > 0 ? n[a] - 1 : 0;
+        }
+        int64_t offset[8];
+        for (int m = 0; m < 8; ++m)
+            offset[m] = ((m & 1) ? s[0] * stride[0] : 0) + ((m & 2) ? s[1] * stride[1] : 0) +
+                        ((m & 4) ? s[2] * stride[2] : 0);
+        for (int64_t z = start[2]; z >= 0 && z < nz_; z -= s[2])
+            for (int64_t y = start[1]; y >= 0 && y < ny_; y -= s[1])
+                for (int64_t x = start[0]; x >= 0 && x < nx_; x -= s[0]) {
                     size_t c = size_t((z * ny_ + y) * nx_ + x);
-                    uint32_t best = distance_[c];
-                    if (best == 0) continue;
-                    // The 13 neighbours already visited in this pass's order.
-                    for (int64_t dz = -1; dz <= 0; ++dz)
-                        for (int64_t dy = -1; dy <= 1; ++dy)
-                            for (int64_t dx = -1; dx <= 1; ++dx) {
-                                if (dz == 0 && (dy > 0 || (dy == 0 && dx >= 0))) continue;
-                                int64_t xx = x + dx * dir, yy = y + dy * dir, zz = z + dz * dir;
-                                if (xx < 0 || yy < 0 || zz < 0 || xx >= nx_ || yy >= ny_ ||
-                                    zz >= nz_)
-                                    continue;
-                                uint32_t d = distance_[size_t((zz * ny_ + yy) * nx_ + xx)] + 1u;
-                                if (d < best) best = d;
-                            }
-                    distance_[c] = uint8_t(std::min<uint32_t>(best, 255));
+                    if (occupied[c]) {
+                        d[c] = 0;
+                        continue;
+                    }
+                    // Neighbours ahead on each axis, or none beyond the grid.
+                    bool in[3] = {x + s[0] >= 0 && x + s[0] < nx_, y + s[1] >= 0 && y + s[1] < ny_,
+                                  z + s[2] >= 0 && z + s[2] < nz_};
+                    uint32_t best = kEmptyAhead;
+                    if (in[0] && in[1] && in[2]) {
+                        for (int m = 1; m < 8; ++m)
+                            best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
+                    } else {
+                        for (int m = 1; m < 8; ++m)
+                            if (!((m & 1) && !in[0]) && !((m & 2) && !in[1]) && !((m & 4) && !in[2]))
+                                best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
+                    }
+                    d[c] = uint8_t(best == kEmptyAhead ? kEmptyAhead
+                                                       : std::min<uint32_t>(best + 1, kEmptyAhead - 1));
                 }
-    };
-    pass(1);
-    pass(-1);
+    }
 }
 
 size_t Grid::nestedGridCount() const {
@@ -499,7 +594,8 @@ uint32_t Grid::nestingDepth() const {
 
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cells_.capacity() * sizeof(uint32_t) + items_.capacity() * 4 +
-               distance_.capacity() + blob_.capacity() * sizeof(Block) +
+               distance_.capacity() + packets_.capacity() * sizeof(IntersectSSETriangle) +
+               groups_.capacity() * sizeof(PacketGroup) +
                children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
@@ -569,6 +665,43 @@ inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit, float
 }  // namespace
 
 template <bool kAny>
+bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s) const {
+    const PacketGroup *g = groups_.data() + index;
+    // Most cells have several groups: fetch the next two headers before the first arrives.
+    for (int i = 0; i < 3; ++i) {
+        __builtin_prefetch(g + i);
+        __builtin_prefetch(reinterpret_cast<const char *>(g + i) + 64);
+    }
+    uint32_t n = g->run;
+    for (uint32_t i = 3; i < n; ++i) {
+        __builtin_prefetch(g + i);
+        __builtin_prefetch(reinterpret_cast<const char *>(g + i) + 64);
+    }
+    bool hit = false;
+    for (; n > 0; --n, ++g) {
+        float4 tnear;
+        int mask = groupMask(*g, r, s.limit, tnear);
+        // Start fetching every packet the ray may test, so their misses overlap.
+        for (int m = mask; m; m &= m - 1) {
+            const char *p = reinterpret_cast<const char *>(&packets_[g->packet[__builtin_ctz(m)]]);
+            for (int line = 0; line < int(sizeof(IntersectSSETriangle)); line += 64)
+                __builtin_prefetch(p + line);
+        }
+        while (mask) {
+            int lane = __builtin_ctz(mask);
+            mask &= mask - 1;
+            if (testPacket<kAny>(packets_[g->packet[lane]], r, s)) {
+                if constexpr (kAny) return true;
+                hit = true;
+                // Boxes entered beyond the new closest hit cannot hold a closer one.
+                mask &= movemask(_mm_cmple_ps(tnear, float4(s.limit)));
+            }
+        }
+    }
+    return hit;
+}
+
+template <bool kAny>
 bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                      const uint32_t *last) const {
     bool hit = false;
@@ -577,38 +710,16 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
         uint32_t index = code & kItemIndexMask;
         switch (code >> kItemIndexBits) {
             case kItemPacket: {
-                if (testPacket<kAny>(*packetAt(index), r, s)) {
+                if (testPacket<kAny>(packets_[index], r, s)) {
                     if constexpr (kAny) return true;
                     hit = true;
                 }
                 break;
             }
             case kItemGroup: {
-                const PacketGroup &g = *groupAt(index);
-                // The first packet follows the group; fetch it while the boxes are tested.
-                const char *p0 = reinterpret_cast<const char *>(packetAt(index + kGroupBlocks));
-                __builtin_prefetch(p0);
-                __builtin_prefetch(p0 + 64);
-                __builtin_prefetch(p0 + 128);
-                __builtin_prefetch(p0 + 192);
-                float4 tnear;
-                int mask = groupMask(g, r, s.limit, tnear);
-                // Start fetching every packet the ray may test, so their misses overlap.
-                for (int m = mask; m; m &= m - 1) {
-                    const char *p = reinterpret_cast<const char *>(
-                        packetAt(g.first + __builtin_ctz(m) * kPacketBlocks));
-                    for (int line = 0; line < int(sizeof(IntersectSSETriangle)); line += 64)
-                        __builtin_prefetch(p + line);
-                }
-                while (mask) {
-                    int lane = __builtin_ctz(mask);
-                    mask &= mask - 1;
-                    if (testPacket<kAny>(*packetAt(g.first + lane * kPacketBlocks), r, s)) {
-                        if constexpr (kAny) return true;
-                        hit = true;
-                        // Boxes entered beyond the new closest hit cannot hold a closer one.
-                        mask &= movemask(_mm_cmple_ps(tnear, float4(s.limit)));
-                    }
+                if (testGroups<kAny>(index, r, s)) {
+                    if constexpr (kAny) return true;
+                    hit = true;
                 }
                 break;
             }
@@ -710,7 +821,10 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
         delta[a] = step[a] ? cellSize_[a] * std::fabs(r.inv[a]) : kInfiniteDistance;
     }
-    const uint8_t *distance = distance_.data();
+    // The distances of the ray's direction octant.
+    const uint8_t *distance =
+        distance_.data() + size_t((step[0] < 0) | (step[1] < 0) << 1 | (step[2] < 0) << 2) *
+                               size_t(nx_ * ny_ * nz_);
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
     bool found = false;
@@ -737,9 +851,12 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             if (last - first > 1)
                 for (const uint32_t *k = first; k != last; ++k) {
                     uint32_t kind = *k >> kItemIndexBits;
-                    if (kind == kItemGroup || kind == kItemPacket) {
-                        const char *p =
-                            reinterpret_cast<const char *>(blob_.data() + (*k & kItemIndexMask));
+                    const char *p = nullptr;
+                    if (kind == kItemGroup)
+                        p = reinterpret_cast<const char *>(&groups_[*k & kItemIndexMask]);
+                    else if (kind == kItemPacket)
+                        p = reinterpret_cast<const char *>(&packets_[*k & kItemIndexMask]);
+                    if (p) {
                         __builtin_prefetch(p);
                         __builtin_prefetch(p + 64);
                     }
@@ -753,13 +870,17 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 uint32_t word = cells[cell + cellStep[a]];
                 uint32_t kind = word >> kItemIndexBits;
                 const char *p = nullptr;
-                if (kind == kItemGroup || kind == kItemPacket)
-                    p = reinterpret_cast<const char *>(blob_.data() + (word & kItemIndexMask));
+                if (kind == kItemGroup)
+                    p = reinterpret_cast<const char *>(&groups_[word & kItemIndexMask]);
+                else if (kind == kItemPacket)
+                    p = reinterpret_cast<const char *>(&packets_[word & kItemIndexMask]);
                 else if (kind == kItemList)
                     p = reinterpret_cast<const char *>(items + (word & kItemIndexMask));
                 if (p) __builtin_prefetch(p);
             }
         } else if (dist >= 2) {
+            // Nothing lies ahead of this cell the way the ray goes: the walk is over.
+            if (dist == kEmptyAhead) break;
             // Every cell within dist - 1 of this one is empty: leave that cube in one jump
             // through its nearest far face; the other axes catch up with ordinary steps.
             float reach = float(dist - 1);

@@ -16,22 +16,24 @@ struct PrimitiveStore;
 
 /// Primitive kinds a grid cell refers to; the kind sits in the top three bits of an item code.
 enum ItemKind : uint32_t {
-    kItemPacket = 0,    ///< An IntersectSSETriangle of the grid itself.
+    kItemPacket = 0,    ///< An IntersectSSETriangle of the grid itself (index into its packets).
     kItemTriangle = 1,  ///< An IntersectTriangle of the store.
     kItemMotion = 2,    ///< A MotionTriangle of the store.
     kItemInstance = 3,  ///< An IntersectInstanceGrid of the store.
     kItemChild = 4,     ///< A DynamicVoxel: a nested grid of the grid itself.
-    kItemGroup = 5,     ///< Up to four packets of the grid behind one four-wide box test.
+    kItemGroup = 5,     ///< The first of a cell's packet groups (index into the grid's groups).
     kItemList = 7,      ///< A cell word only: offset of the cell's count and codes in the list.
 };
 
-/// Up to four consecutive packets with their boxes (clipped to the cell), tested together so
-/// that a ray only runs the triangle kernel on packets whose box it passes through.
-struct alignas(16) PacketGroup {
+/// Up to four packets with the boxes of the cell's triangles in them (clipped to the cell),
+/// tested together so that a ray only runs the triangle kernel on packets whose box it passes
+/// through. A cell's groups follow each other; the first one's `run` counts them. Two cache lines.
+struct alignas(64) PacketGroup {
     float lo[3][4];
     float hi[3][4];
-    uint32_t first = 0;  ///< Block offset of the first packet (the packets follow the group).
-    uint32_t count = 0;  ///< Number of packets (1 to 4).
+    uint32_t packet[4] = {0, 0, 0, 0};  ///< Packet indexes.
+    uint32_t count = 0;                 ///< Number of packets (1 to 4).
+    uint32_t run = 1;                   ///< Groups of the cell from this one on.
     uint32_t reserved[2] = {0, 0};
 };
 constexpr uint32_t kItemIndexBits = 29;
@@ -191,7 +193,9 @@ private:
     void refine();
     void finalize();
     int64_t cellCoord(float v, int axis) const;
-    void packCell(std::vector<uint32_t> &tris, const BBox &cell);
+    void groupCell(std::vector<uint32_t> &tris, const BBox &cell);
+    template <bool kAny>
+    bool testGroups(uint32_t index, const TraceRay &ray, TraceState &state) const;
     template <bool kAny>
     bool testItems(const TraceRay &ray, TraceState &state, const uint32_t *first,
                    const uint32_t *last) const;
@@ -207,27 +211,28 @@ private:
     BBox box_;
     // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
     // the cell's item count followed by its codes; most cells reach their data without the list.
-    // Empty cells (distance_ not 0) hold 0.
+    // Empty cells hold 0.
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> cells_;
-    // Per cell: 0 when it holds items, else the chessboard distance (in cells, at most 255) to
-    // the nearest cell that does; the walk jumps over the empty cube this guarantees.
+    // Per direction octant (bit a set when the ray goes down axis a), per cell: 0 when the cell
+    // holds items, else the side (in cells, at most 254) of the largest empty cube that starts
+    // at the cell and extends the way such rays go, or kEmptyAhead when no cell the ray can
+    // still reach holds items. The walk jumps over the cube, or stops. A ray reads only its own
+    // octant's array.
+    static constexpr uint32_t kEmptyAhead = 255;
     std::vector<uint8_t, LargeArrayAllocator<uint8_t>> distance_;
     void computeDistances(const std::vector<uint32_t> &occupied);
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> items_;
-    // Packets and packet groups, 16-byte blocks; a group is followed by its packets so that
-    // one cell's data lies together in memory. Item codes of both kinds hold block offsets.
-    struct alignas(16) Block {
-        float f[4];
-    };
-    std::vector<Block, LargeArrayAllocator<Block>> blob_;
-    const PacketGroup *groupAt(uint32_t offset) const {
-        return reinterpret_cast<const PacketGroup *>(blob_.data() + offset);
-    }
-    const IntersectSSETriangle *packetAt(uint32_t offset) const {
-        return reinterpret_cast<const IntersectSSETriangle *>(blob_.data() + offset);
-    }
-    static constexpr uint32_t kGroupBlocks = sizeof(PacketGroup) / 16;
-    static constexpr uint32_t kPacketBlocks = sizeof(IntersectSSETriangle) / 16;
+    // Packets: every triangle of the grid's cells once, packed four to a packet in the order of
+    // its first cell and its place there, so that one cell's triangles share few packets. Cells
+    // name them through groups (or directly when a cell needs a single packet).
+    std::vector<IntersectSSETriangle, LargeArrayAllocator<IntersectSSETriangle>> packets_;
+    std::vector<PacketGroup, LargeArrayAllocator<PacketGroup>> groups_;
+    // Build-time map from store triangle to packet: dense over the store for large grids,
+    // else (triangle, packet) pairs sorted by triangle.
+    std::vector<uint32_t> packetOfDense_;
+    std::vector<std::pair<uint32_t, uint32_t>> packetOf_;
+    uint32_t packetOf(uint32_t triangle) const;
+    void packTriangles();
     std::vector<std::unique_ptr<Grid>> children_;
     GridStats stats_;
     // Build-time lists, released by finalize.
