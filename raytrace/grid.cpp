@@ -870,10 +870,12 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 uint32_t word = cells[cell + cellStep[a]];
                 uint32_t kind = word >> kItemIndexBits;
                 const char *p = nullptr;
+                // An empty cell's word (0) names packet 0, which need not exist: address
+                // arithmetic only, the prefetch reads nothing.
                 if (kind == kItemGroup)
-                    p = reinterpret_cast<const char *>(&groups_[word & kItemIndexMask]);
+                    p = reinterpret_cast<const char *>(groups_.data() + (word & kItemIndexMask));
                 else if (kind == kItemPacket)
-                    p = reinterpret_cast<const char *>(&packets_[word & kItemIndexMask]);
+                    p = reinterpret_cast<const char *>(packets_.data() + (word & kItemIndexMask));
                 else if (kind == kItemList)
                     p = reinterpret_cast<const char *>(items + (word & kItemIndexMask));
                 if (p) __builtin_prefetch(p);
