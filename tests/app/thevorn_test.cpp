@@ -59,21 +59,17 @@ constexpr const char *kBanner = "[INFO]     Zarnex Vorn (Rev: 179347)\n";
 constexpr const char *kUsageStart =
     "[ERROR]    thevorn <scene.xml> -o <outfile> -x <configuration.xml>\n";
 
-TEST_F(Thevorn, NoArgumentsPrintsTheSyntaxLineAndUsage) {
-    const Result r = run({});
-    EXPECT_EQ(r.exitCode, 2);
-    EXPECT_EQ(r.out.rfind(std::string(kBanner) +
-                              "Syntax error, the chosen command requires a scene but no input "
-                              "filename was specified.\n" +
-                              kUsageStart,
-                          0),
-              0u)
-        << r.out;
-    EXPECT_TRUE(has(r, "    More than one -ri parameter is supported.\n\n"));
-}
-
 TEST_F(Thevorn, EverySyntaxMessageEndsWithTheUsage) {
+    const auto listFails = [](const std::string &what) {  // the reader's reason, then ours
+        return "[ERROR]    Error opening file l.xml in xmlsource\n"
+               "Unable to load input file list from file: l.xml\n"
+               "Unable to build list of " +
+               what + ".";
+    };
     const std::vector<std::pair<std::vector<std::string>, std::string>> cases = {
+        {{},
+         "Syntax error, the chosen command requires a scene but no input filename was "
+         "specified."},
         {{"s.xml", "-x"}, "Syntax error, -x needs argument."},
         {{"s.xml", "-o", "a", "-o", "b"}, "Syntax error, more than one output file specified"},
         {{"s.xml", "-o"}, "Syntax error, -o needs argument."},
@@ -95,23 +91,15 @@ TEST_F(Thevorn, EverySyntaxMessageEndsWithTheUsage) {
         {{"s.xml", "-rm"}, "Syntax error, -rm needs at least one image to merge."},
         {{"s.xml", "-im", "target"}, "Syntax error, -im needs at least one image to merge."},
         {{"-pmbo", "0.5"}, "Syntax error, -pmbo needs at least one pointcloud to merge."},
-        {{"s.xml", "-i", "list.xml"},
-         "[ERROR]    Error opening file list.xml in xmlsource\n"  // the reader's reason
-         "Unable to load input file list from file: list.xml\n"
-         "Unable to build list of input files."},
-        {{"-pm", "-pi", "p.xml"},
-         "[ERROR]    Error opening file p.xml in xmlsource\n"  // the reader's reason
-         "Unable to load input file list from file: p.xml\n"
-         "Unable to build list of point cloud input files."},
-        {{"s.xml", "-ri", "r.xml"},
-         "[ERROR]    Error opening file r.xml in xmlsource\n"  // the reader's reason
-         "Unable to load input file list from file: r.xml\n"
-         "Unable to build list of image merge input files."},
+        {{"s.xml", "-i", "l.xml"}, listFails("input files")},
+        {{"-pm", "-pi", "l.xml"}, listFails("point cloud input files")},
+        {{"s.xml", "-ri", "l.xml"}, listFails("image merge input files")},
     };
     for (const auto &[args, line] : cases) {
         const Result r = run(args);
         EXPECT_EQ(r.exitCode, 2) << line;
         EXPECT_EQ(r.out.rfind(kBanner + line + "\n" + kUsageStart, 0), 0u) << r.out;
+        EXPECT_TRUE(has(r, "    More than one -ri parameter is supported.\n\n")) << line;
     }
     // Two configuration files: the usage without a line of its own.
     const Result r = run({"s.xml", "-x", "a.xml", "b.xml"});
@@ -121,12 +109,16 @@ TEST_F(Thevorn, EverySyntaxMessageEndsWithTheUsage) {
 }
 
 TEST_F(Thevorn, WritesDefaultsAndSchemaAsked) {
+    std::ofstream(dir_ / "config.xml") << "old";
     Result r = run({"-c"});
     EXPECT_EQ(r.exitCode, 0);
     EXPECT_EQ(r.out, std::string(kBanner) +
                          "[PROGRESS] Writing a default xml file (config.xml)\n"
                          "[PROGRESS] Done!\n");
-    EXPECT_TRUE(fs::is_regular_file(dir_ / "config.xml"));
+    std::ifstream written(dir_ / "config.xml");
+    std::string first;
+    std::getline(written, first);
+    EXPECT_EQ(first, "<?xml version=\"1.0\" encoding=\"ISO-8859-1\"?>");  // replaced, not kept
     r = run({"-xs", "-q"});
     EXPECT_EQ(r.exitCode, 0);
     EXPECT_TRUE(has(r, "[PROGRESS] Writing a default xml schema file (config.xsd)\n"));
@@ -137,6 +129,8 @@ TEST_F(Thevorn, WritesDefaultsAndSchemaAsked) {
     r = run({"-c"});
     EXPECT_EQ(r.exitCode, 21) << r.out;
     EXPECT_TRUE(has(r, "[ERROR]    Unable to write config.xml: "));
+    for (const auto &e : fs::directory_iterator(dir_))  // no temporary file is left behind
+        EXPECT_EQ(e.path().filename().string().find(".tmp"), std::string::npos) << e.path();
 }
 
 TEST_F(Thevorn, LinesThatLetTheRunGoOnAndTheOutputTree) {
@@ -144,6 +138,7 @@ TEST_F(Thevorn, LinesThatLetTheRunGoOnAndTheOutputTree) {
     EXPECT_EQ(r.exitCode, 4) << r.out;  // no driver for the camera render yet
     EXPECT_TRUE(has(r, "Syntax error, abc is not a valid input to -rt\n"));
     EXPECT_TRUE(has(r, "Syntax error, x is not a valid priority (h, l or n).\n"));
+    EXPECT_FALSE(has(r, "The render thread count"));  // a bad -rt leaves the automatic count
     EXPECT_TRUE(has(r, "[INFO]     Detected "));
     EXPECT_TRUE(has(r, "[ERROR]    The camera render (-r) is not available"));
     EXPECT_FALSE(has(r, "[ERROR]    thevorn <scene.xml>"));
@@ -159,9 +154,12 @@ TEST_F(Thevorn, ThreadCountsAndStatuses) {
     EXPECT_TRUE(has(r, "The texture bake (-b) is not available"));
     EXPECT_TRUE(fs::is_directory(dir_ / "deep/er/out/GI/occMaps"));
 
-    r = run({"scene.xml", "-x", "missing.xml"});
-    EXPECT_EQ(r.exitCode, 3);
-    EXPECT_TRUE(has(r, "[ERROR]    Unable to load settings from file missing.xml\n"));
+    std::ofstream(dir_ / "broken.xml") << "<OXConfig><FrameSettings></OXConfig>";
+    for (const std::string file : {"missing.xml", "broken.xml", "."}) {
+        r = run({"scene.xml", "-x", file});
+        EXPECT_EQ(r.exitCode, 3) << file;  // status 0x20000003
+        EXPECT_TRUE(has(r, "[ERROR]    Unable to load settings from file " + file + "\n")) << r.out;
+    }
     EXPECT_FALSE(fs::exists(dir_ / "GI"));  // nothing prepared for a run that cannot start
 
     // An output directory that cannot be created ends the run with the platform's code.

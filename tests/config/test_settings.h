@@ -1,12 +1,54 @@
 #pragma once
 
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <sstream>
 #include <string>
 
 #include "config/type.h"
+#include "config/xml.h"
 
-// Settings classes shared by the configuration tests: every value type, a nested object, both
-// vector kinds, two enumerations that share a type name.
+// Settings classes and helpers shared by the configuration tests: every value type, a nested
+// object, both vector kinds, two enumerations that share a type name.
 namespace cfgtest {
+
+inline int countOf(const std::string &text, const std::string &what) {
+    int n = 0;
+    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
+    return n;
+}
+
+inline std::string readFile(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+inline void writeFile(const std::string &path, const std::string &text) {
+    std::ofstream(path, std::ios::binary) << text;
+}
+
+/// The tree as the writer puts it in a file.
+inline std::string xmlOf(const ox::OXCTypeBase &v) {
+    std::string s;
+    EXPECT_TRUE(ox::writeSettingsToString(s, v));
+    return s;
+}
+
+/// A document whose entity a29 expands to 10^29 copies of "lol" (besides any `extraDecl`).
+inline std::string billionLaughs(const std::string &root, const std::string &extraDecl,
+                                 const std::string &body) {
+    std::string doc =
+        "<?xml version=\"1.0\"?><!DOCTYPE " + root + " [<!ENTITY a0 \"lol\">" + extraDecl;
+    for (int i = 1; i < 30; ++i) {
+        std::string text;
+        for (int k = 0; k < 10; ++k) text += "&a" + std::to_string(i - 1) + ";";
+        doc += "<!ENTITY a" + std::to_string(i) + " \"" + text + "\">";
+    }
+    return doc + "]>" + body;
+}
 
 enum class Mode : int32_t { Render, TextureBake, VertexBake };
 OX_ENUM_NAMES(Mode, "RenderType", "Render", "TextureBake", "VertexBake");
