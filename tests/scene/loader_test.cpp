@@ -99,21 +99,17 @@ TEST(ZPXLoader, LoadsAWholeScene) {
     s.environment.globalAmbientColor = Color(0.5f, 0.5f, 0.5f, 1);
     LoadResult r = load(f.inputs, scene, s);
     ASSERT_TRUE(r.ok) << r.error << r.out;
-    const std::string &out = r.out;
-    EXPECT_NE(out.find("[PROGRESS] Loading Scene File"), std::string::npos);
-    EXPECT_NE(out.find("[BENCH]    ZPX Loading time: "), std::string::npos);
-    EXPECT_NE(out.find("[BENCH]    Scene bounding box time: "), std::string::npos);
-    EXPECT_NE(out.find("[PROGRESS] Progress Title: Creating Temp Shapes"), std::string::npos);
-    EXPECT_NE(out.find("[INFO]     Adding fake camera"), std::string::npos);
-    EXPECT_NE(out.find("[PROGRESS] Successfully loaded ZPX-File"), std::string::npos);
-    EXPECT_EQ(test::countOf(out,
+    for (const char *want :
+         {"[PROGRESS] Loading Scene File", "[BENCH]    ZPX Loading time: ",
+          "[BENCH]    Scene bounding box time: ", "[PROGRESS] Progress Title: Creating Temp Shapes",
+          "[INFO]     Adding fake camera", "[PROGRESS] Successfully loaded ZPX-File",
+          "Failed to find override material nope on instance wall2, using default",
+          "Light linked instance ghost not present", "[INFO]     Ray tracing bias: 0.005000"})
+        EXPECT_NE(r.out.find(want), std::string::npos) << want;
+    EXPECT_EQ(test::countOf(r.out,
                             "Provided more than one material override for instance wall1, "
                             "using only the first for the entire shape"),
               1u);
-    EXPECT_NE(out.find("Failed to find override material nope on instance wall2, using default"),
-              std::string::npos);
-    EXPECT_NE(out.find("Light linked instance ghost not present"), std::string::npos);
-    EXPECT_NE(out.find("[INFO]     Ray tracing bias: 0.005000"), std::string::npos);
 
     ASSERT_EQ(scene.shapes().size(), 2u);
     EXPECT_EQ(scene.shapes()[0]->name(), "plane");  // in the order of the inputs
@@ -152,8 +148,7 @@ TEST(ZPXLoader, CamerasByType) {
           "<Camera><Name>e</Name><Type>ENVIRONMENT</Type><EnvironmentType>CUBEMAP</EnvironmentType>"
           "</Camera><Camera><Name>p</Name></Camera>");
     Scene scene;
-    SceneLoadSettings s = settings();
-    LoadResult r = load(f.inputs, scene, s);
+    LoadResult r = load(f.inputs, scene);
     ASSERT_TRUE(r.ok) << r.error;
     EXPECT_NE(r.out.find("[INFO]     Creating camera: o"), std::string::npos);
     EXPECT_NE(r.out.find("Duplicate camera name p"), std::string::npos);
@@ -189,17 +184,15 @@ TEST(ZPXLoader, FileKindsByExtension) {
 TEST(ZPXLoader, AutomaticBias) {
     SceneFiles f;
     f.quad("a.vtm", "cube", "m");
-    // The quad spans -1..1 in x and y; scaling z by 1 after a translation of (0, 0, -1) and a
-    // second instance at z = +1 give the box (-1, -1, -1) .. (1, 1, 1).
-    f.xml("s.xml", material("m") +
-                       instance("low", "cube",
-                                "<ObjectToWorld><r><c>1</c></r><r><c>0</c><c>1</c></r><r><c>0</c>"
-                                "<c>0</c><c>1</c></r><r><c>0</c><c>0</c><c>-1</c><c>1</c></r>"
-                                "</ObjectToWorld>") +
-                       instance("high", "cube",
-                                "<ObjectToWorld><r><c>1</c></r><r><c>0</c><c>1</c></r><r><c>0</c>"
-                                "<c>0</c><c>1</c></r><r><c>0</c><c>0</c><c>1</c><c>1</c></r>"
-                                "</ObjectToWorld>"));
+    // The quad spans -1..1 in x and y; instances at z = -1 and z = +1 give the box
+    // (-1, -1, -1) .. (1, 1, 1).
+    auto at = [](const char *name, const char *z) {
+        return instance(name, "cube",
+                        std::string("<ObjectToWorld><r><c>1</c></r><r><c>0</c><c>1</c></r><r>"
+                                    "<c>0</c><c>0</c><c>1</c></r><r><c>0</c><c>0</c><c>") +
+                            z + "</c><c>1</c></r></ObjectToWorld>");
+    };
+    f.xml("s.xml", material("m") + at("low", "-1") + at("high", "1"));
     Scene scene;
     LoadResult r = load(f.inputs, scene, settings(0.0f));
     ASSERT_TRUE(r.ok) << r.error << r.out;
@@ -223,70 +216,48 @@ TEST(ZPXLoader, AutomaticBias) {
 }
 
 TEST(ZPXLoader, FailuresStopTheLoad) {
-    {
-        // A mesh file that cannot be pre-opened.
-        SceneFiles f;
-        test::writeBytes(f.dir.file("bad.vtm"), {'V', 'T', 'M', 'X', 0});
-        f.inputs.push_back(f.dir.file("bad.vtm"));
+    auto fail = [](const SceneFiles &f, const SceneLoadSettings &s = settings()) {
         Scene scene;
-        LoadResult r = load(f.inputs, scene);
+        LoadResult r = load(f.inputs, scene, s);
         EXPECT_FALSE(r.ok);
-        EXPECT_EQ(r.error, "Failed to preopen file " + f.dir.file("bad.vtm"));
-        EXPECT_NE(r.out.find("[ERROR]    Failed to preopen file "), std::string::npos);
-    }
-    {
-        // An instance of a shape that no mesh file gives.
-        SceneFiles f;
-        f.xml("s.xml", instance("i", "ghost"));
-        Scene scene;
-        LoadResult r = load(f.inputs, scene);
-        EXPECT_FALSE(r.ok);
-        EXPECT_EQ(r.error, "Missing shapes");
-        EXPECT_NE(r.out.find("[WARNING]  Base shape ghost not found for instance i"),
-                  std::string::npos);
-        EXPECT_NE(r.out.find("[ERROR]    Instance refering to non existing shape ghost"),
-                  std::string::npos);
-    }
-    {
-        // A mesh whose material the scene does not define.
-        SceneFiles f;
-        f.quad("a.vtm", "s", "nope");
-        f.xml("s.xml", material("m"));
-        Scene scene;
-        LoadResult r = load(f.inputs, scene);
-        EXPECT_FALSE(r.ok);
-        EXPECT_EQ(r.error,
-                  "Error creating temp shapes: Material nope not defined when loading shape s");
-        EXPECT_NE(r.out.find("[ERROR]    Material nope not defined when loading shape s"),
-                  std::string::npos);
-    }
-    {
-        // A scene document with another root, and one that is not well-formed.
-        SceneFiles f;
-        f.inputs.push_back(f.dir.file("other.xml"));
-        std::ofstream(f.inputs.back()) << "<Scene><Instance/></Scene>";
-        Scene scene;
-        LoadResult r = load(f.inputs, scene);
-        EXPECT_FALSE(r.ok);
-        EXPECT_NE(r.error.find("instead of OXScene"), std::string::npos);
-        std::ofstream(f.inputs.back()) << "<OXScene><Instance>";
-        Scene scene2;
-        r = load(f.inputs, scene2);
-        EXPECT_FALSE(r.ok);
-        Scene scene3;
-        r = load({f.dir.file("missing.xml")}, scene3);
-        EXPECT_FALSE(r.ok);
-    }
-    {
-        // An image-based environment whose image is missing.
-        Scene scene;
-        SceneLoadSettings s = settings();
-        s.environment.rtEnvironment = 3;
-        s.environment.iblImageFile = "/no/such/probe.hdr";
-        LoadResult r = load({}, scene, s);
-        EXPECT_FALSE(r.ok);
-        EXPECT_EQ(r.error, "Unable to create environment");
-    }
+        return r;
+    };
+    // A mesh file that cannot be pre-opened.
+    SceneFiles bad;
+    test::writeBytes(bad.dir.file("bad.vtm"), {'V', 'T', 'M', 'X', 0});
+    bad.inputs.push_back(bad.dir.file("bad.vtm"));
+    LoadResult r = fail(bad);
+    EXPECT_EQ(r.error, "Failed to preopen file " + bad.dir.file("bad.vtm"));
+    EXPECT_NE(r.out.find("[ERROR]    Failed to preopen file "), std::string::npos);
+
+    // An instance of a shape that no mesh file gives.
+    SceneFiles ghost;
+    ghost.xml("s.xml", instance("i", "ghost"));
+    r = fail(ghost);
+    EXPECT_EQ(r.error, "Missing shapes");
+    EXPECT_NE(r.out.find("[WARNING]  Base shape ghost not found for instance i"),
+              std::string::npos);
+    EXPECT_NE(r.out.find("[ERROR]    Instance refering to non existing shape ghost"),
+              std::string::npos);
+
+    // A mesh whose material the scene does not define.
+    SceneFiles undefined;
+    undefined.quad("a.vtm", "s", "nope");
+    undefined.xml("s.xml", material("m"));
+    EXPECT_EQ(fail(undefined).error,
+              "Error creating temp shapes: Material nope not defined when loading shape s");
+
+    // A scene document with another root.
+    SceneFiles other;
+    other.inputs.push_back(other.dir.file("other.xml"));
+    std::ofstream(other.inputs.back()) << "<Scene><Instance/></Scene>";
+    EXPECT_NE(fail(other).error.find("instead of OXScene"), std::string::npos);
+
+    // An image-based environment whose image is missing.
+    SceneLoadSettings s = settings();
+    s.environment.rtEnvironment = 3;
+    s.environment.iblImageFile = "/no/such/probe.hdr";
+    EXPECT_EQ(fail(SceneFiles(), s).error, "Unable to create environment");
 }
 
 TEST(ZPXLoader, ShapesEdgeCases) {

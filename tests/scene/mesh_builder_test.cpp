@@ -26,18 +26,25 @@ struct FakeMaterials : ShapeMaterialResolverInterface {
     }
 };
 
-// Builds a mesh through a file, as a run does.
-ShapeBuildStatus buildFromMesh(const vtm::TempMesh &mesh, std::unique_ptr<Shape> &shape,
-                               std::string &failure, const MeshBuildOptions &options = {},
-                               uint32_t version = 2) {
+struct Built {
+    ShapeBuildStatus status = ShapeBuildStatus::kFailed;
+    std::unique_ptr<Shape> shape;
+    std::string failure, out;
+};
+
+// Builds a mesh through a file, as a run does, and keeps what it printed.
+Built buildMesh(const vtm::TempMesh &mesh, const MeshBuildOptions &options = {},
+                uint32_t version = 2) {
     TempDir dir;
     std::string path = dir.file("m.vtm");
     EXPECT_TRUE(vtm::writeTempMesh(path, mesh, version));
-    auto reader = vtm::TempMeshReaderFactory::instance().open(path);
-    EXPECT_TRUE(reader);
-    if (!reader) return ShapeBuildStatus::kFailed;
-    FakeMaterials materials;
-    return buildTempShape(*reader, materials, options, shape, failure);
+    Built b;
+    b.out = captureMessages([&] {
+        auto reader = vtm::TempMeshReaderFactory::instance().open(path);
+        FakeMaterials materials;
+        if (reader) b.status = buildTempShape(*reader, materials, options, b.shape, b.failure);
+    });
+    return b;
 }
 
 TEST(MeshBuilder, SkipsEmptyAndDegeneratedTriangles) {
@@ -47,11 +54,8 @@ TEST(MeshBuilder, SkipsEmptyAndDegeneratedTriangles) {
     uint32_t a2 = m.vertex({0, 0, 0});  // a second vertex at a's position: two equal corners
     m.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(1, 1, 0));
     m.group("a", {a, b, c, a, a2, b, a, b, nan, nan, b, c, c, b, a});
-    std::unique_ptr<Shape> shape;
-    std::string failure;
-    std::string out = captureMessages(
-        [&] { EXPECT_EQ(buildFromMesh(m.mesh, shape, failure), ShapeBuildStatus::kBuilt); });
-    ASSERT_TRUE(shape);
+    auto [status, shape, failure, out] = buildMesh(m.mesh);
+    ASSERT_EQ(status, ShapeBuildStatus::kBuilt);
     EXPECT_EQ(shape->triangleCount(), 2u);  // the first and the reversed last
     EXPECT_EQ(countOf(out, "[DEBUG]    Empty triangle found, skipping it"), 1u) << out;
     // The warning is printed once, then counted for the shape.
@@ -74,11 +78,8 @@ TEST(MeshBuilder, RepairsNormalsAndUvs) {
     uint32_t d = m.vertex({0, 0, 1}, {1, 0, 0}, {}, {}, {}, {{INFINITY, 0.5f}, {0.25f, 0.75f}});
     m.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(1, 1, 1));
     m.group("a", {shared, b, c, shared, c, d});
-    std::unique_ptr<Shape> shape;
-    std::string failure;
-    std::string out = captureMessages(
-        [&] { EXPECT_EQ(buildFromMesh(m.mesh, shape, failure), ShapeBuildStatus::kBuilt); });
-    ASSERT_TRUE(shape);
+    auto [status, shape, failure, out] = buildMesh(m.mesh);
+    ASSERT_EQ(status, ShapeBuildStatus::kBuilt);
     EXPECT_EQ(shape->triangleCount(), 2u);
     EXPECT_EQ(countOf(out, "[WARNING]  Degenerated normal found, setting it to the face normal"),
               1u);
@@ -103,12 +104,10 @@ TEST(MeshBuilder, WeldsByDistanceAndAttributes) {
         uint32_t b2 = m.vertex({1 + offset, 0, 0}, normal, {}, {}, color, {uv});
         uint32_t d = m.vertex({1, 1, 0}, {0, 0, 1}, {}, {}, {1, 1, 1, 1}, {{1, 1}});
         m.group("a", {a, b, c, b2, d, c});
-        std::unique_ptr<Shape> shape;
-        std::string failure;
         MeshBuildOptions o;
         o.mergeThreshold = threshold;
-        EXPECT_EQ(buildFromMesh(m.mesh, shape, failure, o), ShapeBuildStatus::kBuilt);
-        return shape ? shape->vertices().size() : 0u;
+        Built r = buildMesh(m.mesh, o);
+        return r.shape ? r.shape->vertices().size() : 0u;
     };
     const Color white(1, 1, 1, 1);
     const Vec3 up(0, 0, 1);
@@ -138,14 +137,12 @@ TEST(MeshBuilder, WeldIsDeterministicAcrossThreads) {
     };
     for (int y = 0; y < 30; ++y)
         for (int x = 0; x < 30; ++x) {
-            uint32_t a = m.vertex({x + jitter(), y + jitter(), 0}, {0, 0, 1}, {}, {}, {},
-                                  {{float(x), float(y)}});
-            uint32_t b = m.vertex({x + 1 + jitter(), y + jitter(), 0}, {0, 0, 1}, {}, {}, {},
-                                  {{float(x + 1), float(y)}});
-            uint32_t c = m.vertex({x + jitter(), y + 1 + jitter(), 0}, {0, 0, 1}, {}, {}, {},
-                                  {{float(x), float(y + 1)}});
-            uint32_t d = m.vertex({x + 1 + jitter(), y + 1 + jitter(), 0}, {0, 0, 1}, {}, {}, {},
-                                  {{float(x + 1), float(y + 1)}});
+            auto corner = [&](int u, int v) {
+                return m.vertex({u + jitter(), v + jitter(), 0}, {0, 0, 1}, {}, {}, {},
+                                {{float(u), float(v)}});
+            };
+            uint32_t a = corner(x, y), b = corner(x + 1, y), c = corner(x, y + 1),
+                     d = corner(x + 1, y + 1);
             idx.insert(idx.end(), {a, b, d, a, d, c});
         }
     m.group("a", idx);
@@ -181,10 +178,7 @@ TEST(MeshBuilder, ComputesTangentFrames) {
         m.group("a", {0, 1, 2});
         MeshBuildOptions o;
         o.tangentSpace = ts;
-        std::unique_ptr<Shape> shape;
-        std::string failure;
-        buildFromMesh(m.mesh, shape, failure, o);
-        return shape;
+        return buildMesh(m.mesh, o).shape;
     };
     auto s = build({{0, 0}, {1, 0}, {1, 1}}, {});
     ASSERT_TRUE(s);
@@ -250,32 +244,32 @@ TEST(TempShape, MaterialsIndicesAndEmptyMeshes) {
     MeshMaker m("s", 0);
     m.grid(2, 1, "a");
     m.group("nope", {0, 1, 4});
-    std::unique_ptr<Shape> shape;
-    std::string failure;
-    std::string out = captureMessages(
-        [&] { EXPECT_EQ(buildFromMesh(m.mesh, shape, failure), ShapeBuildStatus::kFailed); });
-    EXPECT_EQ(failure, "Material nope not defined when loading shape s");
-    EXPECT_NE(out.find("[ERROR]    Material nope not defined when loading shape s"),
+    Built r = buildMesh(m.mesh);
+    EXPECT_EQ(r.status, ShapeBuildStatus::kFailed);
+    EXPECT_EQ(r.failure, "Material nope not defined when loading shape s");
+    EXPECT_NE(r.out.find("[ERROR]    Material nope not defined when loading shape s"),
               std::string::npos);
-    EXPECT_FALSE(shape);
+    EXPECT_FALSE(r.shape);
 
     m.mesh.groups.back().name = "b";
     m.mesh.indices.back() = 6;  // one past the last vertex
-    EXPECT_EQ(buildFromMesh(m.mesh, shape, failure), ShapeBuildStatus::kFailed);
-    EXPECT_EQ(failure, "Triangle 4 of shape s refers to vertex 6, but the shape has 6 vertices");
+    r = buildMesh(m.mesh);
+    EXPECT_EQ(r.status, ShapeBuildStatus::kFailed);
+    EXPECT_EQ(r.failure, "Triangle 4 of shape s refers to vertex 6, but the shape has 6 vertices");
 
     m.mesh.indices.back() = 5;
-    EXPECT_EQ(buildFromMesh(m.mesh, shape, failure, {}, 1), ShapeBuildStatus::kBuilt);
-    ASSERT_TRUE(shape);
-    EXPECT_EQ(shape->triangleCount(), 5u);
-    EXPECT_EQ(shape->material(4), reinterpret_cast<const Material *>(0x200));
-    EXPECT_EQ(shape->material(0), reinterpret_cast<const Material *>(0x100));
+    r = buildMesh(m.mesh, {}, 1);
+    ASSERT_EQ(r.status, ShapeBuildStatus::kBuilt);
+    EXPECT_EQ(r.shape->triangleCount(), 5u);
+    EXPECT_EQ(r.shape->material(4), reinterpret_cast<const Material *>(0x200));
+    EXPECT_EQ(r.shape->material(0), reinterpret_cast<const Material *>(0x100));
 
     MeshMaker e("e", 1);
     e.mesh.groups.push_back({"nope", 0});
     e.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(0, 0, 0));
-    EXPECT_EQ(buildFromMesh(e.mesh, shape, failure), ShapeBuildStatus::kEmpty);
-    EXPECT_FALSE(shape);
+    r = buildMesh(e.mesh);
+    EXPECT_EQ(r.status, ShapeBuildStatus::kEmpty);
+    EXPECT_FALSE(r.shape);
 }
 
 TEST(TempShape, KeepsColoursPerVertex) {
@@ -284,19 +278,12 @@ TEST(TempShape, KeepsColoursPerVertex) {
     m.vertex({1, 0, 0}, {0, 0, 1}, {}, {}, Color(0, 1, 0, 1));
     m.vertex({0, 1, 0}, {0, 0, 1}, {}, {}, Color(0, 0, 1, 0.5f));
     m.group("a", {0, 1, 2});
-    std::unique_ptr<Shape> shape;
-    std::string failure;
-    ASSERT_EQ(buildFromMesh(m.mesh, shape, failure), ShapeBuildStatus::kBuilt);
-    ASSERT_TRUE(shape->vertices().hasColors());
-    EXPECT_EQ(shape->vertices().color(2), Color(0, 0, 1, 0.5f));
-    EXPECT_EQ(shape->vertices().uvSet(0)[1], Vec2(0, 0));  // no sets: the shared zero
+    Built r = buildMesh(m.mesh);
+    ASSERT_EQ(r.status, ShapeBuildStatus::kBuilt);
+    ASSERT_TRUE(r.shape->vertices().hasColors());
+    EXPECT_EQ(r.shape->vertices().color(2), Color(0, 0, 1, 0.5f));
+    EXPECT_EQ(r.shape->vertices().uvSet(0)[1], Vec2(0, 0));  // no sets: the shared zero
 }
-
-}  // namespace
-}  // namespace ox
-
-namespace ox {
-namespace {
 
 TEST(TempShape, EveryDamagedByteFailsOrRepairsCleanly) {
     // Each byte of a small valid file in turn set to 0xFF: the open fails, the build fails with

@@ -34,11 +34,10 @@ TEST(Scene, FirstNameWinsPerKind) {
         EXPECT_FALSE(
             scene.addCamera(std::make_unique<OrthoCamera>("c", Mtx4(), nullptr, Vec2(2, 2))));
     });
-    EXPECT_NE(out.find("[WARNING]  Duplicate shape name s, keeping the first one"),
-              std::string::npos);
-    EXPECT_NE(out.find("Duplicate instance name i"), std::string::npos);
-    EXPECT_NE(out.find("Duplicate light name l"), std::string::npos);
-    EXPECT_NE(out.find("Duplicate camera name c"), std::string::npos);
+    for (const char *want :
+         {"[WARNING]  Duplicate shape name s, keeping the first one", "Duplicate instance name i",
+          "Duplicate light name l", "Duplicate camera name c"})
+        EXPECT_NE(out.find(want), std::string::npos) << want;
     EXPECT_EQ(scene.shapes().size(), 1u);
     EXPECT_EQ(scene.findShape("s")->bounds().max, Vec3(1, 1, 1));
     EXPECT_EQ(scene.instances().size(), 1u);
@@ -48,8 +47,6 @@ TEST(Scene, FirstNameWinsPerKind) {
     EXPECT_EQ(scene.cameras().size(), 1u);
     EXPECT_EQ(scene.instanceBounds(), BBox(Vec3(0, 0, 0), Vec3(1, 1, 1)));
     EXPECT_TRUE(scene.instanceBounds(0x2).isEmpty());
-    scene.buildLightLinks();
-    EXPECT_TRUE(scene.lightReaches(0, 0));
 }
 
 TEST(Scene, ResolverMakesOneVariantPerUvLayout) {
@@ -70,7 +67,6 @@ TEST(Scene, ResolverMakesOneVariantPerUvLayout) {
     ASSERT_TRUE(a && c);
     EXPECT_EQ(a, b);  // the same layout shares one variant
     EXPECT_NE(a, c);
-    EXPECT_EQ(a->name(), "m|uv:1,-1,-1,-1,-1,-1,-1");
     EXPECT_EQ(a->photon()->name(), "m|uv:1,-1,-1,-1,-1,-1,-1_photon");
     EXPECT_EQ(resolver.resolve("plain", {"x"}), table.find("plain"));
     EXPECT_EQ(resolver.resolve("none", {}), nullptr);

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <string>
@@ -22,9 +23,7 @@ public:
         path_ = mkdtemp(templ.data()) ? templ : std::string();
     }
     ~TempDir() {
-        std::string cmd = "rm -rf '" + path_ + "'";
-        if (!path_.empty()) [[maybe_unused]]
-            int rc = std::system(cmd.c_str());
+        if (!path_.empty()) std::filesystem::remove_all(path_);
     }
     std::string file(const std::string &name) const { return path_ + "/" + name; }
     const std::string &path() const { return path_; }

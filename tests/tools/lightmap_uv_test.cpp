@@ -91,12 +91,8 @@ void checkLayout(const Mesh &m, const ox::LightmapOptions &o, const ox::Lightmap
     const size_t tris = m.triangles.size() / 3;
     ASSERT_EQ(l.cornerUVs.size(), tris * 3);
     ASSERT_EQ(l.chartOf.size(), tris);
-    for (const Vec2 &uv : l.cornerUVs) {
-        EXPECT_GE(uv.x, 0.0f);
-        EXPECT_LE(uv.x, 1.0f);
-        EXPECT_GE(uv.y, 0.0f);
-        EXPECT_LE(uv.y, 1.0f);
-    }
+    for (const Vec2 &uv : l.cornerUVs)
+        EXPECT_TRUE(uv.x >= 0 && uv.x <= 1 && uv.y >= 0 && uv.y <= 1) << uv.x << " " << uv.y;
     for (size_t a = 0; a < tris; ++a)
         for (size_t b = a + 1; b < tris; ++b)
             EXPECT_FALSE(overlap(&l.cornerUVs[3 * a], &l.cornerUVs[3 * b])) << a << " " << b;

@@ -1,9 +1,5 @@
 #include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <cstdio>
-#include <filesystem>
 #include <fstream>
 #include <string>
 
@@ -12,22 +8,15 @@
 
 namespace {
 
-namespace fs = std::filesystem;
-
 const std::string kInspect = std::string(OX_BINARY_DIR) + "/tools/thevorn-inspect";
 
 using oxtest::RunResult;
 
 RunResult runInspect(const std::string &args) { return oxtest::runProgram(kInspect, args); }
 
-class InspectTest : public ::testing::Test {
+class InspectTest : public oxtest::TempDirTest {
 protected:
-    void SetUp() override {
-        dir_ = fs::path(testing::TempDir()) / ("oxinspect" + std::to_string(getpid()));
-        fs::remove_all(dir_);
-        fs::create_directories(dir_);
-    }
-    void TearDown() override { fs::remove_all(dir_); }
+    InspectTest() : TempDirTest("oxinspect") {}
 
     // A quad from (-1, -1, z) to (1, 1, z) with one UV set and one material group.
     std::string quad(const std::string &shape, const std::string &material, float z = 0) {
@@ -51,8 +40,6 @@ protected:
         std::ofstream(path) << text;
         return path;
     }
-
-    fs::path dir_;
 };
 
 TEST_F(InspectTest, SummarisesALoadedScene) {
@@ -69,18 +56,13 @@ TEST_F(InspectTest, SummarisesALoadedScene) {
         file("c.xml", "<OXConfig><RenderSettings><bias>0</bias></RenderSettings></OXConfig>");
     RunResult r = runInspect(xml + " " + a + " " + b + " -x " + config);
     EXPECT_EQ(r.status, 0) << r.output;
-    EXPECT_NE(r.output.find("[PROGRESS] Successfully loaded ZPX-File"), std::string::npos);
-    EXPECT_NE(r.output.find("Shapes: 2\n  low: 2 triangles, 4 vertices, 1 UV sets (map1)\n"),
-              std::string::npos)
-        << r.output;
-    EXPECT_NE(r.output.find("  i2: shape high, flags 0x4EDFE\n"), std::string::npos);
-    EXPECT_NE(r.output.find("Materials: 1\n  m\n"), std::string::npos);
-    EXPECT_NE(r.output.find("Cameras: 1\n  camera1: perspective at (0, 2, 10)\n"),
-              std::string::npos);
-    EXPECT_NE(r.output.find("Lights: 1\n  sun: SimpleDirectionalLight\n"), std::string::npos);
-    EXPECT_NE(r.output.find("Light links: 2 instances x 1 lights (16 bytes)"), std::string::npos);
-    EXPECT_NE(r.output.find("Scene box: (-1, -1, -1) - (1, 1, 1)"), std::string::npos);
-    EXPECT_NE(r.output.find("Bias: 3.4641e-05"), std::string::npos) << r.output;
+    for (const char *want : {"Shapes: 2\n  low: 2 triangles, 4 vertices, 1 UV sets (map1)\n",
+                             "  i2: shape high, flags 0x4EDFE\n", "Materials: 1\n  m\n",
+                             "Cameras: 1\n  camera1: perspective at (0, 2, 10)\n",
+                             "Lights: 1\n  sun: SimpleDirectionalLight\n",
+                             "Light links: 2 instances x 1 lights (16 bytes)",
+                             "Scene box: (-1, -1, -1) - (1, 1, 1)", "Bias: 3.4641e-05"})
+        EXPECT_NE(r.output.find(want), std::string::npos) << want << "\n" << r.output;
 }
 
 TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
@@ -91,8 +73,6 @@ TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
     // A shape that no mesh file gives.
     RunResult r = runInspect(xml);
     EXPECT_EQ(r.status, 1);
-    EXPECT_NE(r.output.find("[ERROR]    Instance refering to non existing shape ghost"),
-              std::string::npos);
     EXPECT_NE(r.output.find("Unable to load the scene: Missing shapes"), std::string::npos);
     EXPECT_EQ(r.output.find("Shapes:"), std::string::npos);
     // A material that the scene does not define.
