@@ -31,10 +31,7 @@ struct SceneFiles {
               std::vector<std::string> uvSets = {"map1"}) {
         MeshMaker m(shape, uint32_t(uvSets.size()));
         m.mesh.uvSetNames = uvSets;
-        m.vertex({-1, -1, 0});
-        m.vertex({1, -1, 0});
-        m.vertex({1, 1, 0});
-        m.vertex({-1, 1, 0});
+        for (Vec3 p : {Vec3(-1, -1, 0), Vec3(1, -1, 0), Vec3(1, 1, 0), Vec3(-1, 1, 0)}) m.vertex(p);
         m.group(material, {0, 1, 2, 0, 2, 3});
         mesh(file, m.mesh);
     }
@@ -121,7 +118,6 @@ TEST(ZPXLoader, LoadsAWholeScene) {
     EXPECT_EQ(scene.instances()[2]->material(0)->name(), "blue");
     EXPECT_FALSE(scene.instances()[2]->hasFlag(0x2));
     ASSERT_NE(scene.instances()[0]->vertexBakeSamplingOptions(), nullptr);
-    EXPECT_EQ(scene.materials().find("red")->photon()->name(), "red_photon");
 
     // Lights: sun, sky (an environment light that casts shadows), lamp, globalAmbientLight.
     ASSERT_EQ(scene.lights().size(), 4u);
@@ -267,8 +263,11 @@ TEST(ZPXLoader, ShapesEdgeCases) {
     MeshMaker empty("nothing", 0);
     empty.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(0, 0, 0));
     f.mesh("e.vtm", empty.mesh);
-    for (int i = 0; i < 6; ++i)
-        f.quad("v" + std::to_string(i) + ".vtm", "v" + std::to_string(i), "uvm", {"x", "lightmap"});
+    // Six shapes with one UV layout, a seventh with another.
+    for (int i = 0; i < 7; ++i)
+        f.quad("v" + std::to_string(i) + ".vtm", "v" + std::to_string(i), "uvm",
+               i < 6 ? std::vector<std::string>{"x", "lightmap"}
+                     : std::vector<std::string>{"lightmap"});
     f.xml("s.xml", material("m") +
                        material("uvm",
                                 "<Diffuse><UVLayerOverride>lightmap</UVLayerOverride>"
@@ -281,16 +280,20 @@ TEST(ZPXLoader, ShapesEdgeCases) {
     EXPECT_NE(r.out.find("Empty mesh '" + f.dir.file("e.vtm") + "' added."), std::string::npos);
     EXPECT_EQ(scene.findShape("s")->vertices().uvSetCount(), 2u);
     EXPECT_EQ(scene.findShape("nothing"), nullptr);
-    // The second "m" record does not replace the first.
-    auto *phong = dynamic_cast<const PhongShader *>(&scene.materials().find("m")->surface());
+    // The second "m" record does not replace the first; without UV overrides it is used as is.
+    const Material *m = scene.materials().find("m");
+    auto *phong = dynamic_cast<const PhongShader *>(&m->surface());
     ASSERT_TRUE(phong);
     EXPECT_EQ(phong->parameters().shininess, 1.0f);
-    // Six shapes built in parallel share one variant of "uvm".
+    EXPECT_EQ(scene.findShape("s")->material(0), m);
+    // Shapes built in parallel share one variant of "uvm" per UV layout.
     const Material *variant = scene.findShape("v0")->material(0);
     EXPECT_EQ(variant->name(), "uvm|uv:1,-1,-1,-1,-1,-1,-1");
+    EXPECT_EQ(variant->photon()->name(), "uvm|uv:1,-1,-1,-1,-1,-1,-1_photon");
     for (int i = 1; i < 6; ++i)
         EXPECT_EQ(scene.findShape("v" + std::to_string(i))->material(0), variant);
-    EXPECT_EQ(scene.materials().size(), 3u);
+    EXPECT_EQ(scene.findShape("v6")->material(0)->name(), "uvm|uv:0,-1,-1,-1,-1,-1,-1");
+    EXPECT_EQ(scene.materials().size(), 4u);
 }
 
 }  // namespace

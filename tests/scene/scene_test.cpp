@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include "scene/material_converter.h"
 #include "scene_test_util.h"
 
 namespace ox {
@@ -47,30 +46,6 @@ TEST(Scene, FirstNameWinsPerKind) {
     EXPECT_EQ(scene.cameras().size(), 1u);
     EXPECT_EQ(scene.instanceBounds(), BBox(Vec3(0, 0, 0), Vec3(1, 1, 1)));
     EXPECT_TRUE(scene.instanceBounds(0x2).isEmpty());
-}
-
-TEST(Scene, ResolverMakesOneVariantPerUvLayout) {
-    MaterialTable table;
-    XMLMaterialCompact record;
-    record.name = "m";
-    record.channels[0].uvLayerOverride = "lightmap";
-    record.channels[0].fileTexture = "t.tga";
-    ZPXMaterialConverter converter(BBox{});
-    table.insert(converter.convert(record));
-    record.name = "plain";
-    record.channels[0].uvLayerOverride.clear();
-    table.insert(converter.convert(record));
-    SceneMaterialResolver resolver(table);
-    const Material *a = resolver.resolve("m", {"map1", "lightmap"});
-    const Material *b = resolver.resolve("m", {"uv", "lightmap"});
-    const Material *c = resolver.resolve("m", {"lightmap"});
-    ASSERT_TRUE(a && c);
-    EXPECT_EQ(a, b);  // the same layout shares one variant
-    EXPECT_NE(a, c);
-    EXPECT_EQ(a->photon()->name(), "m|uv:1,-1,-1,-1,-1,-1,-1_photon");
-    EXPECT_EQ(resolver.resolve("plain", {"x"}), table.find("plain"));
-    EXPECT_EQ(resolver.resolve("none", {}), nullptr);
-    EXPECT_EQ(table.size(), 4u);
 }
 
 }  // namespace

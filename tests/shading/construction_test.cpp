@@ -65,7 +65,6 @@ TEST(Lights, ConstructionByType) {
     auto &pl = static_cast<SimplePointLight &>(*point);
     EXPECT_EQ(pl.position(), Vec3(1, 2, 3));
     EXPECT_EQ(pl.bounds(), BBox(Vec3(-9, -8, -7), Vec3(11, 12, 13)));
-    EXPECT_FLOAT_EQ(pl.cutoffSquared(), 100.0f);
     EXPECT_TRUE(dynamic_cast<const ClampedStandardAttenuation *>(pl.attenuation()));
     EXPECT_EQ(pl.shadowSampler().samples, 256u);
     EXPECT_EQ(pl.flags(), kLightDiffuse | kLightSpecular | kLightShadows);

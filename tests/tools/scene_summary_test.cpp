@@ -66,41 +66,31 @@ TEST_F(InspectTest, SummarisesALoadedScene) {
 }
 
 TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
-    std::string mesh = quad("s", "nope");
+    // A shape that no mesh file gives, a damaged mesh file, a configuration that cannot be
+    // loaded, syntax errors: one message each, the run's status, and no summary.
     std::string xml = file("s.xml",
                            "<OXScene><Instance><Name>i</Name><Shape>ghost</Shape>"
                            "</Instance></OXScene>");
-    // A shape that no mesh file gives.
-    RunResult r = runInspect(xml);
-    EXPECT_EQ(r.status, 1);
-    EXPECT_NE(r.output.find("Unable to load the scene: Missing shapes"), std::string::npos);
-    EXPECT_EQ(r.output.find("Shapes:"), std::string::npos);
-    // A material that the scene does not define.
-    r = runInspect(mesh);
-    EXPECT_EQ(r.status, 1);
-    EXPECT_NE(r.output.find("Error creating temp shapes: Material nope not defined when loading "
-                            "shape s"),
-              std::string::npos)
-        << r.output;
-    // A damaged mesh file.
     std::string bad = file("bad.vtm", std::string("VTM\0\3\0\0\0", 8));
-    r = runInspect(bad);
-    EXPECT_EQ(r.status, 1);
-    EXPECT_NE(r.output.find("[ERROR]    Failed to preopen file " + bad), std::string::npos);
-    EXPECT_NE(r.output.find("unsupported temporary mesh version 3"), std::string::npos);
-    // A scene document with another root.
-    r = runInspect(file("x.xml", "<Scene/>"));
-    EXPECT_EQ(r.status, 1);
-    // A configuration that cannot be loaded.
-    r = runInspect(xml + " -x " + (dir_ / "missing.xml").string());
-    EXPECT_EQ(r.status, 3);
-    EXPECT_NE(r.output.find("Unable to load settings from file"), std::string::npos);
-    // Syntax errors.
-    r = runInspect("");
-    EXPECT_EQ(r.status, 2);
-    EXPECT_NE(r.output.find("Usage: thevorn-inspect"), std::string::npos);
-    EXPECT_EQ(runInspect(xml + " -q").status, 2);
-    EXPECT_EQ(runInspect(xml + " -x").status, 2);
+    const struct {
+        std::string args;
+        int status;
+        std::string text;
+    } cases[] = {
+        {xml, 1, "Unable to load the scene: Missing shapes"},
+        {bad, 1, "[ERROR]    Failed to preopen file " + bad},
+        {bad, 1, "unsupported temporary mesh version 3"},
+        {xml + " -x " + (dir_ / "missing.xml").string(), 3, "Unable to load settings from file"},
+        {"", 2, "Usage: thevorn-inspect"},
+        {xml + " -q", 2, "Usage: thevorn-inspect"},
+        {xml + " -x", 2, "Usage: thevorn-inspect"},
+    };
+    for (const auto &c : cases) {
+        RunResult r = runInspect(c.args);
+        EXPECT_EQ(r.status, c.status) << c.args;
+        EXPECT_NE(r.output.find(c.text), std::string::npos) << c.text << "\n" << r.output;
+        EXPECT_EQ(r.output.find("Shapes:"), std::string::npos);
+    }
 }
 
 }  // namespace
