@@ -276,7 +276,8 @@ TEST(ZPXLoader, ShapesEdgeCases) {
     Scene scene;
     LoadResult r = load(f.inputs, scene);
     ASSERT_TRUE(r.ok) << r.error << r.out;
-    EXPECT_NE(r.out.find("Duplicate shape name s"), std::string::npos);
+    EXPECT_NE(r.out.find("[WARNING]  Duplicate shape name s, keeping the first one"),
+              std::string::npos);
     EXPECT_NE(r.out.find("Empty mesh '" + f.dir.file("e.vtm") + "' added."), std::string::npos);
     EXPECT_EQ(scene.findShape("s")->vertices().uvSetCount(), 2u);
     EXPECT_EQ(scene.findShape("nothing"), nullptr);

@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <assimp/Importer.hpp>
-#include <bit>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -53,20 +52,6 @@ class ImportTest : public oxtest::TempDirTest {
 protected:
     ImportTest() : TempDirTest("thevorn_import_") {}
     std::string path(const std::string &name) const { return (dir_ / name).string(); }
-};
-
-// Little-endian byte image of a mesh file, built field by field as the format lays it out.
-struct Bytes {
-    std::string s;
-    Bytes &str(const std::string &v) { return s += v, s.push_back('\0'), *this; }
-    Bytes &u32(uint32_t v) {
-        for (int i = 0; i < 4; ++i) s.push_back(char((v >> (8 * i)) & 0xff));
-        return *this;
-    }
-    Bytes &f32s(std::initializer_list<float> vs) {
-        for (float v : vs) u32(std::bit_cast<uint32_t>(v));
-        return *this;
-    }
 };
 
 // The same little glTF scene in every test that needs two UV sets: one quad with normals, two
@@ -125,23 +110,32 @@ bool loadImported(const std::string &out, std::vector<std::string> inputs, ox::S
 
 }  // namespace
 
-// One triangle with a UV set and a normal: the mesh file is checked byte for byte.
-TEST_F(ImportTest, WritesTheMeshFileByteForByte) {
+// One triangle with a UV set and a normal: every value of the mesh file, and the scene file
+// byte for byte.
+TEST_F(ImportTest, WritesTheMeshAndSceneFiles) {
     writeText(path("tri.obj"),
               "o tri\nv 0 0 0\nv 2 0 0\nv 0 1 0\nvt 0 0\nvt 1 0\nvt 0 1\nvn 0 0 1\n"
               "f 1/1/1 2/2/1 3/3/1\n");
     RunResult r = runImport(path("tri.obj") + " -o " + path("out"));
     ASSERT_EQ(r.status, 0) << r.output;
 
-    Bytes b;
-    b.str("VTM").u32(1).str("tri").u32(3).u32(1).str("uv0").u32(1).str("DefaultMaterial").u32(1);
-    b.f32s({0, 0, 0, 2, 1, 0});
-    // position, normal, tangent (along u), bitangent (along v), then the UV pair.
-    b.f32s({0, 0, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0, 0, 0});
-    b.f32s({2, 0, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0, 1, 0});
-    b.f32s({0, 1, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0, 0, 1});
-    b.u32(0).u32(1).u32(2);
-    EXPECT_EQ(readBytes(path("out/tri.vtm")), b.s);
+    // The mesh file's layout has its own tests; here its content. Without colours the file is
+    // of version 1.
+    auto reader = vtm::TempMeshReaderFactory::instance().open(path("out/tri.vtm"));
+    ASSERT_TRUE(reader);
+    EXPECT_EQ(reader->version(), 1u);
+    vtm::TempMesh m;
+    ASSERT_TRUE(vtm::readTempMesh(path("out/tri.vtm"), m));
+    EXPECT_EQ(m.name, "tri");
+    EXPECT_EQ(m.uvSetNames, std::vector<std::string>{"uv0"});
+    EXPECT_EQ(m.groups, (std::vector<vtm::MaterialGroup>{{"DefaultMaterial", 1}}));
+    EXPECT_EQ(m.bounds, ox::BBox(ox::Vec3(0, 0, 0), ox::Vec3(2, 1, 0)));
+    // Position, normal, tangent (along u) and bitangent (along v) per vertex.
+    EXPECT_EQ(m.vertices, (std::vector<float>{0, 0, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0,  //
+                                              2, 0, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0,  //
+                                              0, 1, 0, 0, 0, 1, 1, 0, 0, 0, 1, 0}));
+    EXPECT_EQ(m.uvs, (std::vector<float>{0, 0, 1, 0, 0, 1}));
+    EXPECT_EQ(m.indices, (std::vector<uint32_t>{0, 1, 2}));
 
     // The scene file, as the settings writer lays out the scene objects: the default material
     // of the reader (grey diffuse) and one instance placing the shape with the identity.
