@@ -2,29 +2,21 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdio>
-#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <thread>
 #include <vector>
 
+#include "tests/support/test_support.h"
+
 namespace {
 
-class MessageTest : public ::testing::Test {
+class MessageTest : public oxtest::TempDirTest {
 protected:
-    void SetUp() override { ox::resetMessageFilters(); }
-    void TearDown() override { ox::resetMessageFilters(); }
+    MessageTest() : TempDirTest("ox_message_test_") {}
 };
 
-std::string readAll(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
-TEST_F(MessageTest, DefaultFiltersPrefixesAndUnknownTypes) {
+TEST_F(MessageTest, FiltersPrefixesUnknownTypesAndLevelsOutsideTheRange) {
     testing::internal::CaptureStdout();
     ox::message(ox::kMsgDebug, 6, "hidden %d", 1);
     ox::message(ox::kMsgVerbose, 6, "hidden too");
@@ -34,25 +26,16 @@ TEST_F(MessageTest, DefaultFiltersPrefixesAndUnknownTypes) {
     ox::setTypeEnabled(ox::kMsgDebug, true);
     ox::message(ox::kMsgDebug, 6, "shown %s", "now");
     ox::message(3, 6, "three");  // any enabled bit shows it, with the unknown prefix
-    const std::string out = testing::internal::GetCapturedStdout();
-    EXPECT_EQ(out,
-              "[INFO]     info 2\n"
-              "[BENCH]    bench\n"
-              "[DEBUG]    shown now\n"
-              "[UNKNOWN]  three\n");
-    for (uint32_t t : {1u, 2u, 4u, 8u, 16u, 32u, 64u, 3u, 128u})
-        EXPECT_EQ(std::string(ox::messagePrefix(t)).size(), 11u);
-}
-
-TEST_F(MessageTest, LevelsOutsideTheRangeAreSafe) {
-    testing::internal::CaptureStdout();
     ox::message(ox::kMsgError, -1, "low");
     ox::message(ox::kMsgError, 8, "high");
     ox::message(ox::kMsgError, 1 << 30, "huge");
     ox::setTypeEnabled(ox::kMsgError, false);
     ox::message(ox::kMsgError, 99, "off");
     EXPECT_EQ(testing::internal::GetCapturedStdout(),
+              "[INFO]     info 2\n[BENCH]    bench\n[DEBUG]    shown now\n[UNKNOWN]  three\n"
               "[ERROR]    low\n[ERROR]    high\n[ERROR]    huge\n");
+    for (uint32_t t : {1u, 2u, 4u, 8u, 16u, 32u, 64u, 3u, 128u})
+        EXPECT_EQ(std::string(ox::messagePrefix(t)).size(), 11u);
 }
 
 TEST_F(MessageTest, LongMessagesAreCutAndComposedTextIsNeverAFormat) {
@@ -61,42 +44,36 @@ TEST_F(MessageTest, LongMessagesAreCutAndComposedTextIsNeverAFormat) {
     ox::message(ox::kMsgInfo, 6, "%s", longText.c_str());
     ox::messageText(ox::kMsgInfo, 6, "100%s %n %d");
     const std::string out = testing::internal::GetCapturedStdout();
-    const std::string first = out.substr(0, out.find('\n'));
-    EXPECT_EQ(first.size(), 11 + ox::kMessageBufferSize - 1);
+    EXPECT_EQ(out.find('\n'), 11 + ox::kMessageBufferSize - 1);
     EXPECT_NE(out.find("[INFO]     100%s %n %d\n"), std::string::npos);
 }
 
 TEST_F(MessageTest, DebugFileGetsBannerAndEveryShownMessage) {
-    const auto dir = std::filesystem::temp_directory_path() / "ox_message_test";
-    std::filesystem::remove_all(dir);
-    std::filesystem::create_directories(dir);
-    const std::string file = (dir / "debug.out").string();
-    {
-        std::ofstream old(file);
-        old << "kept\n";
-    }
+    const std::string file = (dir_ / "debug.out").string();
+    std::ofstream(file) << "kept\n";
     ox::OutputVerbosityFlags flags;
     flags.debugFile = true;
     flags.infoPrint = false;
     flags.benchmarkPrint = true;
     testing::internal::CaptureStdout();
-    EXPECT_TRUE(ox::applyOutputVerbosity(flags, dir.string() + "/"));
+    EXPECT_TRUE(ox::applyOutputVerbosity(flags, dir_.string() + "/"));
     ox::message(ox::kMsgInfo, 6, "not shown");
     ox::message(ox::kMsgBench, 6, "shown %d", 7);
     testing::internal::GetCapturedStdout();
     EXPECT_EQ(ox::debugFile(), file);
-    EXPECT_EQ(readAll(file),
+    std::stringstream text;
+    text << std::ifstream(file).rdbuf();
+    EXPECT_EQ(text.str(),
               "kept\n +++++++++++++++ KESTRIN RENDERER DEBUG MESSAGES +++++++++++ \n"
               "[BENCH]    shown 7\n");
 
     // A debug file that cannot be opened is a warning and is forgotten.
     flags.infoPrint = true;
     testing::internal::CaptureStdout();
-    EXPECT_FALSE(ox::applyOutputVerbosity(flags, (dir / "missing" / "").string()));
+    EXPECT_FALSE(ox::applyOutputVerbosity(flags, (dir_ / "missing" / "").string()));
     const std::string out = testing::internal::GetCapturedStdout();
     EXPECT_NE(out.find("[WARNING]  Unable to open the debug file"), std::string::npos);
     EXPECT_EQ(ox::debugFile(), "");
-    std::filesystem::remove_all(dir);
 }
 
 TEST_F(MessageTest, LinesFromManyThreadsNeverInterleave) {
@@ -110,13 +87,10 @@ TEST_F(MessageTest, LinesFromManyThreadsNeverInterleave) {
         });
     for (auto &th : threads) th.join();
     std::istringstream in(testing::internal::GetCapturedStdout());
-    std::string line;
     int count = 0;
-    while (std::getline(in, line)) {
-        ++count;
+    for (std::string line; std::getline(in, line); ++count) {
         ASSERT_EQ(line.rfind("[INFO]     thread ", 0), 0u) << line;
-        const char c = line.back();
-        EXPECT_EQ(line.substr(line.size() - 200), std::string(200, c));
+        EXPECT_EQ(line.substr(line.size() - 200), std::string(200, line.back()));
     }
     EXPECT_EQ(count, 800);
 }

@@ -18,12 +18,9 @@ TEST(Timer, FormatFields) {
     EXPECT_EQ(ox::Timer::formatSeconds(59.999), "00:00:59.99");
     EXPECT_EQ(ox::Timer::formatSeconds(360000.0), "100:00:00.00");
     EXPECT_EQ(ox::Timer::formatSeconds(-3.0), "00:00:00.00");
-    std::string out;
-    ox::Timer().format(out);
-    EXPECT_EQ(out, "00:00:00.00");
 }
 
-TEST(Timer, NestingCountsAndUnmatchedStops) {
+TEST(Timer, NestingCountsUnmatchedStopsAndOverhead) {
     ox::resetMessageFilters();
     ox::Timer t;
     t.start();
@@ -54,30 +51,21 @@ TEST(Timer, NestingCountsAndUnmatchedStops) {
     running.start(true);  // reset forgets the added time
     EXPECT_EQ(running.ticks(), 0);
     EXPECT_EQ(running.startCount(), 1);
-}
 
-TEST(Timer, OverheadCorrectionNeverGoesNegative) {
-    EXPECT_GE(ox::Timer::overhead(), 0);
-    EXPECT_GT(ox::Timer::frequency(), 0);
-    ox::Timer t;
+    // Empty intervals minus the measured call overhead never add up to a negative time.
+    ox::Timer empty;
     for (int i = 0; i < 10000; ++i) {
-        t.start();
-        t.stop();
+        empty.start();
+        empty.stop();
     }
-    EXPECT_GE(t.ticks(), 0);
-    EXPECT_EQ(t.startCount(), 10000);
+    EXPECT_GE(empty.ticks(), 0);
 }
 
 TEST(Benchmarks, PerThreadTimersAreSummedInTheReport) {
     ox::resetMessageFilters();
     ox::setTypeEnabled(ox::kMsgBench, true);
     auto &registry = ox::BenchmarkRegistry::instance();
-    EXPECT_EQ(registry.find("loadInputsWhileMergingBench"), ox::kLoadInputsWhileMergingBench);
-    EXPECT_EQ(registry.find("mergePointBench"), ox::kMergePointBench);
-    EXPECT_EQ(registry.find("flushingOutputsBench"), ox::kFlushingOutputsBench);
-    EXPECT_EQ(registry.registerBenchmark("mergePointBench"), ox::kMergePointBench);
-    const int mine = registry.registerBenchmark("testBench");
-    EXPECT_GE(mine, 3);
+    EXPECT_EQ(registry.registerBenchmark("mergePointBench"), ox::kMergePointBench);  // no twin
     registry.clearTimers();
 
     std::thread a([&] {
@@ -94,11 +82,9 @@ TEST(Benchmarks, PerThreadTimersAreSummedInTheReport) {
     registry.report();
     const std::string out = testing::internal::GetCapturedStdout();
     EXPECT_EQ(out.find("Benchmark for loadInputsWhileMergingBench"), std::string::npos);
-    EXPECT_NE(out.find("[BENCH]    Benchmark for mergePointBench:\n[BENCH]     : 00:00:00."),
-              std::string::npos)
-        << out;
-    EXPECT_NE(out.find("(1)\n[BENCH]     : 00:00:00."), std::string::npos) << out;
-    EXPECT_NE(out.find("[BENCH]     Total:    00:00:00."), std::string::npos) << out;
+    for (const char *part : {"[BENCH]    Benchmark for mergePointBench:\n[BENCH]     : 00:00:00.",
+                             "(1)\n[BENCH]     : 00:00:00.", "[BENCH]     Total:    00:00:00."})
+        EXPECT_NE(out.find(part), std::string::npos) << part << "\n" << out;
     registry.clearTimers();
     ox::resetMessageFilters();
 }
@@ -107,7 +93,6 @@ TEST(RunStatistics, TreeCountersAndPrint) {
     ox::resetMessageFilters();
     ox::setTypeEnabled(ox::kMsgBench, true);
     ox::RunStatistics stats;
-    EXPECT_EQ(stats.root().name, "Vorn");
     stats.beginPass("beauty");
     stats.beginTarget("wall%s");
     stats.count("rays", 5000000000ull);  // beyond 32 bits

@@ -12,21 +12,15 @@
 
 #include "core/message.h"
 #include "platform/system.h"
+#include "tests/support/test_support.h"
 
 namespace fs = std::filesystem;
 
 namespace {
 
-class FileSystemTest : public ::testing::Test {
+class FileSystemTest : public oxtest::TempDirTest {
 protected:
-    void SetUp() override {
-        dir_ = fs::temp_directory_path() /
-               ("ox_fs_test_" + std::to_string(::getpid()) + "_" +
-                ::testing::UnitTest::GetInstance()->current_test_info()->name());
-        fs::remove_all(dir_);
-        fs::create_directories(dir_);
-    }
-    void TearDown() override { fs::remove_all(dir_); }
+    FileSystemTest() : TempDirTest("ox_fs_test_") {}
     std::string path(const std::string &name) const { return (dir_ / name).string(); }
     std::vector<std::string> entries() const {
         std::vector<std::string> out;
@@ -34,12 +28,10 @@ protected:
         return out;
     }
     static std::string read(const std::string &p) {
-        std::ifstream in(p, std::ios::binary);
         std::stringstream s;
-        s << in.rdbuf();
+        s << std::ifstream(p, std::ios::binary).rdbuf();
         return s.str();
     }
-    fs::path dir_;
 };
 
 using ox::FileSystemUtilities;
@@ -56,7 +48,7 @@ TEST_F(FileSystemTest, CreatesEveryMissingLevel) {
     EXPECT_FALSE(FileSystemUtilities::createDirectories(""));
 }
 
-TEST_F(FileSystemTest, CanReadOnlyReadableFiles) {
+TEST_F(FileSystemTest, ReadsOnlyReadableFilesAndOpensInEveryMode) {
     std::ofstream(path("there")) << "x";
     EXPECT_TRUE(FileSystemUtilities::canRead(path("there")));
     EXPECT_FALSE(FileSystemUtilities::canRead(path("missing")));
@@ -72,9 +64,7 @@ TEST_F(FileSystemTest, CanReadOnlyReadableFiles) {
     EXPECT_FALSE(FileSystemUtilities::readFile(path("big"), text, 99));
     EXPECT_EQ(FileSystemUtilities::lastError(), EFBIG);
     EXPECT_TRUE(text.empty());
-}
 
-TEST_F(FileSystemTest, OpenModes) {
     {
         auto f = FileSystemUtilities::open(path("log"), ox::FileAccess::kWrite, false);
         ASSERT_TRUE(f);

@@ -5,51 +5,43 @@
 
 #include <algorithm>
 #include <cstdlib>
-#include <cstring>
 #include <filesystem>
+#include <optional>
 #include <string>
 #include <vector>
+
+#include "tests/support/test_support.h"
 
 namespace fs = std::filesystem;
 
 namespace {
 
-/// Points TMPDIR at a fresh directory for one test and removes it afterwards.
-class TempDirScope {
-public:
-    TempDirScope() {
-        dir_ = fs::temp_directory_path() / ("oxmmf_test_" + std::to_string(getpid()));
-        fs::create_directories(dir_);
-        const char *old = std::getenv("TMPDIR");
-        if (old) old_ = old, hadOld_ = true;
+/// Each test runs with TMPDIR at its fresh directory; the old value comes back afterwards.
+class MemoryMappedFileTest : public oxtest::TempDirTest {
+protected:
+    MemoryMappedFileTest() : TempDirTest("oxmmf_test_") {}
+    void SetUp() override {
+        TempDirTest::SetUp();
+        if (const char *old = std::getenv("TMPDIR")) oldTmp_ = old;
         setenv("TMPDIR", dir_.c_str(), 1);
     }
-    ~TempDirScope() {
-        if (hadOld_)
-            setenv("TMPDIR", old_.c_str(), 1);
-        else
-            unsetenv("TMPDIR");
-        std::error_code ec;
-        fs::remove_all(dir_, ec);
+    void TearDown() override {
+        oldTmp_ ? setenv("TMPDIR", oldTmp_->c_str(), 1) : unsetenv("TMPDIR");
+        TempDirTest::TearDown();
     }
-    const fs::path &dir() const { return dir_; }
     /// Files in the directory whose name starts with "OXR".
     int spillFiles() const {
         int n = 0;
         for (auto &e : fs::directory_iterator(dir_))
-            if (e.path().filename().string().rfind("OXR", 0) == 0) ++n;
+            n += e.path().filename().string().rfind("OXR", 0) == 0;
         return n;
     }
-
-private:
-    fs::path dir_;
-    std::string old_;
-    bool hadOld_ = false;
+    std::optional<std::string> oldTmp_;
 };
 
 uint64_t pattern(uint64_t i) { return i * 0x9E3779B97F4A7C15ull ^ (i >> 7); }
 
-TEST(MemoryMappedFileTest, SmallBlockLivesInMemory) {
+TEST_F(MemoryMappedFileTest, SmallBlockLivesInMemory) {
     ox::MemoryMappedFile block(4096);
     ASSERT_TRUE(block.ok());
     EXPECT_FALSE(block.isFileBacked());
@@ -66,8 +58,7 @@ TEST(MemoryMappedFileTest, SmallBlockLivesInMemory) {
     EXPECT_TRUE(empty.ok());
 }
 
-TEST(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
-    TempDirScope temp;
+TEST_F(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
     const uint64_t size = 300ull << 20;
     {
         testing::internal::CaptureStdout();
@@ -77,7 +68,7 @@ TEST(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
         EXPECT_TRUE(block.isFileBacked());
         EXPECT_NE(out.find("Mapping memory to file"), std::string::npos);
         // The name is gone from the directory while the block is alive.
-        EXPECT_EQ(temp.spillFiles(), 0);
+        EXPECT_EQ(spillFiles(), 0);
         // Written in 1 MiB pieces, one range crossing every piece boundary.
         std::vector<uint64_t> chunk((1 << 20) / 8);
         for (uint64_t off = 0; off < size; off += 1 << 20) {
@@ -95,20 +86,14 @@ TEST(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
         for (uint64_t i = 0; i < size / 8; i += 4099) ASSERT_EQ(all[i], pattern(i)) << i;
         EXPECT_EQ(all[size / 8 - 1], pattern(size / 8 - 1));
     }
-    EXPECT_EQ(temp.spillFiles(), 0);
+    EXPECT_EQ(spillFiles(), 0);
 }
 
-TEST(MemoryMappedFileTest, SpillFailureReportsAndIsNotOk) {
-    const char *old = std::getenv("TMPDIR");
-    std::string saved = old ? old : "";
+TEST_F(MemoryMappedFileTest, SpillFailureReportsAndIsNotOk) {
     setenv("TMPDIR", "/nonexistent/ox-no-such-dir", 1);
     testing::internal::CaptureStdout();
     ox::MemoryMappedFile block(2 << 20, 1 << 20);
     std::string out = testing::internal::GetCapturedStdout();
-    if (old)
-        setenv("TMPDIR", saved.c_str(), 1);
-    else
-        unsetenv("TMPDIR");
     EXPECT_FALSE(block.ok());
     EXPECT_NE(out.find("[ERROR]    Cannot create temporary file"), std::string::npos) << out;
     // The info line of the spill and exactly one error line.

@@ -14,10 +14,7 @@ class FakeIO : public ox::RenderIOInterface {
 public:
     bool isAborted() const override { return aborted.load(); }
     bool isReleased() override { return false; }
-    void setProgressTitle(const std::string &title) override {
-        std::lock_guard<std::mutex> lock(mutex);
-        events.push_back("title " + title);
-    }
+    void setProgressTitle(const std::string &title) override { record("title " + title); }
     void beginCommand() override { record("begin"); }
     void endCommand() override { record("end"); }
     void finish() override { record("finish"); }
@@ -31,7 +28,7 @@ public:
     void clearRelease() override {}
     void refreshDisplay() override {}
 
-    void record(const char *e) {
+    void record(const std::string &e) {
         std::lock_guard<std::mutex> lock(mutex);
         events.push_back(e);
     }
