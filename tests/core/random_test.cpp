@@ -49,14 +49,8 @@ TEST(RandomTest, EverySeedGivesAWorkingGenerator) {
     EXPECT_EQ(firstDraws(2147483647ull), firstDraws(1));  // 2^31 - 1 reduces to 0, then 1
     EXPECT_EQ(firstDraws(2147483648ull), firstDraws(1));  // 2^31 reduces to 1
     EXPECT_EQ(firstDraws(2147483647ull + 5), firstDraws(5));
-    for (uint64_t seed : {uint64_t(0), uint64_t(2147483647), uint64_t(UINT32_MAX), UINT64_MAX}) {
-        ox::Random r(seed);
-        std::vector<float> draws(1000);
-        for (float &x : draws) x = r.next();
-        const auto [lo, hi] = std::minmax_element(draws.begin(), draws.end());
-        EXPECT_TRUE(*lo >= 0.0f && *lo < 0.01f) << seed << " " << *lo;
-        EXPECT_TRUE(*hi <= 1.0f && *hi > 0.99f) << seed << " " << *hi;
-    }
+    EXPECT_EQ(firstDraws(UINT32_MAX), firstDraws(1));
+    EXPECT_EQ(firstDraws(UINT64_MAX), firstDraws(3));  // 2^64 - 1 reduces to 3
     // Reseeding restarts the sequence.
     ox::Random a(42);
     float first = a.next();

@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <cinttypes>
-#include <sstream>
 #include <thread>
 
 #include "core/benchmark.h"
@@ -30,7 +28,6 @@ TEST(Timer, NestingCountsUnmatchedStopsAndOverhead) {
     std::this_thread::sleep_for(std::chrono::milliseconds(2));
     EXPECT_GT(t.stop(), 0.001);
     EXPECT_EQ(t.startCount(), 1);
-    EXPECT_GT(t.seconds(), 0.001);
 
     testing::internal::CaptureStdout();
     ox::Timer lone;

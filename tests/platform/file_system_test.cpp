@@ -1,7 +1,6 @@
 #include "platform/file_system.h"
 
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -65,14 +64,11 @@ TEST_F(FileSystemTest, ReadsOnlyReadableFilesAndOpensInEveryMode) {
     EXPECT_EQ(FileSystemUtilities::lastError(), EFBIG);
     EXPECT_TRUE(text.empty());
 
-    {
-        auto f = FileSystemUtilities::open(path("log"), ox::FileAccess::kWrite, false);
+    for (auto [mode, line] :
+         {std::pair{ox::FileAccess::kWrite, "one\n"}, {ox::FileAccess::kAppend, "two\n"}}) {
+        auto f = FileSystemUtilities::open(path("log"), mode, false);
         ASSERT_TRUE(f);
-        std::fputs("one\n", f.get());
-    }
-    {
-        auto f = FileSystemUtilities::open(path("log"), ox::FileAccess::kAppend);
-        std::fputs("two\n", f.get());
+        std::fputs(line, f.get());
     }
     EXPECT_EQ(read(path("log")), "one\ntwo\n");
     EXPECT_FALSE(FileSystemUtilities::open(path("none/x"), ox::FileAccess::kRead));

@@ -80,7 +80,6 @@ TEST(SignalTest, ProducerConsumerLosesNoWakeUp) {
     int produced = 0, consumed = 0;
     constexpr int kItems = 20000;
     std::vector<std::thread> consumers;
-    std::atomic<int> total{0};
     for (int t = 0; t < kThreads; ++t)
         consumers.emplace_back([&] {
             for (;;) {
@@ -88,7 +87,6 @@ TEST(SignalTest, ProducerConsumerLosesNoWakeUp) {
                 signal.wait(mutex, [&] { return produced > consumed || produced == -1; });
                 if (produced == -1) return;
                 ++consumed;
-                ++total;
                 if (consumed == kItems) signal.broadcast();  // the producer waits for this
             }
         });
@@ -104,7 +102,7 @@ TEST(SignalTest, ProducerConsumerLosesNoWakeUp) {
         signal.broadcast();
     }
     for (auto &t : consumers) t.join();
-    EXPECT_EQ(total.load(), kItems);
+    EXPECT_EQ(consumed, kItems);
 
     // A timed wait on a condition that never holds returns false.
     ox::OXScopedLock<ox::OXMutex> lock(mutex);
@@ -155,7 +153,6 @@ TEST(ThreadTest, StartJoinAndThreadLocalSlot) {
     EXPECT_EQ(inlineThread.runId, std::this_thread::get_id());
     EXPECT_EQ(inlineThread.seenCurrent.load(), &inlineThread);
     EXPECT_EQ(ox::OXThread::current(), nullptr);
-    EXPECT_FALSE(inlineThread.isRunning());
 }
 
 TEST(ThreadTest, AtomicCountersReturnTheNewValue) {

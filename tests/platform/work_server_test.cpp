@@ -40,9 +40,12 @@ private:
     const std::atomic<bool> *gate_;
 };
 
-std::vector<std::string> progressLines(const std::string &out) {
+/// The progress lines (without their prefix) that waiting for the server prints.
+std::vector<std::string> waitForProgress(ox::WorkServer &server, float sleepSeconds, float step) {
+    testing::internal::CaptureStdout();
+    server.waitWithProgress(sleepSeconds, step);
     std::vector<std::string> lines;
-    std::istringstream in(out);
+    std::istringstream in(testing::internal::GetCapturedStdout());
     for (std::string line; std::getline(in, line);)
         if (line.rfind("[PROGRESS] ", 0) == 0) lines.push_back(line.substr(11));
     return lines;
@@ -59,9 +62,7 @@ TEST(WorkServerTest, ManyThreadsFailingItemsAllRunOnce) {
         server.start();
         for (int i = kItems / 2; i < kItems; ++i)  // added while the workers run
             server.addWork(std::make_unique<CountingWork>(c, kThreads, i % 7 == 3));
-        testing::internal::CaptureStdout();
-        server.waitWithProgress(0.001f, 0.1f);
-        auto lines = progressLines(testing::internal::GetCapturedStdout());
+        auto lines = waitForProgress(server, 0.001f, 0.1f);
         ASSERT_FALSE(lines.empty());
         EXPECT_EQ(lines.back(), "Progress: 100%");
         int last = 0;
@@ -81,9 +82,8 @@ TEST(WorkServerTest, ManyThreadsFailingItemsAllRunOnce) {
 
         // A finished server takes new work again and counts from zero.
         server.addWork(new CountingWork(c, kThreads));
-        testing::internal::CaptureStdout();
-        server.waitWithProgress(0.001f, 0.3f);
-        EXPECT_EQ(progressLines(testing::internal::GetCapturedStdout()).back(), "Progress: 100%");
+        EXPECT_EQ(waitForProgress(server, 0.001f, 0.3f),
+                  std::vector<std::string>{"Progress: 100%"});
     }
     EXPECT_EQ(c.badIndex.load(), 0);
     EXPECT_EQ(c.runs.load(), kItems + 1);
@@ -104,11 +104,8 @@ TEST(WorkServerTest, QueuedWorkDoesNotWaitForTheSlowestItem) {
     EXPECT_EQ(c.runs.load(), 200);
     EXPECT_EQ(server.state(), ox::WorkServer::kRunning);  // the gate item is still busy
     open = true;
-    testing::internal::CaptureStdout();
-    server.waitWithProgress(0.01f, 0.5f);
-    auto lines = progressLines(testing::internal::GetCapturedStdout());
-    ASSERT_FALSE(lines.empty());
-    EXPECT_EQ(lines.back(), "Progress: 100%");
+    waitForProgress(server, 0.01f, 0.5f);
+    EXPECT_EQ(server.state(), ox::WorkServer::kFinished);
 }
 
 TEST(WorkServerTest, ShutdownMidRunStopsAndDeletesEverything) {
@@ -137,21 +134,16 @@ TEST(WorkServerTest, ShutdownMidRunStopsAndDeletesEverything) {
 TEST(WorkServerTest, NonThreadedServerRunsOnTheCallerAndNoWorkPrintsOneLine) {
     ox::WorkServer idle(3);
     idle.start();
-    testing::internal::CaptureStdout();
-    idle.waitWithProgress(0.05f, 0.1f);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(), "[PROGRESS] Progress: 100%\n");
+    EXPECT_EQ(waitForProgress(idle, 0.05f, 0.1f), std::vector<std::string>{"Progress: 100%"});
     std::string msg;
     EXPECT_FALSE(idle.failed(msg));
 
     Counters c;
     ox::WorkServer server(4, false);
     for (int i = 0; i < 10; ++i) server.addWork(new CountingWork(c, 1, i == 4));
-    testing::internal::CaptureStdout();
-    server.waitWithProgress(0.05f, 0.25f);
-    auto lines = progressLines(testing::internal::GetCapturedStdout());
-    std::vector<std::string> expected = {"Progress: 25%", "Progress: 50%", "Progress: 75%",
-                                         "Progress: 100%"};
-    EXPECT_EQ(lines, expected);
+    EXPECT_EQ(waitForProgress(server, 0.05f, 0.25f),
+              (std::vector<std::string>{"Progress: 25%", "Progress: 50%", "Progress: 75%",
+                                        "Progress: 100%"}));
     EXPECT_EQ(c.runs.load(), 10);
     ASSERT_TRUE(server.failed(msg));
     EXPECT_EQ(msg, "item 5 failed");
