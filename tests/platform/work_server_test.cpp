@@ -80,10 +80,12 @@ TEST(WorkServerTest, ManyThreadsFailingItemsAllRunOnce) {
         EXPECT_NE(msg.find(" failed (and "), std::string::npos) << msg;
         EXPECT_NE(msg.find(" more failures)"), std::string::npos) << msg;
 
-        // A finished server takes new work again and counts from zero.
+        // A finished server takes new work again and counts from zero. The marks printed
+        // before 100% depend on when the item ends, so only the last line is checked.
         server.addWork(new CountingWork(c, kThreads));
-        EXPECT_EQ(waitForProgress(server, 0.001f, 0.3f),
-                  std::vector<std::string>{"Progress: 100%"});
+        lines = waitForProgress(server, 0.001f, 0.3f);
+        ASSERT_FALSE(lines.empty());
+        EXPECT_EQ(lines.back(), "Progress: 100%");
     }
     EXPECT_EQ(c.badIndex.load(), 0);
     EXPECT_EQ(c.runs.load(), kItems + 1);
