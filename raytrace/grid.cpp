@@ -416,13 +416,17 @@ void Grid::packTriangles() {
                                [](const auto &a, const auto &b) { return a.first == b.first; }),
                    home.end());
     }
-    // Order: Morton order of the home cells, then Morton order of the centres inside them, so
-    // that neighbouring triangles share packets and a packet rarely spans two cells.
+    // Order: Morton order of the home cells; inside one, the triangles that reach the same
+    // neighbours together, then Morton order of their centres. Neighbouring triangles share
+    // packets, a packet rarely spans two cells, and a neighbour that a few of a cell's
+    // triangles reach finds them in few packets.
     struct Keyed {
         uint64_t cell;
-        uint32_t inside, tri;
+        uint32_t reach, inside, tri;
         bool operator<(const Keyed &o) const {
-            return cell != o.cell ? cell < o.cell : (inside != o.inside ? inside < o.inside : tri < o.tri);
+            if (cell != o.cell) return cell < o.cell;
+            if (reach != o.reach) return reach < o.reach;
+            return inside != o.inside ? inside < o.inside : tri < o.tri;
         }
     };
     std::vector<Keyed> keyed;
@@ -440,7 +444,17 @@ void Grid::packTriangles() {
             f = f >= 0.0f ? (f <= 1023.0f ? f : 1023.0f) : 0.0f;
             q[a] = uint32_t(f);
         }
-        keyed.push_back({morton3x21(uint64_t(x), uint64_t(y), uint64_t(z)), morton3(q[0], q[1], q[2]), t});
+        // Which side of the home cell the triangle's box reaches beyond, per axis.
+        BBox b = tri.bounds();
+        const int64_t at[3] = {x, y, z};
+        uint32_t reach = 0;
+        for (int a = 0; a < 3; ++a) {
+            uint32_t below = cellCoord(b.min[a] - margin_, a) < at[a];
+            uint32_t above = cellCoord(b.max[a] + margin_, a) > at[a];
+            reach |= (below | above << 1) << (2 * a);
+        }
+        keyed.push_back({morton3x21(uint64_t(x), uint64_t(y), uint64_t(z)), reach,
+                         morton3(q[0], q[1], q[2]), t});
     }
     std::sort(keyed.begin(), keyed.end());
     const float nan = std::numeric_limits<float>::quiet_NaN();
