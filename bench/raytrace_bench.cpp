@@ -71,6 +71,29 @@ struct EmbreeScene {
 };
 #endif
 
+#ifdef OX_HAVE_EMBREE
+// One Embree query as the grid answers it: closest hit without limit, or any hit below tmax.
+bool embreeQuery(RTCScene scene, const Ray &r, float tmax, bool any) {
+    RTCIntersectContext ctx;
+    rtcInitIntersectContext(&ctx);
+    RTCRayHit rh;
+    rh.ray.org_x = r.origin.x, rh.ray.org_y = r.origin.y, rh.ray.org_z = r.origin.z;
+    rh.ray.dir_x = r.direction.x, rh.ray.dir_y = r.direction.y, rh.ray.dir_z = r.direction.z;
+    rh.ray.tnear = 1e-6f;
+    rh.ray.tfar = any ? tmax : 3.4028235e38f;
+    rh.ray.mask = 0xFFFFFFFFu;
+    rh.ray.flags = 0;
+    rh.ray.time = 0;
+    if (any) {
+        rtcOccluded1(scene, &ctx, &rh.ray);
+        return rh.ray.tfar < 0.0f;
+    }
+    rh.hit.geomID = RTC_INVALID_GEOMETRY_ID;
+    rtcIntersect1(scene, &ctx, &rh);
+    return rh.hit.geomID != RTC_INVALID_GEOMETRY_ID;
+}
+#endif
+
 struct Fixture {
     testmesh::Mesh mesh;
     CompleteGrid grid;
@@ -165,28 +188,8 @@ void BM_Embree(benchmark::State &state) {
     RTCScene scene = f.embree->scene;
     size_t i = size_t(state.thread_index()) * 7919, hits = 0, n = 0;
     for (auto _ : state) {
-        for (int k = 0; k < 256; ++k, ++i) {
-            const Ray &r = rays[i & (rays.size() - 1)];
-            RTCIntersectContext ctx;
-            rtcInitIntersectContext(&ctx);
-            RTCRayHit rh;
-            rh.ray.org_x = r.origin.x, rh.ray.org_y = r.origin.y, rh.ray.org_z = r.origin.z;
-            rh.ray.dir_x = r.direction.x, rh.ray.dir_y = r.direction.y,
-            rh.ray.dir_z = r.direction.z;
-            rh.ray.tnear = 1e-6f;
-            rh.ray.tfar = any ? tmax : 3.4028235e38f;
-            rh.ray.mask = 0xFFFFFFFFu;
-            rh.ray.flags = 0;
-            rh.ray.time = 0;
-            if (any) {
-                rtcOccluded1(scene, &ctx, &rh.ray);
-                hits += rh.ray.tfar < 0.0f;
-            } else {
-                rh.hit.geomID = RTC_INVALID_GEOMETRY_ID;
-                rtcIntersect1(scene, &ctx, &rh);
-                hits += rh.hit.geomID != RTC_INVALID_GEOMETRY_ID;
-            }
-        }
+        for (int k = 0; k < 256; ++k, ++i)
+            hits += embreeQuery(scene, rays[i & (rays.size() - 1)], tmax, any);
         n += 256;
     }
     state.SetItemsProcessed(int64_t(n));
@@ -219,28 +222,9 @@ void BM_Ratio(benchmark::State &state) {
         }
     };
     auto embreeRun = [&](size_t start, std::vector<char> &hits) {
-        for (size_t k = 0; k < kTurn; ++k) {
-            const Ray &r = rays[(start + k) & (rays.size() - 1)];
-            RTCIntersectContext ctx;
-            rtcInitIntersectContext(&ctx);
-            RTCRayHit rh;
-            rh.ray.org_x = r.origin.x, rh.ray.org_y = r.origin.y, rh.ray.org_z = r.origin.z;
-            rh.ray.dir_x = r.direction.x, rh.ray.dir_y = r.direction.y,
-            rh.ray.dir_z = r.direction.z;
-            rh.ray.tnear = 1e-6f;
-            rh.ray.tfar = any ? tmax : 3.4028235e38f;
-            rh.ray.mask = 0xFFFFFFFFu;
-            rh.ray.flags = 0;
-            rh.ray.time = 0;
-            if (any) {
-                rtcOccluded1(f.embree->scene, &ctx, &rh.ray);
-                hits[k] = rh.ray.tfar < 0.0f;
-            } else {
-                rh.hit.geomID = RTC_INVALID_GEOMETRY_ID;
-                rtcIntersect1(f.embree->scene, &ctx, &rh);
-                hits[k] = rh.hit.geomID != RTC_INVALID_GEOMETRY_ID;
-            }
-        }
+        for (size_t k = 0; k < kTurn; ++k)
+            hits[k] =
+                embreeQuery(f.embree->scene, rays[(start + k) & (rays.size() - 1)], tmax, any);
     };
     double gridSeconds = 0, embreeSeconds = 0;
     size_t n = 0, mismatches = 0, turn = 0;
