@@ -841,6 +841,26 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                                size_t(nx_ * ny_ * nz_);
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
+    // The walk waits on each cell's distance before it knows where to go next. In grids whose
+    // distances do not stay in a core's cache, start fetching the cells at a few points ahead
+    // along the ray now, so that those waits overlap.
+    if (nx_ * ny_ * nz_ >= kFetchAheadMinCells) {
+        float h = 2.0f * std::min({delta[0], delta[1], delta[2]});
+        float t = t0;
+        for (int k = 0; k < kFetchAhead; ++k) {
+            t += h;
+            if (!(t < t1)) break;
+            int64_t c = 0;
+            for (int a = 0; a < 3; ++a) {
+                float f = (r.o[a] + r.d[a] * t - box_.min[a]) * invCellSize_[a];
+                float top = float(n[a] - 1);
+                f = f >= 0.0f ? (f < top ? f : top) : 0.0f;
+                c += int64_t(f) * stride[a];
+            }
+            __builtin_prefetch(distance + c);
+            __builtin_prefetch(cells + c);
+        }
+    }
     bool found = false;
     // Every iteration advances at least one cell along the ray, so a walk needs at most
     // nx + ny + nz of them.

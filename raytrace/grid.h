@@ -219,6 +219,10 @@ private:
     // still reach holds items. The walk jumps over the cube, or stops. A ray reads only its own
     // octant's array.
     static constexpr uint32_t kEmptyAhead = 255;
+    /// Points along a ray whose cells the walk fetches before it starts, in grids of at least
+    /// kFetchAheadMinCells cells (2 MiB of distances).
+    static constexpr int kFetchAhead = 6;
+    static constexpr int64_t kFetchAheadMinCells = int64_t(1) << 18;
     std::vector<uint8_t, LargeArrayAllocator<uint8_t>> distance_;
     void computeDistances(const std::vector<uint32_t> &occupied);
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> items_;
