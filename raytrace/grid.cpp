@@ -845,6 +845,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     // distances do not stay in a core's cache, start fetching the cells at a few points ahead
     // along the ray now, so that those waits overlap.
     if (nx_ * ny_ * nz_ >= kFetchAheadMinCells) {
+        __builtin_prefetch(distance + cell);
+        __builtin_prefetch(cells + cell);
         float h = 2.0f * std::min({delta[0], delta[1], delta[2]});
         float t = t0;
         for (int k = 0; k < kFetchAhead; ++k) {
