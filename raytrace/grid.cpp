@@ -585,11 +585,13 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                             best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
                     } else {
                         for (int m = 1; m < 8; ++m)
-                            if (!((m & 1) && !in[0]) && !((m & 2) && !in[1]) && !((m & 4) && !in[2]))
+                            if (!((m & 1) && !in[0]) && !((m & 2) && !in[1]) &&
+                                !((m & 4) && !in[2]))
                                 best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
                     }
-                    d[c] = uint8_t(best == kEmptyAhead ? kEmptyAhead
-                                                       : std::min<uint32_t>(best + 1, kEmptyAhead - 1));
+                    d[c] = uint8_t(best == kEmptyAhead
+                                       ? kEmptyAhead
+                                       : std::min<uint32_t>(best + 1, kEmptyAhead - 1));
                 }
     }
 }
@@ -609,8 +611,7 @@ uint32_t Grid::nestingDepth() const {
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cells_.capacity() * sizeof(uint32_t) + items_.capacity() * 4 +
                distance_.capacity() + packets_.capacity() * sizeof(IntersectSSETriangle) +
-               groups_.capacity() * sizeof(PacketGroup) +
-               children_.capacity() * sizeof(void *);
+               groups_.capacity() * sizeof(PacketGroup) + children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
 }
@@ -837,8 +838,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     }
     // The distances of the ray's direction octant.
     const uint8_t *distance =
-        distance_.data() + size_t((step[0] < 0) | (step[1] < 0) << 1 | (step[2] < 0) << 2) *
-                               size_t(nx_ * ny_ * nz_);
+        distance_.data() +
+        size_t((step[0] < 0) | (step[1] < 0) << 1 | (step[2] < 0) << 2) * size_t(nx_ * ny_ * nz_);
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
     // The walk waits on each cell's distance before it knows where to go next. In grids whose

@@ -166,8 +166,8 @@ TEST(CompleteGridTest, MatchesBruteForceOverLargeEmptySpacesWithDefaultSettings)
     Mesh coil = testmesh::coil(300, 24, 0.6f), blob = testmesh::blob(30, 40, 0.3f);
     std::vector<InstanceInput> ins = {
         instanceOf(coil, 0, Mtx4(), kAllFlags, 0, "near"),
-        instanceOf(coil, 0, rotationY(0.7f) * Mtx4::translation({9.0f, 4.0f, -6.0f}), kAllFlags,
-                   1, "far"),
+        instanceOf(coil, 0, rotationY(0.7f) * Mtx4::translation({9.0f, 4.0f, -6.0f}), kAllFlags, 1,
+                   "far"),
         instanceOf(blob, 1, Mtx4::translation({4.0f, 2.0f, -3.0f}), kAllFlags, 2, "blob")};
     ADSParameters p;
     p.useInstancing = 0;
