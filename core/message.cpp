@@ -90,6 +90,21 @@ void message(uint32_t type, int level, const char *format, ...) {
     va_end(args);
 }
 
+std::string formatText(const char *format, ...) {
+    va_list args, again;
+    va_start(args, format);
+    va_copy(again, args);
+    int n = std::vsnprintf(nullptr, 0, format, args);
+    va_end(args);
+    std::string text;
+    if (n > 0) {
+        text.resize(size_t(n));
+        std::vsnprintf(text.data(), size_t(n) + 1, format, again);
+    }
+    va_end(again);
+    return text;
+}
+
 void messageText(uint32_t type, int level, const std::string &text) {
     message(type, level, "%s", text.c_str());
 }

@@ -28,6 +28,8 @@ void message(uint32_t type, int level, const char *format, ...)
 void vmessage(uint32_t type, int level, const char *format, va_list args);
 /// Prints a text composed from input as it stands (never used as a format).
 void messageText(uint32_t type, int level, const std::string &text);
+/// printf-style formatting into a string of whatever length the text needs.
+std::string formatText(const char *format, ...) __attribute__((format(printf, 1, 2)));
 
 /// The 11-character console prefix of a type ("[UNKNOWN]  " for a value not in the table).
 const char *messagePrefix(uint32_t type);

@@ -4,7 +4,6 @@
 #include <cerrno>
 #include <charconv>
 #include <cmath>
-#include <cstdarg>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
@@ -32,17 +31,7 @@ bool parseInt(const std::string &text, int &out) {
     return r.ec == std::errc() && r.ptr == e;
 }
 
-std::string format(const char *fmt, ...) __attribute__((format(printf, 1, 2)));
-std::string format(const char *fmt, ...) {
-    char buffer[1024];
-    va_list args;
-    va_start(args, fmt);
-    std::vsnprintf(buffer, sizeof buffer, fmt, args);
-    va_end(args);
-    return buffer;
-}
-
-std::string formatVec(const Vec3 &v) { return format("(%g, %g, %g)", v.x, v.y, v.z); }
+std::string formatVec(const Vec3 &v) { return formatText("(%g, %g, %g)", v.x, v.y, v.z); }
 
 }  // namespace
 
@@ -231,44 +220,45 @@ std::vector<std::string> describeModel(const ImportedModel &model) {
     BBox all;
     size_t triangles = 0;
     for (const ImportedShape &s : model.shapes) triangles += s.triangleCount();
-    lines.push_back(format("Shapes: %zu (%zu triangles)", model.shapes.size(), triangles));
+    lines.push_back(formatText("Shapes: %zu (%zu triangles)", model.shapes.size(), triangles));
     for (const ImportedShape &s : model.shapes) {
         BBox b = s.bounds();
         std::string sets;
         for (const std::string &n : s.uvSetNames) sets += (sets.empty() ? "" : ", ") + n;
-        lines.push_back(format("  %s: %zu vertices, %zu triangles, UV sets [%s]%s", s.name.c_str(),
-                               s.positions.size(), s.triangleCount(), sets.c_str(),
-                               s.hasColors() ? ", vertex colours" : ""));
+        lines.push_back(formatText("  %s: %zu vertices, %zu triangles, UV sets [%s]%s",
+                                   s.name.c_str(), s.positions.size(), s.triangleCount(),
+                                   sets.c_str(), s.hasColors() ? ", vertex colours" : ""));
         lines.push_back("    box " + formatVec(b.min) + " - " + formatVec(b.max));
         for (const ImportedGroup &g : s.groups)
-            lines.push_back(
-                format("    material %s: %zu triangles", g.material.c_str(), g.indices.size() / 3));
+            lines.push_back(formatText("    material %s: %zu triangles", g.material.c_str(),
+                                       g.indices.size() / 3));
     }
-    lines.push_back(format("Materials: %zu", model.materials.size()));
+    lines.push_back(formatText("Materials: %zu", model.materials.size()));
     for (const ImportedMaterial &m : model.materials) {
-        std::string line = format("  %s: diffuse (%g, %g, %g)", m.name.c_str(), m.diffuse.color.r,
-                                  m.diffuse.color.g, m.diffuse.color.b);
+        std::string line = formatText("  %s: diffuse (%g, %g, %g)", m.name.c_str(),
+                                      m.diffuse.color.r, m.diffuse.color.g, m.diffuse.color.b);
         const std::pair<const char *, const ImportedChannel *> channels[] = {
             {"diffuse", &m.diffuse},   {"ambient", &m.ambient},   {"transparency", &m.transparency},
             {"emissive", &m.emissive}, {"specular", &m.specular}, {"reflection", &m.reflection},
             {"normal", &m.normal}};
         for (const auto &[name, ch] : channels) {
             if (ch->embeddedImage >= 0 && size_t(ch->embeddedImage) < model.images.size())
-                line += format(", %s map %s (stored in the model)", name,
-                               model.images[size_t(ch->embeddedImage)].fileName.c_str());
+                line += formatText(", %s map %s (stored in the model)", name,
+                                   model.images[size_t(ch->embeddedImage)].fileName.c_str());
             if (!ch->fileTexture.empty())
-                line += format(", %s map %s", name, ch->fileTexture.c_str());
+                line += formatText(", %s map %s", name, ch->fileTexture.c_str());
             if (name != std::string("diffuse") && ch->fileTexture.empty() && ch->scale > 0.0f)
-                line += format(", %s (%g, %g, %g)", name, ch->color.r, ch->color.g, ch->color.b);
+                line +=
+                    formatText(", %s (%g, %g, %g)", name, ch->color.r, ch->color.g, ch->color.b);
         }
         if (m.diffuse.useVertexColor) line += ", vertex colours";
         lines.push_back(line);
     }
-    lines.push_back(format("Instances: %zu", model.instances.size()));
+    lines.push_back(formatText("Instances: %zu", model.instances.size()));
     for (const ImportedInstance &in : model.instances) {
         const Mtx4 &m = in.objectToWorld;
-        lines.push_back(format("  %s -> %s at (%g, %g, %g)", in.name.c_str(), in.shape.c_str(),
-                               m.m[3][0], m.m[3][1], m.m[3][2]));
+        lines.push_back(formatText("  %s -> %s at (%g, %g, %g)", in.name.c_str(), in.shape.c_str(),
+                                   m.m[3][0], m.m[3][1], m.m[3][2]));
         for (const ImportedShape &s : model.shapes)
             if (s.name == in.shape) {
                 BBox b = s.bounds();
@@ -278,22 +268,22 @@ std::vector<std::string> describeModel(const ImportedModel &model) {
                                               k & 4 ? b.max.z : b.min.z)));
             }
     }
-    lines.push_back(format("Cameras: %zu", model.cameras.size()));
+    lines.push_back(formatText("Cameras: %zu", model.cameras.size()));
     for (const ImportedCamera &c : model.cameras) {
         const Mtx4 &m = c.objectToWorld;
         lines.push_back(
-            format("  %s: %s at (%g, %g, %g) looking along (%g, %g, %g)", c.name.c_str(),
-                   c.type == ImportedCameraType::kOrtho ? "orthographic" : "perspective", m.m[3][0],
-                   m.m[3][1], m.m[3][2], -m.m[2][0], -m.m[2][1], -m.m[2][2]));
+            formatText("  %s: %s at (%g, %g, %g) looking along (%g, %g, %g)", c.name.c_str(),
+                       c.type == ImportedCameraType::kOrtho ? "orthographic" : "perspective",
+                       m.m[3][0], m.m[3][1], m.m[3][2], -m.m[2][0], -m.m[2][1], -m.m[2][2]));
     }
     static const char *kLightNames[] = {"point", "directional", "spot",
                                         "area",  "window",      "environment"};
-    lines.push_back(format("Lights: %zu", model.lights.size()));
+    lines.push_back(formatText("Lights: %zu", model.lights.size()));
     for (const ImportedLight &l : model.lights) {
         const Mtx4 &m = l.objectToWorld;
-        lines.push_back(format("  %s: %s, colour (%g, %g, %g) at (%g, %g, %g)", l.name.c_str(),
-                               kLightNames[int(l.type)], l.color.r, l.color.g, l.color.b, m.m[3][0],
-                               m.m[3][1], m.m[3][2]));
+        lines.push_back(formatText("  %s: %s, colour (%g, %g, %g) at (%g, %g, %g)", l.name.c_str(),
+                                   kLightNames[int(l.type)], l.color.r, l.color.g, l.color.b,
+                                   m.m[3][0], m.m[3][1], m.m[3][2]));
     }
     if (!all.isEmpty())
         lines.push_back("Scene box " + formatVec(all.min) + " - " + formatVec(all.max));

@@ -48,16 +48,6 @@ bool parseInspectCommand(const std::vector<std::string> &args, InspectCommand &c
 
 namespace {
 
-std::string format(const char *fmt, ...) __attribute__((format(printf, 1, 2)));
-std::string format(const char *fmt, ...) {
-    char buf[1024];
-    va_list args;
-    va_start(args, fmt);
-    std::vsnprintf(buf, sizeof buf, fmt, args);
-    va_end(args);
-    return buf;
-}
-
 const char *cameraKind(const Camera &c) {
     if (dynamic_cast<const PerspectiveCamera *>(&c)) return "perspective";
     if (dynamic_cast<const OrthoCamera *>(&c)) return "orthographic";
@@ -69,47 +59,47 @@ const char *cameraKind(const Camera &c) {
 
 std::string sceneSummary(const Scene &scene) {
     std::string s;
-    s += format("Shapes: %zu\n", scene.shapes().size());
+    s += formatText("Shapes: %zu\n", scene.shapes().size());
     for (const auto &shape : scene.shapes()) {
         const VertexList &v = shape->vertices();
         s += "  " + shape->name() +
-             format(": %u triangles, %u vertices, %u UV sets", shape->triangleCount(), v.size(),
-                    v.uvSetCount());
+             formatText(": %u triangles, %u vertices, %u UV sets", shape->triangleCount(), v.size(),
+                        v.uvSetCount());
         for (size_t k = 0; k < v.uvSetNames().size(); ++k)
             s += (k == 0 ? " (" : ", ") + v.uvSetNames()[k] +
                  (k + 1 == v.uvSetNames().size() ? ")" : "");
         if (v.hasColors()) s += ", vertex colours";
         s += "\n";
     }
-    s += format("Instances: %zu\n", scene.instances().size());
+    s += formatText("Instances: %zu\n", scene.instances().size());
     for (const auto &inst : scene.instances()) {
         s += "  " + inst->name() + ": shape " + inst->shape().name();
         if (inst->overrideMaterial()) s += ", material " + inst->overrideMaterial()->name();
-        s += format(", flags 0x%05X\n", inst->flags());
+        s += formatText(", flags 0x%05X\n", inst->flags());
     }
     const auto materials = scene.materials().materials();
-    s += format("Materials: %zu\n", materials.size());
+    s += formatText("Materials: %zu\n", materials.size());
     for (const Material *m : materials) s += "  " + m->name() + "\n";
-    s += format("Cameras: %zu\n", scene.cameras().size());
+    s += formatText("Cameras: %zu\n", scene.cameras().size());
     for (const auto &c : scene.cameras()) {
         const Vec3 p = c->position();
-        s +=
-            "  " + c->name() +
-            format(": %s at (%g, %g, %g)\n", cameraKind(*c), double(p.x), double(p.y), double(p.z));
+        s += "  " + c->name() +
+             formatText(": %s at (%g, %g, %g)\n", cameraKind(*c), double(p.x), double(p.y),
+                        double(p.z));
     }
-    s += format("Lights: %zu\n", scene.lights().size());
+    s += formatText("Lights: %zu\n", scene.lights().size());
     for (const auto &l : scene.lights()) s += "  " + l->name() + ": " + l->className() + "\n";
     const LightLinkTable &links = scene.lightLinks();
-    s += format("Light links: %u instances x %u lights (%zu bytes)\n", links.instanceCount(),
-                links.lightCount(), links.sizeBytes());
+    s += formatText("Light links: %u instances x %u lights (%zu bytes)\n", links.instanceCount(),
+                    links.lightCount(), links.sizeBytes());
     const BBox box = scene.instanceBounds();
     if (box.isEmpty())
         s += "Scene box: empty\n";
     else
-        s +=
-            format("Scene box: (%g, %g, %g) - (%g, %g, %g)\n", double(box.min.x), double(box.min.y),
-                   double(box.min.z), double(box.max.x), double(box.max.y), double(box.max.z));
-    s += format("Bias: %g\n", double(scene.bias()));
+        s += formatText("Scene box: (%g, %g, %g) - (%g, %g, %g)\n", double(box.min.x),
+                        double(box.min.y), double(box.min.z), double(box.max.x), double(box.max.y),
+                        double(box.max.z));
+    s += formatText("Bias: %g\n", double(scene.bias()));
     return s;
 }
 

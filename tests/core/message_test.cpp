@@ -46,6 +46,9 @@ TEST_F(MessageTest, LongMessagesAreCutAndComposedTextIsNeverAFormat) {
     const std::string out = testing::internal::GetCapturedStdout();
     EXPECT_EQ(out.find('\n'), 11 + ox::kMessageBufferSize - 1);
     EXPECT_NE(out.find("[INFO]     100%s %n %d\n"), std::string::npos);
+    // Texts formatted for other uses are never cut.
+    EXPECT_EQ(ox::formatText("%s|%d", longText.c_str(), 7), longText + "|7");
+    EXPECT_EQ(ox::formatText("%s", ""), "");
 }
 
 TEST_F(MessageTest, DebugFileGetsBannerAndEveryShownMessage) {
