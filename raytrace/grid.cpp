@@ -921,7 +921,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             // Nothing lies ahead of this cell the way the ray goes: the walk is over.
             if (dist == kEmptyAhead) break;
             // Every cell within dist - 1 of this one is empty: leave that cube in one jump
-            // through its nearest far face; the other axes catch up with ordinary steps.
+            // through its nearest far face. The other axes move to the cell the ray is in
+            // there (at most dist - 1 cells on), with the plane ahead not before the exit.
             float reach = float(dist - 1);
             float e0 = tNext[0] + reach * delta[0], e1 = tNext[1] + reach * delta[1],
                   e2 = tNext[2] + reach * delta[2];
@@ -932,8 +933,16 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             if (uint64_t(next[j] - ahead[j]) >= uint64_t(n[j])) break;
             tNext[j] = (base[j] + float(next[j]) * cellSize_[j]) * r.inv[j];
             for (int b = 0; b < 3; ++b) {
-                if (b == j) continue;
-                for (uint32_t k = dist - 1; k > 0 && tNext[b] < tExit; --k) {
+                if (b == j || step[b] == 0 || tNext[b] >= tExit) continue;
+                int64_t from = next[b] - ahead[b];
+                int64_t last = from + step[b] * int64_t(dist - 1);
+                float f = (r.o[b] + r.d[b] * tExit - box_.min[b]) * invCellSize_[b];
+                f = f >= 0.0f ? (f < float(n[b]) ? f : float(n[b])) : 0.0f;
+                int64_t at = int64_t(f);
+                at = step[b] > 0 ? std::clamp(at, from, last) : std::clamp(at, last, from);
+                next[b] = at + ahead[b];
+                tNext[b] = (base[b] + float(next[b]) * cellSize_[b]) * r.inv[b];
+                while (tNext[b] < tExit && next[b] - ahead[b] != last) {
                     next[b] += step[b];
                     tNext[b] = (base[b] + float(next[b]) * cellSize_[b]) * r.inv[b];
                 }
