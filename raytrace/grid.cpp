@@ -848,18 +848,25 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     if (nx_ * ny_ * nz_ >= kFetchAheadMinCells) {
         __builtin_prefetch(distance + cell);
         __builtin_prefetch(cells + cell);
+        // The points in cell units, stepped by 2 crossings of the smallest cell side; the cell
+        // counts fit 32 bits.
         float h = 2.0f * std::min({delta[0], delta[1], delta[2]});
+        const float4 scale(_mm_setr_ps(invCellSize_.x, invCellSize_.y, invCellSize_.z, 0.0f));
+        const float4 top(_mm_setr_ps(float(nx_ - 1), float(ny_ - 1), float(nz_ - 1), 0.0f));
+        const float4 dir(_mm_setr_ps(r.d.x, r.d.y, r.d.z, 0.0f));
+        float4 f = (float4(_mm_setr_ps(r.o.x, r.o.y, r.o.z, 0.0f)) + dir * float4(t0) -
+                    float4(_mm_setr_ps(box_.min.x, box_.min.y, box_.min.z, 0.0f))) *
+                   scale;
+        const float4 df = dir * float4(h) * scale;
         float t = t0;
         for (int k = 0; k < kFetchAhead; ++k) {
             t += h;
             if (!(t < t1)) break;
-            int64_t c = 0;
-            for (int a = 0; a < 3; ++a) {
-                float f = (r.o[a] + r.d[a] * t - box_.min[a]) * invCellSize_[a];
-                float top = float(n[a] - 1);
-                f = f >= 0.0f ? (f < top ? f : top) : 0.0f;
-                c += int64_t(f) * stride[a];
-            }
+            f = f + df;
+            alignas(16) int32_t at[4];
+            _mm_store_si128(reinterpret_cast<__m128i *>(at),
+                            _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), top)));
+            int64_t c = at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2];
             __builtin_prefetch(distance + c);
             __builtin_prefetch(cells + c);
         }
