@@ -197,11 +197,12 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
 }
 
 int64_t Grid::cellCoord(float v, int axis) const {
-    float n = float(axis == 0 ? nx_ : axis == 1 ? ny_ : nz_);
+    int64_t n = axis == 0 ? nx_ : axis == 1 ? ny_ : nz_;
     float f = (v - box_.min[axis]) * invCellSize_[axis];
     // Clamp in floating point first: NaN and huge values never reach the integer conversion.
-    f = f >= 0.0f ? (f < n - 1.0f ? f : n - 1.0f) : 0.0f;
-    return int64_t(f);  // truncation is floor for the non-negative values left
+    // Above 2^24 cells n - 1 may round up to n in float: clamp the index again.
+    f = f >= 0.0f ? (f < float(n - 1) ? f : float(n - 1)) : 0.0f;
+    return std::min(int64_t(f), n - 1);  // truncation is floor for the non-negative values left
 }
 
 BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
@@ -858,6 +859,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                     float4(_mm_setr_ps(box_.min.x, box_.min.y, box_.min.z, 0.0f))) *
                    scale;
         const float4 df = dir * float4(h) * scale;
+        const int64_t lastCell = nx_ * ny_ * nz_ - 1;
         float t = t0;
         for (int k = 0; k < kFetchAhead; ++k) {
             t += h;
@@ -866,7 +868,9 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             alignas(16) int32_t at[4];
             _mm_store_si128(reinterpret_cast<__m128i *>(at),
                             _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), top)));
-            int64_t c = at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2];
+            // (Above 2^24 cells a coordinate may round one or two past the last cell.)
+            int64_t c = std::min(at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2],
+                                 lastCell);
             __builtin_prefetch(distance + c);
             __builtin_prefetch(cells + c);
         }
