@@ -54,9 +54,7 @@ Bytes smallFile(uint32_t version, float boxY = 1) {
 TEST(Vtm, WriterEmitsTheExactLayout) {
     TempDir dir;
     MeshMaker m("tri", 1);
-    m.vertex({0, 0, 0});
-    m.vertex({1, 0, 0});
-    m.vertex({0, 1, 0});
+    for (Vec3 p : {Vec3(0, 0, 0), Vec3(1, 0, 0), Vec3(0, 1, 0)}) m.vertex(p);
     m.group("mat", {0, 1, 2});
     m.mesh.uvSetNames = {"map1"};
     m.mesh.bounds = BBox(Vec3(0, 0, 0), Vec3(1, 1, 0));
@@ -68,11 +66,10 @@ TEST(Vtm, WriterEmitsTheExactLayout) {
     // Version 2 with colours: 16 floats, then the UV pair, and the flag set.
     MeshMaker c("c", 0, true);
     c.vertex({1, 2, 3}, {0, 0, 1}, {}, {}, Color(0.1f, 0.2f, 0.3f, 0.4f));
-    std::string path = dir.file("c.vtm");
     c.mesh.groups.push_back({"m", 0});
+    std::string path = dir.file("c.vtm");
     ASSERT_TRUE(vtm::writeTempMesh(path, c.mesh, 2));
-    Bytes want;
-    want.str("VTM").u32(2).str("c").u32(1).u32(0).u32(1).str("m").u32(0);
+    Bytes want = Bytes().str("VTM").u32(2).str("c").u32(1).u32(0).u32(1).str("m").u32(0);
     for (float f : {1.f, 2.f, 3.f, 1.f, 2.f, 3.f}) want.f32(f);
     want.u32(1);
     for (float f :
@@ -199,11 +196,8 @@ TEST(Vtm, HostileHeadersFailCleanly) {
         EXPECT_EQ(why.substr(0, reason.size()), reason);
     }
     // The empty box is the honest box of a mesh without triangles.
-    Bytes empty;
-    empty.str("VTM").u32(1).str("e").u32(0).u32(0).u32(0);
-    for (float v : {3.4028235e38f, 3.4028235e38f, 3.4028235e38f, -3.4028235e38f, -3.4028235e38f,
-                    -3.4028235e38f})
-        empty.f32(v);
+    Bytes empty = Bytes().str("VTM").u32(1).str("e").u32(0).u32(0).u32(0);
+    for (int i = 0; i < 6; ++i) empty.f32(i < 3 ? 3.4028235e38f : -3.4028235e38f);
     EXPECT_EQ(openBytes(dir, empty.b), S::kOk);
 
     // Bytes after the last triangle: a warning, and the file still opens.
