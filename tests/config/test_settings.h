@@ -19,6 +19,14 @@ inline int countOf(const std::string &text, const std::string &what) {
     return n;
 }
 
+/// What is printed to the console while f runs.
+template <typename F>
+std::string captured(F &&f) {
+    testing::internal::CaptureStdout();
+    f();
+    return testing::internal::GetCapturedStdout();
+}
+
 inline std::string readFile(const std::string &path) {
     std::ifstream in(path, std::ios::binary);
     std::stringstream ss;
@@ -101,7 +109,6 @@ public:
 };
 
 using All = ox::OXCComplexTypeInstantiator<AllBase>;
-using Target = ox::OXCComplexTypeInstantiator<TargetBase>;
 
 class RootBase : public ox::OXCComplexType {
 public:

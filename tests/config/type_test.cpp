@@ -7,8 +7,6 @@
 #include "tests/config/test_settings.h"
 
 using namespace cfgtest;
-using testing::internal::CaptureStdout;
-using testing::internal::GetCapturedStdout;
 
 namespace {
 
@@ -43,24 +41,25 @@ TEST(ConfigType, RegistryOrderLookupAndDuplicates) {
     EXPECT_EQ(ox::findMember(all, "bias"), &all.bias);
     EXPECT_EQ(ox::findMember(all, "nope"), nullptr);
 
-    CaptureStdout();
+    testing::internal::CaptureStdout();
     ox::OXCComplexTypeInstantiator<DuplicateBase> dup;
-    std::string out = GetCapturedStdout();
+    std::string out = testing::internal::GetCapturedStdout();
     EXPECT_EQ(countOf(out, "Error registring variable key in container Dup, it already exists"), 1);
     EXPECT_EQ(dup.findMember("key"), &dup.first);
     EXPECT_EQ(dup.members().size(), 2u);
 
-    CaptureStdout();
-    EXPECT_EQ(ox::checkDocumentation(dup), 1);
-    EXPECT_EQ(countOf(GetCapturedStdout(), "Attribute plain in type Dup is undocumented"), 1);
+    out = captured([&] { EXPECT_EQ(ox::checkDocumentation(dup), 1); });
+    EXPECT_EQ(countOf(out, "Attribute plain in type Dup is undocumented"), 1);
 }
 
 TEST(ConfigType, TextForms) {
     All a;
     EXPECT_EQ(a.rays.toString(), "4294967295");
     // The shortest text that reads back; 16777217 is not representable: the nearest float prints.
-    for (auto [f, text] : {std::pair{0.005f, "0.005"}, {0.1f, "0.1"},
-                           {3.4028235e38f, "3.4028235e+38"}, {16777217.0f, "16777216"}}) {
+    for (auto [f, text] : {std::pair{0.005f, "0.005"},
+                           {0.1f, "0.1"},
+                           {3.4028235e38f, "3.4028235e+38"},
+                           {16777217.0f, "16777216"}}) {
         a.bias = f;
         EXPECT_EQ(a.bias.toString(), text);
     }
@@ -98,9 +97,10 @@ TEST(ConfigType, EnumerationsAreKeyedByTheirType) {
     EXPECT_EQ(tb.find("LATLONG"), 2);
 
     ox::OXCEnum<EnvB> camEnv("env", EnvB::Latlong);
-    CaptureStdout();
-    ox::assign(a.inner.env, camEnv);  // same member name, another table: refused
-    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error when assigning variable env"), 1);
+    // Same member name, another table: refused.
+    EXPECT_EQ(countOf(captured([&] { ox::assign(a.inner.env, camEnv); }),
+                      "Type error when assigning variable env"),
+              1);
     EXPECT_EQ(a.inner.env.get(), EnvA::Camera);
     ox::OXCEnum<EnvA> other("somethingElse", EnvA::SkyLight);
     ox::assign(a.inner.env, other);  // same table: copied whatever the name
@@ -129,22 +129,21 @@ TEST(ConfigType, AssignmentByName) {
 
     // A scalar of another type warns and keeps the target.
     ox::OXCType<int32_t> intSource("bias", 3);
-    CaptureStdout();
-    ox::assign(target.bias, intSource);
-    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error when assigning variable bias"), 1);
+    EXPECT_EQ(countOf(captured([&] { ox::assign(target.bias, intSource); }),
+                      "Type error when assigning variable bias"),
+              1);
     EXPECT_FLOAT_EQ(target.bias.get(), 0.005f);
 
     // Vector entries must have the target's element type.
     ox::OXCTypedVector<std::string> strings("targets");
     strings.push("not a target");
-    CaptureStdout();
-    ox::assign(target.targets, strings);
-    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error when assigning variable targets"), 1);
+    EXPECT_EQ(countOf(captured([&] { ox::assign(target.targets, strings); }),
+                      "Type error when assigning variable targets"),
+              1);
     EXPECT_EQ(target.targets.size(), 1u);
     ox::OXCType<int32_t> wrongEntry("element", 1);
-    CaptureStdout();
-    EXPECT_FALSE(target.files.add(wrongEntry));
-    EXPECT_EQ(countOf(GetCapturedStdout(), "Type error"), 1);
+    EXPECT_EQ(countOf(captured([&] { EXPECT_FALSE(target.files.add(wrongEntry)); }), "Type error"),
+              1);
     // Members the target lacks: see VectorEntriesAlwaysHaveTheElementClass.
 }
 
@@ -181,18 +180,14 @@ TEST(ConfigType, VectorEntriesAlwaysHaveTheElementClass) {
     one.extra = 5;
     ASSERT_TRUE(lookAlikes.add(one));
     All all;
-    CaptureStdout();
-    ox::assign(all.targets, lookAlikes);
-    EXPECT_EQ(
-        countOf(GetCapturedStdout(), "Unknown target for assignment extra in complex type Target"),
-        1);
+    EXPECT_EQ(countOf(captured([&] { ox::assign(all.targets, lookAlikes); }),
+                      "Unknown target for assignment extra in complex type Target"),
+              1);
     ASSERT_EQ(all.targets.size(), 1u);
     EXPECT_EQ(all.targets[0].name.get(), "converted");
     EXPECT_NE(dynamic_cast<TargetBase *>(&all.targets.element(0)), nullptr);
 
-    CaptureStdout();
-    EXPECT_TRUE(all.targets.append(one.clone()));
-    GetCapturedStdout();
+    captured([&] { EXPECT_TRUE(all.targets.append(one.clone())); });
     EXPECT_NE(dynamic_cast<TargetBase *>(&all.targets.element(1)), nullptr);
     EXPECT_EQ(all.targets[1].name.get(), "converted");
 

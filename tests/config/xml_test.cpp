@@ -55,7 +55,7 @@ void fillEverything(All &a) {
 
 }  // namespace
 
-TEST_F(ConfigXml, WriteReadWriteGivesIdenticalFiles) {
+TEST_F(ConfigXml, WrittenFilesReadBackIdenticallyAndValidate) {
     Root original;
     fillEverything(original.all);
     ASSERT_TRUE(ox::writeSettings("a.xml", original));
@@ -78,6 +78,22 @@ TEST_F(ConfigXml, WriteReadWriteGivesIdenticalFiles) {
     EXPECT_NE(a.find("<mode>VertexBake</mode>"), std::string::npos);
     EXPECT_NE(a.find("<bias>0.33333334</bias>"), std::string::npos);
     EXPECT_NE(a.find("<rays>4000000000</rays>"), std::string::npos);
+
+    // The schema: a documented scalar's type comes before its annotation; the file validates
+    // and an invalid enumeration name does not.
+    EXPECT_EQ(
+        captured([&] { EXPECT_TRUE(ox::writeSchema("a.xsd", original)); }).find("undocumented"),
+        std::string::npos);
+    std::string xsd = readFile("a.xsd");
+    EXPECT_NE(xsd.find("<xsd:element name=\"bias\" type=\"xsd:float\">"), std::string::npos);
+    EXPECT_NE(xsd.find("<xsd:documentation xml:lang=\"en\">A float</xsd:documentation>"),
+              std::string::npos);
+    EXPECT_NE(xsd.find("<xsd:enumeration value=\"SuperSampling\"/>"), std::string::npos);
+    EXPECT_NE(xsd.find("name=\"rays\" type=\"xsd:nonNegativeInteger\""), std::string::npos);
+    EXPECT_EQ(std::system("xmllint --noout --schema a.xsd a.xml > lint.txt 2>&1"), 0)
+        << readFile("lint.txt");
+    writeFile("bad.xml", std::string(a).replace(a.find("VertexBake"), 10, "Nope"));
+    EXPECT_NE(std::system("xmllint --noout --schema a.xsd bad.xml > lint2.txt 2>&1"), 0);
 
     // Reading again into a tree that has entries appends after them.
     ASSERT_TRUE(ox::loadSettings("a.xml", loaded));
@@ -108,9 +124,9 @@ TEST_F(ConfigXml, PartialFilesWarnAndKeepDefaults) {
   </All>
 </AnyRootName>)");
     Root b;
-    CaptureStdout();
-    ASSERT_TRUE(ox::loadSettings("bad.xml", b));
-    std::string out = GetCapturedStdout();
+    bool loaded = false;
+    std::string out = captured([&] { loaded = ox::loadSettings("bad.xml", b); });
+    ASSERT_TRUE(loaded);
     for (const std::string node : {"Alll", "bogus", "item", "w", "r"})  // r: a fifth matrix row
         EXPECT_EQ(countOf(out, "Warning, unknown node: " + node + "\n"), 1) << node;
     EXPECT_EQ(countOf(out, "Warning, could not set value Sampled for enum sampling"), 1);
@@ -150,9 +166,8 @@ TEST_F(ConfigXml, XIncludeIsRelativeToTheCurrentDirectoryOnEveryThread) {
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>7</count>"
               "<xi:include href=\"part.xml\"/></All></OXConfig>");
     Root r;
-    CaptureStdout();
-    ASSERT_TRUE(ox::loadSettings("sub/main.xml", r));
-    EXPECT_EQ(countOf(GetCapturedStdout(), "Did XInclude inclusions"), 1);
+    std::string out = captured([&] { EXPECT_TRUE(ox::loadSettings("sub/main.xml", r)); });
+    EXPECT_EQ(countOf(out, "Did XInclude inclusions"), 1);
     EXPECT_FLOAT_EQ(r.all.inner.gamma.get(), 3.5f);
 
     std::atomic<int> good{0};
@@ -176,19 +191,15 @@ TEST_F(ConfigXml, XIncludeIsRelativeToTheCurrentDirectoryOnEveryThread) {
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>9</count>"
               "<xi:include href=\"nothere.xml\"/></All></OXConfig>");
     Root m;
-    CaptureStdout();
-    EXPECT_FALSE(ox::loadSettings("miss.xml", m));
-    EXPECT_EQ(countOf(GetCapturedStdout(), "XInclude processing failed"), 1);
+    out = captured([&] { EXPECT_FALSE(ox::loadSettings("miss.xml", m)); });
+    EXPECT_EQ(countOf(out, "XInclude processing failed"), 1);
     EXPECT_EQ(m.all.count.get(), -2);
 }
 
 TEST_F(ConfigXml, HostileFilesFailCleanly) {
     Root r;
     auto failsWith = [&](const std::string &file, const std::string &text) {
-        CaptureStdout();
-        bool ok = ox::loadSettings(file, r);
-        std::string out = GetCapturedStdout();
-        EXPECT_FALSE(ok) << file;
+        std::string out = captured([&] { EXPECT_FALSE(ox::loadSettings(file, r)) << file; });
         EXPECT_NE(out.find(text), std::string::npos) << file << ": " << out;
     };
     failsWith("missing.xml", "Error opening file missing.xml in xmlsource");
@@ -218,9 +229,8 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
                             "</OXConfig>"));
     Root e;
     auto t0 = std::chrono::steady_clock::now();
-    CaptureStdout();
-    bool ok = ox::loadSettings("laughs.xml", e);
-    GetCapturedStdout();
+    bool ok = false;
+    captured([&] { ok = ox::loadSettings("laughs.xml", e); });
     EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(20));
     if (ok) {
         EXPECT_EQ(e.all.camera.get(), "xy");
@@ -233,26 +243,23 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
               "<?xml version=\"1.0\"?><!DOCTYPE r SYSTEM \"nothere.dtd\" [<!ENTITY s SYSTEM "
               "\"secret.txt\">]><OXConfig><All><camera>&s;</camera></All></OXConfig>");
     Root x;
-    CaptureStdout();
-    ok = ox::loadSettings("ext.xml", x);
-    GetCapturedStdout();
+    captured([&] { ox::loadSettings("ext.xml", x); });
     EXPECT_EQ(x.all.camera.get().find("SECRET"), std::string::npos);
 
     // XInclude of a device is refused, not read forever.
     writeFile("dev.xml",
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All>"
               "<xi:include href=\"/dev/zero\" parse=\"text\"/></All></OXConfig>");
-    CaptureStdout();
-    EXPECT_FALSE(ox::loadSettings("dev.xml", x));
-    GetCapturedStdout();
+    captured([&] { EXPECT_FALSE(ox::loadSettings("dev.xml", x)); });
 }
 
 TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
     Root r;
     writeFile("keep.xml", "precious");
-    CaptureStdout();
-    EXPECT_FALSE(ox::writeSettings("keep.xml", r, "NO-SUCH-ENCODING"));
-    EXPECT_NE(GetCapturedStdout().find("Error starting xml document"), std::string::npos);
+    EXPECT_NE(captured([&] {
+                  EXPECT_FALSE(ox::writeSettings("keep.xml", r, "NO-SUCH-ENCODING"));
+              }).find("Error starting xml document"),
+              std::string::npos);
     EXPECT_EQ(readFile("keep.xml"), "precious");
 
     CaptureStdout();
@@ -262,17 +269,15 @@ TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
     EXPECT_NE(GetCapturedStdout().find("Error creating xml writer"), std::string::npos);
 
     fs::create_directories("target_is_dir");
-    CaptureStdout();
-    EXPECT_FALSE(ox::writeSettings("target_is_dir", r));
-    GetCapturedStdout();
+    captured([&] { EXPECT_FALSE(ox::writeSettings("target_is_dir", r)); });
     EXPECT_TRUE(fs::is_directory("target_is_dir"));
 
     // Text that XML cannot carry is refused, not written into an unreadable file.
     for (const char *text : {"a\x01z", "bad \xff utf8", "\xc0\x80", "\xed\xa0\x80"}) {
         r.all.camera = text;
-        CaptureStdout();
-        EXPECT_FALSE(ox::writeSettings("keep.xml", r));
-        EXPECT_NE(GetCapturedStdout().find("the value of camera is not UTF-8 text"),
+        EXPECT_NE(captured([&] {
+                      EXPECT_FALSE(ox::writeSettings("keep.xml", r));
+                  }).find("the value of camera is not UTF-8 text"),
                   std::string::npos);
         EXPECT_EQ(readFile("keep.xml"), "precious");
     }
@@ -286,29 +291,6 @@ TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
     for (const auto &e : fs::directory_iterator(".")) {  // no temporary files left behind
         EXPECT_EQ(e.path().filename().string().find(".tmp"), std::string::npos);
     }
-}
-
-TEST_F(ConfigXml, SchemaValidatesTheWrittenConfiguration) {
-    Root r;
-    fillEverything(r.all);
-    ASSERT_TRUE(ox::writeSettings("config.xml", r));
-    CaptureStdout();
-    ASSERT_TRUE(ox::writeSchema("config.xsd", r));
-    EXPECT_EQ(GetCapturedStdout().find("undocumented"), std::string::npos);
-    std::string xsd = readFile("config.xsd");
-    // The type of a documented scalar comes before its annotation.
-    EXPECT_NE(xsd.find("<xsd:element name=\"bias\" type=\"xsd:float\">"), std::string::npos);
-    EXPECT_NE(xsd.find("<xsd:documentation xml:lang=\"en\">A float</xsd:documentation>"),
-              std::string::npos);
-    EXPECT_NE(xsd.find("<xsd:enumeration value=\"SuperSampling\"/>"), std::string::npos);
-    EXPECT_NE(xsd.find("name=\"rays\" type=\"xsd:nonNegativeInteger\""), std::string::npos);
-    int rc = std::system("xmllint --noout --schema config.xsd config.xml > lint.txt 2>&1");
-    EXPECT_EQ(rc, 0) << readFile("lint.txt");
-    // An invalid enumeration name is caught by the schema.
-    std::string bad = readFile("config.xml");
-    writeFile("bad.xml", bad.replace(bad.find("VertexBake"), 10, "Nope"));
-    rc = std::system("xmllint --noout --schema config.xsd bad.xml > lint2.txt 2>&1");
-    EXPECT_NE(rc, 0);
 }
 
 // ---- streaming -------------------------------------------------------------------------------
@@ -355,9 +337,7 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
         "<Samples>many</Samples><EnvironmentType> BALL </EnvironmentType></Thing>\n"
         "</OXScene>\n";
     gLive = gMaxLive = 0;
-    CaptureStdout();
-    ASSERT_TRUE(sax.parseMemory(doc));
-    std::string out = GetCapturedStdout();
+    std::string out = captured([&] { EXPECT_TRUE(sax.parseMemory(doc)); });
     ASSERT_EQ(names.size(), 51u);
     EXPECT_EQ(names[7], "t7");
     EXPECT_EQ(tx[7], 7.0f);
@@ -373,15 +353,16 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
 
     // Another document element: nothing is read.
     names.clear();
-    CaptureStdout();
-    EXPECT_TRUE(sax.parseMemory("<Scene><Thing><Name>n</Name></Thing></Scene>"));
-    EXPECT_EQ(countOf(GetCapturedStdout(), "[XMLSAXParser] Unknown node: Scene"), 1);
+    out = captured(
+        [&] { EXPECT_TRUE(sax.parseMemory("<Scene><Thing><Name>n</Name></Thing></Scene>")); });
+    EXPECT_EQ(countOf(out, "[XMLSAXParser] Unknown node: Scene"), 1);
     EXPECT_TRUE(names.empty());
 
     // A malformed document fails after delivering what came before the fault.
-    CaptureStdout();
-    EXPECT_FALSE(sax.parseMemory("<OXScene><Thing><Name>ok</Name></Thing><Thing></OXScene>"));
-    EXPECT_NE(GetCapturedStdout().find("Error parsing file"), std::string::npos);
+    out = captured([&] {
+        EXPECT_FALSE(sax.parseMemory("<OXScene><Thing><Name>ok</Name></Thing><Thing></OXScene>"));
+    });
+    EXPECT_NE(out.find("Error parsing file"), std::string::npos);
     EXPECT_EQ(names, std::vector<std::string>{"ok"});
     EXPECT_EQ(gLive, 0);
 
@@ -395,20 +376,20 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
     // Files: a directory is refused, a real file streams.
     writeFile("scene.xml", doc);
     names.clear();
-    CaptureStdout();
-    EXPECT_TRUE(sax.parseFile("scene.xml"));
-    EXPECT_FALSE(sax.parseFile("."));
-    GetCapturedStdout();
+    captured([&] {
+        EXPECT_TRUE(sax.parseFile("scene.xml"));
+        EXPECT_FALSE(sax.parseFile("."));
+    });
     EXPECT_EQ(names.size(), 51u);
 
     // Declared and external entities are never expanded, predefined ones are.
     writeFile("secret.txt", "SECRET");
     names.clear();
-    CaptureStdout();
-    sax.parseMemory(
-        billionLaughs("OXScene SYSTEM \"none.dtd\"", "<!ENTITY s SYSTEM \"secret.txt\">",
-                      "<OXScene><Thing><Name>x&a29;&s;&amp;y</Name></Thing></OXScene>"));
-    GetCapturedStdout();
+    captured([&] {
+        sax.parseMemory(
+            billionLaughs("OXScene SYSTEM \"none.dtd\"", "<!ENTITY s SYSTEM \"secret.txt\">",
+                          "<OXScene><Thing><Name>x&a29;&s;&amp;y</Name></Thing></OXScene>"));
+    });
     ASSERT_LE(names.size(), 1u);
     EXPECT_EQ(names.empty() ? "x&y" : names[0], "x&y");  // a refused document reads nothing
     EXPECT_EQ(gLive, 0);
@@ -423,9 +404,7 @@ TEST_F(ConfigXml, InputListsAppendTheirEntries) {
     ASSERT_TRUE(ox::loadInputList("l1.xml", files));
     ASSERT_TRUE(ox::loadInputList("l2.xml", files));
     EXPECT_EQ(files, (std::vector<std::string>{"direct.xml", "a.xml", "b.vtm", "c.xml"}));
-    CaptureStdout();
-    EXPECT_FALSE(ox::loadInputList("missing.xml", files));
-    GetCapturedStdout();
+    captured([&] { EXPECT_FALSE(ox::loadInputList("missing.xml", files)); });
     EXPECT_EQ(files.size(), 4u);
 }
 
@@ -457,14 +436,12 @@ TEST_F(ConfigXml, WholeConfigurationWithEveryVectorFilledRoundTrips) {
     EXPECT_GT(added, 10);
     ASSERT_TRUE(ox::writeSettings("full.xml", config));
     ox::OXConfig loaded;
-    CaptureStdout();
-    ASSERT_TRUE(ox::loadSettings("full.xml", loaded));
-    EXPECT_EQ(GetCapturedStdout().find("[WARNING]"), std::string::npos);
+    EXPECT_EQ(
+        captured([&] { EXPECT_TRUE(ox::loadSettings("full.xml", loaded)); }).find("[WARNING]"),
+        std::string::npos);
     ASSERT_TRUE(ox::writeSettings("again.xml", loaded));
     EXPECT_EQ(readFile("full.xml"), readFile("again.xml"));
-    CaptureStdout();
-    ASSERT_TRUE(ox::writeSchema("full.xsd", config));
-    const std::string printed = GetCapturedStdout();
+    const std::string printed = captured([&] { EXPECT_TRUE(ox::writeSchema("full.xsd", config)); });
     // 36 keys have no text (one of them in both RNMSettings); one more means a lost text.
     EXPECT_EQ(countOf(printed, " is undocumented"), 36) << printed;
     EXPECT_EQ(countOf(printed, "Attribute cosLobeExponent in type RNMSettings is undocumented"), 2);
