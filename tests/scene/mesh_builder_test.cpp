@@ -108,12 +108,11 @@ TEST(MeshBuilder, RepairsNormalsAndUvs) {
 TEST(MeshBuilder, WeldsByDistanceAndAttributes) {
     auto build = [](float offset, Vec2 uv, Color color, Vec3 normal, float threshold) {
         MeshMaker m("w", 1, true);
-        uint32_t a = m.vertex({0, 0, 0}, {0, 0, 1}, {}, {}, {1, 1, 1, 1}, {{0, 0}});
-        uint32_t b = m.vertex({1, 0, 0}, {0, 0, 1}, {}, {}, {1, 1, 1, 1}, {{1, 0}});
-        uint32_t c = m.vertex({0, 1, 0}, {0, 0, 1}, {}, {}, {1, 1, 1, 1}, {{0, 1}});
+        // White corners a, b, c, d with UV = (x, y), and b2 near b with the attributes given.
+        for (Vec3 p : {Vec3(0, 0, 0), Vec3(1, 0, 0), Vec3(0, 1, 0), Vec3(1, 1, 0)})
+            m.vertex(p, {0, 0, 1}, {}, {}, {1, 1, 1, 1});
         uint32_t b2 = m.vertex({1 + offset, 0, 0}, normal, {}, {}, color, {uv});
-        uint32_t d = m.vertex({1, 1, 0}, {0, 0, 1}, {}, {}, {1, 1, 1, 1}, {{1, 1}});
-        m.group("a", {a, b, c, b2, d, c});
+        m.group("a", {0, 1, 2, b2, 3, 2});
         MeshBuildOptions o;
         o.mergeThreshold = threshold;
         Built r = buildMesh(m.mesh, o);
