@@ -6,7 +6,6 @@
 
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 
 #include "app/command_line.h"
 #include "app/run.h"
@@ -14,11 +13,13 @@
 #include "config/settings_checks.h"
 #include "config/xml.h"
 #include "core/message.h"
+#include "tests/app/app_test_util.h"
 #include "tests/support/test_support.h"
 
 namespace fs = std::filesystem;
 using testing::internal::CaptureStdout;
 using testing::internal::GetCapturedStdout;
+using apptest::readFile;
 
 namespace {
 
@@ -28,36 +29,6 @@ protected:
     static void write(const std::string &name, const std::string &text) {
         std::ofstream(name, std::ios::binary) << text;
     }
-    static std::string read(const fs::path &p) {
-        std::ifstream in(p, std::ios::binary);
-        std::stringstream s;
-        s << in.rdbuf();
-        return s.str();
-    }
-};
-
-/// Remembers what the run handed over and the tree behind it.
-struct Recorder : ox::RunDriverInterface {
-    int32_t run(int32_t a, ox::RunContext &c) override {
-        action = a;
-        format = c.format;
-        threads = c.renderThreads;
-        config = ox::configurationOf(c.settings);
-        if (config) {
-            fgFile = config->GISettings.fgFile();
-            fgUseLegacy = config->GISettings.fgUseLegacy();
-            renderThreads = config->FrameSettings.renderThreads();
-            tileSize = config->FrameSettings.tileSize();
-        }
-        return 0;
-    }
-    int32_t action = -1, format = -1;
-    int64_t threads = -1;
-    const ox::OXConfig *config = nullptr;
-    std::string fgFile;
-    bool fgUseLegacy = false;
-    uint32_t renderThreads = 0;
-    ox::Vec2i tileSize;
 };
 
 }  // namespace
@@ -71,18 +42,18 @@ TEST_F(ConfigRun, TheRunReadsWritesBackAndCorrectsTheLoadedFile) {
   </outputVerbosity></FrameSettings>
   <GISettings><fgFile>cache</fgFile><ptFile></ptFile></GISettings>
   <AOSettings><aoFile>occ</aoFile></AOSettings></OXConfig>)");
-    auto driver = std::make_shared<Recorder>();
+    auto driver = std::make_shared<apptest::RecordingDriver>();
     ox::RunEnvironment env = ox::defaultRunEnvironment();
     env.drivers.set(ox::kActionVertexBake, driver);
     CaptureStdout();
     const int32_t status = ox::runThevorn({"thevorn", "s.xml", "-x", "cfg.xml", "-od", "out"}, env);
     const std::string out = GetCapturedStdout();
     EXPECT_EQ(status, 0) << out;
-    EXPECT_EQ(driver->action, ox::kActionVertexBake);  // from renderType
-    EXPECT_EQ(driver->format, ox::kFormatExr);         // PPM without a format option
-    EXPECT_EQ(driver->threads, 3);                     // autoThreads off
-    ASSERT_NE(driver->config, nullptr);
-    EXPECT_EQ(driver->renderThreads, 3u);
+    EXPECT_EQ(driver->actions.back(), ox::kActionVertexBake);  // from renderType
+    EXPECT_EQ(driver->format, ox::kFormatExr);                 // PPM without a format option
+    EXPECT_EQ(driver->threads, 3);                             // autoThreads off
+    ASSERT_TRUE(driver->configured);
+    EXPECT_EQ(driver->renderThreads, 3);
     EXPECT_EQ(driver->fgFile, "out/GI/fgMaps/cache");
     EXPECT_TRUE(driver->fgUseLegacy);
     EXPECT_EQ(driver->tileSize, ox::Vec2i(32, 32));
@@ -92,30 +63,31 @@ TEST_F(ConfigRun, TheRunReadsWritesBackAndCorrectsTheLoadedFile) {
         << out;
     // The configuration's filters and debug file are in force from the output tree on.
     EXPECT_TRUE(ox::isTypeEnabled(ox::kMsgVerbose));
-    const std::string debug = read("out/debug.out");
+    const std::string debug = readFile("out/debug.out");
     EXPECT_NE(debug.find("KESTRIN RENDERER DEBUG MESSAGES"), std::string::npos);
 
     // An action option wins and is written back; -rt overrides the configured count.
-    driver->config = nullptr;
+    driver->configured = false;
     env.drivers.set(ox::kActionTextureBake, driver);
     CaptureStdout();
     EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-x", "cfg.xml", "-b", "-rt", "5", "-j"}, env),
               0);
     GetCapturedStdout();
-    EXPECT_EQ(driver->action, ox::kActionTextureBake);
+    EXPECT_EQ(driver->actions.back(), ox::kActionTextureBake);
+    EXPECT_EQ(driver->renderType, 1);  // written back
     EXPECT_EQ(driver->format, ox::kFormatJpeg);
-    EXPECT_EQ(driver->renderThreads, 5u);
-    ASSERT_NE(driver->config, nullptr);
+    EXPECT_EQ(driver->renderThreads, 5);
+    EXPECT_TRUE(driver->configured);
 }
 
 TEST_F(ConfigRun, DefaultsWrittenByTheProgramValidateAndReadBackUnchanged) {
     const std::string program = OX_BINARY_DIR "/app/thevorn";
     ASSERT_EQ(std::system((program + " -c > c.txt && " + program + " -xs > xs.txt").c_str()), 0);
     ASSERT_EQ(std::system("xmllint --noout --schema config.xsd config.xml > lint.txt 2>&1"), 0)
-        << read("lint.txt");
+        << readFile("lint.txt");
     // The program reads its own file without a word (the run then stops: no driver here).
     std::system((program + " s.xml -x config.xml -od out > x.txt").c_str());
-    EXPECT_EQ(read("x.txt").find("arning"), std::string::npos) << read("x.txt");
+    EXPECT_EQ(readFile("x.txt").find("arning"), std::string::npos) << readFile("x.txt");
     EXPECT_TRUE(fs::is_directory("out/GI/fgMaps"));
 
     ox::ConfigRunSettings settings;
@@ -124,7 +96,7 @@ TEST_F(ConfigRun, DefaultsWrittenByTheProgramValidateAndReadBackUnchanged) {
     EXPECT_EQ(GetCapturedStdout(), "");
     std::string again;
     ASSERT_TRUE(ox::writeSettingsToString(again, settings.config()));
-    EXPECT_EQ(again, read("config.xml"));
+    EXPECT_EQ(again, readFile("config.xml"));
 }
 
 TEST_F(ConfigRun, NumbersThatWouldBreakARunAreReset) {

@@ -6,56 +6,20 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <filesystem>
 #include <fstream>
-#include <sstream>
 
 #include "app/exit_status.h"
 #include "core/message.h"
+#include "tests/app/app_test_util.h"
 #include "tests/support/test_support.h"
-
-namespace fs = std::filesystem;
 
 namespace {
 
-/// Runs the tests of one case in a fresh temporary directory and returns to the old one.
+using apptest::RecordingDriver;
+
 class RunTest : public oxtest::TempDirTest {
 protected:
     RunTest() : TempDirTest("ox_run_test_") {}
-};
-
-std::string readAll(const fs::path &p) {
-    std::ifstream in(p, std::ios::binary);
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
-/// A driver that remembers what it was given.
-struct RecordingDriver : ox::RunDriverInterface {
-    int32_t run(int32_t action, ox::RunContext &c) override {
-        actions.push_back(action);
-        baseName = c.outputBaseName;
-        directory = c.outputDirectory;
-        format = c.format;
-        threads = c.renderThreads;
-        // The settings live only as long as the run, so the driver looks at them now.
-        if (auto *d = dynamic_cast<ox::DefaultRunSettings *>(&c.settings)) {
-            fgUseLegacy = d->fgUseLegacy;
-            renderType = d->renderTypeValue;
-        }
-        c.statistics.beginPass("beauty");
-        c.progress.setProgress(1.0f);
-        c.progress.finish();
-        return result;
-    }
-    std::vector<int32_t> actions;
-    std::string baseName, directory;
-    int32_t format = -1;
-    int64_t threads = -1;
-    bool fgUseLegacy = false;
-    int32_t renderType = -1;
-    int32_t result = 0;
 };
 
 TEST(ExitStatus, LowByteMapping) {
@@ -97,36 +61,32 @@ TEST(RunSteps, ActionsFromAndIntoRenderType) {
     EXPECT_EQ(ox::resolveFileFormat(ox::kFormatJpeg, 7), ox::kFormatJpeg);
 }
 
-TEST(RunSteps, ThreadCountsAreClampedIn64Bits) {
+TEST(RunSteps, ThreadCountsAreClampedIn64BitsAndWrittenBack) {
     ox::resetMessageFilters();
-    ox::DefaultRunSettings s;
-    s.autoThreadsSubtractValue = 10;
-    testing::internal::CaptureStdout();
-    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 1);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(),
-              "[INFO]     Detected 8 cores, using 1 cores\n");
-    EXPECT_EQ(s.renderThreadsValue, 1);
-
-    s.autoThreadsSubtractValue = 4294967295LL;  // the largest unsigned setting
-    testing::internal::CaptureStdout();
-    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 1);
-    testing::internal::GetCapturedStdout();
-
-    s.autoThreadsValue = false;
-    s.renderThreadsValue = 6;
-    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 6);
-    s.renderThreadsValue = 0;
-    testing::internal::CaptureStdout();
-    EXPECT_EQ(ox::resolveRenderThreads(-1, s, 8), 1);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(),
-              "[WARNING]  The render thread count 0 is outside 1 to 1024, using 1\n");
-    s.autoThreadsValue = true;  // -rt wins over autoThreads
-    testing::internal::CaptureStdout();
-    EXPECT_EQ(ox::resolveRenderThreads(5000000000LL, s, 8), 1024);
-    EXPECT_EQ(ox::resolveRenderThreads(3, s, 8), 3);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(),
-              "[WARNING]  The render thread count 5000000000 is outside 1 to 1024, using 1024\n");
-    EXPECT_EQ(s.renderThreadsValue, 3);
+    const std::string outside = "[WARNING]  The render thread count ";
+    const struct {
+        int64_t option, subtract;  // -rt (-1: none) and autoThreadsSubtract
+        bool autoThreads;
+        int64_t configured, want;
+        std::string printed;
+    } cases[] = {
+        {-1, 10, true, 0, 1, "[INFO]     Detected 8 cores, using 1 cores\n"},
+        {-1, 4294967295LL, true, 0, 1, "[INFO]     Detected 8 cores, using 1 cores\n"},
+        {-1, 0, false, 6, 6, ""},
+        {-1, 0, false, 0, 1, outside + "0 is outside 1 to 1024, using 1\n"},
+        {0, 0, true, 6, 1, outside + "0 is outside 1 to 1024, using 1\n"},  // -rt wins
+        {5000000000LL, 0, true, 6, 1024, outside + "5000000000 is outside 1 to 1024, using 1024\n"},
+        {3, 0, true, 6, 3, ""}};
+    for (const auto &c : cases) {
+        ox::DefaultRunSettings s;
+        s.autoThreadsSubtractValue = c.subtract;
+        s.autoThreadsValue = c.autoThreads;
+        s.renderThreadsValue = c.configured;
+        testing::internal::CaptureStdout();
+        EXPECT_EQ(ox::resolveRenderThreads(c.option, s, 8), c.want) << c.option;
+        EXPECT_EQ(testing::internal::GetCapturedStdout(), c.printed);
+        EXPECT_EQ(s.renderThreadsValue, c.want);
+    }
 }
 
 TEST_F(RunTest, CacheFilesArePrefixedWithTheirFolder) {
@@ -236,7 +196,7 @@ TEST_F(RunTest, TheRunPlugsInDriversListsAndSettings) {
               std::string::npos)
         << out;
     // The output tree came first, so the debug file starts with its banner.
-    const std::string debug = readAll("out/debug.out");
+    const std::string debug = apptest::readFile("out/debug.out");
     EXPECT_EQ(debug.rfind(" +++++++++++++++ KESTRIN RENDERER DEBUG MESSAGES +++++++++++ \n", 0),
               0u);
     EXPECT_NE(debug.find("[PROGRESS] Progress 100.0%\n"), std::string::npos);
