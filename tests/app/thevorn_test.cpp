@@ -1,9 +1,11 @@
 // Runs the built program the way a user does and checks exit codes, console text and files.
 #include <gtest/gtest.h>
 
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 
+#include "tests/app/app_test_util.h"
 #include "tests/support/test_support.h"
 
 namespace fs = std::filesystem;
@@ -88,7 +90,11 @@ TEST_F(Thevorn, WritesDefaultsAndSchemaAsked) {
     r = run({"-xs", "-q"});
     EXPECT_EQ(r.status, 0);
     EXPECT_TRUE(has(r, "[PROGRESS] Writing a default xml schema file (config.xsd)\n"));
-    EXPECT_TRUE(fs::is_regular_file(dir_ / "config.xsd"));
+    // The files agree with each other, and the program reads its own file without a word.
+    EXPECT_EQ(std::system("xmllint --noout --schema config.xsd config.xml > lint.txt 2>&1"), 0)
+        << apptest::readFile("lint.txt");
+    r = run({"s.xml", "-x", "config.xml", "-od", "out"});
+    EXPECT_FALSE(has(r, "arning")) << r.output;
     // A directory in the way: the platform's error code (EISDIR = 21) is the exit code.
     fs::remove(dir_ / "config.xml");
     fs::create_directory(dir_ / "config.xml");
@@ -115,7 +121,8 @@ TEST_F(Thevorn, LinesThatLetTheRunGoOnTheOutputTreeAndStatuses) {
     for (const std::string file : {"missing.xml", "broken.xml", "."}) {
         r = run({"scene.xml", "-x", file});
         EXPECT_EQ(r.status, 3) << file;  // status 0x20000003
-        EXPECT_TRUE(has(r, "[ERROR]    Unable to load settings from file " + file + "\n")) << r.output;
+        EXPECT_TRUE(has(r, "[ERROR]    Unable to load settings from file " + file + "\n"))
+            << r.output;
     }
     EXPECT_FALSE(fs::exists(dir_ / "GI"));  // nothing prepared for a run that cannot start
 

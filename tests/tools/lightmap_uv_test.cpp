@@ -85,6 +85,23 @@ bool overlap(const Vec2 *a, const Vec2 *b) {
     return true;
 }
 
+// Texel boxes (inclusive x0, y0, x1, y1) keep `pad` texels from each other and from the low
+// border, and from the high border too but for `slack` texels.
+void expectGutters(const std::vector<std::array<int, 4>> &boxes, int pad, int res, int slack) {
+    for (size_t a = 0; a < boxes.size(); ++a) {
+        const auto &p = boxes[a];
+        EXPECT_TRUE(p[0] >= pad && p[1] >= pad && p[2] + pad < res + slack &&
+                    p[3] + pad < res + slack)
+            << a;
+        for (size_t b = a + 1; b < boxes.size(); ++b) {
+            const auto &q = boxes[b];
+            EXPECT_TRUE(q[0] - p[2] - 1 >= pad || p[0] - q[2] - 1 >= pad ||
+                        q[1] - p[3] - 1 >= pad || p[1] - q[3] - 1 >= pad)
+                << a << " " << b;
+        }
+    }
+}
+
 // Checks what every layout must hold: UVs inside the square, no two triangles overlapping,
 // and charts at least `padding` whole texels apart (and from the border).
 void checkLayout(const Mesh &m, const ox::LightmapOptions &o, const ox::LightmapLayout &l) {
@@ -96,7 +113,7 @@ void checkLayout(const Mesh &m, const ox::LightmapOptions &o, const ox::Lightmap
     for (size_t a = 0; a < tris; ++a)
         for (size_t b = a + 1; b < tris; ++b)
             EXPECT_FALSE(overlap(&l.cornerUVs[3 * a], &l.cornerUVs[3 * b])) << a << " " << b;
-    // Texel ranges each chart touches.
+    // Texel ranges each chart touches (a corner on a texel's far edge counts in the next one).
     const float res = float(o.resolution);
     std::vector<std::array<int, 4>> range(l.chartCount, {1 << 30, 1 << 30, -1, -1});
     for (size_t t = 0; t < tris; ++t)
@@ -107,17 +124,7 @@ void checkLayout(const Mesh &m, const ox::LightmapOptions &o, const ox::Lightmap
             r[0] = std::min(r[0], x), r[1] = std::min(r[1], y);
             r[2] = std::max(r[2], x), r[3] = std::max(r[3], y);
         }
-    for (uint32_t a = 0; a < l.chartCount; ++a) {
-        EXPECT_GE(range[a][0], o.padding);
-        EXPECT_GE(range[a][1], o.padding);
-        EXPECT_LT(range[a][2], o.resolution - o.padding + 1);
-        for (uint32_t b = a + 1; b < l.chartCount; ++b) {
-            const auto &p = range[a], &q = range[b];
-            bool apart = q[0] - p[2] - 1 >= o.padding || p[0] - q[2] - 1 >= o.padding ||
-                         q[1] - p[3] - 1 >= o.padding || p[1] - q[3] - 1 >= o.padding;
-            EXPECT_TRUE(apart) << "charts " << a << " and " << b;
-        }
-    }
+    expectGutters(range, o.padding, o.resolution, 1);
 }
 
 }  // namespace
@@ -213,27 +220,16 @@ TEST(LightmapUv, PackedRectanglesKeepTheirGutters) {
     const int res = 128, pad = 3;
     const float scale = 2.0f;
     ASSERT_TRUE(ox::packRectangles(rects, scale, res, pad));
-    // Texel extent of a placed block's content, turned when the packer turned it.
-    auto extent = [&](const ox::PackRect &r) {
-        int w = int(std::floor(r.width * scale)) + 1, h = int(std::floor(r.height * scale)) + 1;
-        return r.rotated ? std::pair(h, w) : std::pair(w, h);
-    };
+    // Texel boxes of the placed blocks' content, turned when the packer turned it.
+    std::vector<std::array<int, 4>> boxes;
     int turned = 0;
-    for (size_t a = 0; a < rects.size(); ++a) {
-        const auto [w, h] = extent(rects[a]);
-        turned += rects[a].rotated;
-        EXPECT_GE(rects[a].x, pad);
-        EXPECT_GE(rects[a].y, pad);
-        EXPECT_LE(rects[a].x + w + pad, res);
-        EXPECT_LE(rects[a].y + h + pad, res);
-        for (size_t b = a + 1; b < rects.size(); ++b) {
-            const auto [wb, hb] = extent(rects[b]);
-            bool apart = rects[b].x >= rects[a].x + w + pad ||
-                         rects[a].x >= rects[b].x + wb + pad ||
-                         rects[b].y >= rects[a].y + h + pad || rects[a].y >= rects[b].y + hb + pad;
-            EXPECT_TRUE(apart) << a << " " << b;
-        }
+    for (const ox::PackRect &r : rects) {
+        int w = int(std::floor(r.width * scale)) + 1, h = int(std::floor(r.height * scale)) + 1;
+        if (r.rotated) std::swap(w, h);
+        boxes.push_back({r.x, r.y, r.x + w - 1, r.y + h - 1});
+        turned += r.rotated;
     }
+    expectGutters(boxes, pad, res, 0);
     EXPECT_GT(turned, 0);  // this mix of shapes packs better with some blocks turned
     EXPECT_FALSE(ox::packRectangles(rects, 100.0f, res, pad));
 }
