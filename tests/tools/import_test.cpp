@@ -38,11 +38,9 @@ void writeText(const fs::path &p, const std::string &text) {
     std::ofstream(p, std::ios::binary) << text;
 }
 
-size_t countOf(const std::string &text, const std::string &what) {
-    size_t n = 0;
-    for (size_t pos = text.find(what); pos != std::string::npos; pos = text.find(what, pos + 1))
-        ++n;
-    return n;
+// Exactly one error line in a program's output.
+bool oneError(const std::string &out) {
+    return out.find("[ERROR]") != std::string::npos && out.find("[ERROR]") == out.rfind("[ERROR]");
 }
 
 // Each test runs in its own working directory, so files are named relative to it.
@@ -296,7 +294,7 @@ TEST_F(ImportTest, UnreadableModelGivesOneError) {
         EXPECT_EQ(r.status, c.status) << c.args;
         EXPECT_NE(r.output.find(c.text), std::string::npos) << r.output;
         // One error for a failure.
-        EXPECT_TRUE(c.status != ox::kImportFailed || countOf(r.output, "[ERROR]") == 1) << r.output;
+        EXPECT_TRUE(c.status != ox::kImportFailed || oneError(r.output)) << r.output;
     }
     EXPECT_FALSE(fs::exists("out"));
 
@@ -309,7 +307,7 @@ TEST_F(ImportTest, UnreadableModelGivesOneError) {
                   std::string(12, '\0'));
     RunResult r = runImport("huge.ply" + out);
     EXPECT_EQ(r.status, ox::kImportFailed);
-    EXPECT_EQ(countOf(r.output, "[ERROR]"), 1u) << r.output;
+    EXPECT_TRUE(oneError(r.output)) << r.output;
     EXPECT_NE(r.output.find("more memory than there is"), std::string::npos) << r.output;
 #endif
 }
