@@ -111,7 +111,6 @@ TEST_F(Thevorn, LinesThatLetTheRunGoOnTheOutputTreeAndStatuses) {
     EXPECT_TRUE(has(r, "Syntax error, abc is not a valid input to -rt\n"));
     EXPECT_TRUE(has(r, "Syntax error, x is not a valid priority (h, l or n).\n"));
     EXPECT_FALSE(has(r, "The render thread count"));  // a bad -rt leaves the automatic count
-    EXPECT_TRUE(has(r, "[INFO]     Detected "));
     EXPECT_TRUE(has(r, "[ERROR]    The camera render (-r) is not available"));
     EXPECT_FALSE(has(r, "[ERROR]    thevorn <scene.xml>"));
     for (const char *sub : {"", "/GI", "/GI/fgMaps", "/GI/ptMaps", "/GI/photonMaps", "/GI/occMaps"})
