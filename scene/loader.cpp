@@ -277,7 +277,7 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
         bool castShadows = false;
         auto light = createLight(r->light, castShadows);
         if (!light) continue;
-        const bool environment = r->light.type == int32_t(LightType::kEnvironment);
+        const bool environment = r->light.type == LightType::kEnvironment;
         if (environment && castShadows)
             scene.addShadowedEnvironmentLight(std::move(light), linkMode(r->lightLinkMode),
                                               r->lightLinkedInstances);

@@ -47,7 +47,7 @@ XMLGenericFactory<XMLLightSourceCompact, OXCComplexTypeInstantiator<XMLLightSour
     p.name = o.Name;
     p.color = o.Color;
     p.lowerColor = o.LowerColor;
-    p.type = o.Type.value();
+    p.type = static_cast<ox::LightType>(o.Type.value());
     p.castShadows = o.CastShadows;
     p.diffusePhotons = o.DiffusePhotons;
     p.specularPhotons = o.SpecularPhotons;
@@ -72,7 +72,7 @@ XMLGenericFactory<XMLLightSourceCompact, OXCComplexTypeInstantiator<XMLLightSour
     p.clampToIntensity = o.ClampToIntensity;
     p.shadowSamples = o.ShadowSamples;
     p.minShadowSamples = o.MinShadowSamples;
-    p.attenuationType = o.AttenuationType.value();
+    p.attenuationType = static_cast<ox::AttenuationType>(o.AttenuationType.value());
     p.objectToWorld = o.ObjectToWorld;
     c->lightLinkMode = o.LightLinkMode.value();
     c->lightLinkedInstances = o.LightLinkedInstances.values();

@@ -12,7 +12,8 @@ namespace ox {
 namespace {
 
 constexpr float kDegToRad = 0.017453292519943295f;
-constexpr uint32_t kMaxShadowSamples = 256;
+constexpr float kPi = 3.14159265358979f;
+constexpr uint32_t kMaxIblSubLights = 65536;
 
 BBox infiniteBox() {
     return BBox(Vec3(-FLT_MAX, -FLT_MAX, -FLT_MAX), Vec3(FLT_MAX, FLT_MAX, FLT_MAX));
@@ -38,7 +39,7 @@ float checkedCutoff(const LightParameters &p) {
 }
 
 std::unique_ptr<AttenuationSettings> makeAttenuation(const LightParameters &p, float cutoff) {
-    if (p.attenuationType == 1)
+    if (p.attenuationType == AttenuationType::kUnreal)
         return std::make_unique<UnrealAttenuation>(p.falloffExponent, cutoff);
     if (p.decayClampToOne) return std::make_unique<ClampedStandardAttenuation>(p.falloffExponent);
     return std::make_unique<StandardAttenuation>(p.falloffExponent);
@@ -59,19 +60,32 @@ Color photonPower(const LightParameters &p, float factor) {
     return Color(p.color.r * k, p.color.g * k, p.color.b * k, p.color.a * k);
 }
 
+// An angle in radians from degrees, NaN and infinities counted as 0.
+float radians(float degrees) { return std::isfinite(degrees) ? degrees * kDegToRad : 0.0f; }
+
+// The distance the standard models see: at least 1e-6, NaN counted as 1e-6.
+inline float safeDistance(float d) { return d > 1e-6f ? d : 1e-6f; }
+// A factor kept within [0, kMaxAttenuation] (an overflow to infinity becomes the bound).
+inline float boundedFactor(float f) { return f < kMaxAttenuation ? f : kMaxAttenuation; }
+
 }  // namespace
 
-float StandardAttenuation::attenuate(float d) const { return std::pow(1.0f / d, exponent_); }
+float StandardAttenuation::attenuate(float d) const {
+    return boundedFactor(std::pow(1.0f / safeDistance(d), exponent_));
+}
 
 float ClampedStandardAttenuation::attenuate(float d) const {
-    return std::fmin(1.0f, std::pow(1.0f / d, exponent_));
+    return std::fmin(1.0f, std::pow(1.0f / safeDistance(d), exponent_));
 }
 
 float UnrealAttenuation::attenuate(float d) const {
-    const float q = d / radius_;
-    float t = 1.0f - q * q;
-    if (!(t > 0.0f)) t = 0.0f;
-    return std::pow(t, exponent_);
+    // pow(0, 0) would be 1: the cut-off must hold for every exponent, and a radius <= 0 has no
+    // inside at all.
+    if (!(radius_ > 0.0f)) return 0.0f;
+    const float q = safeDistance(d) / radius_;
+    const float t = 1.0f - q * q;
+    if (!(t > 0.0f)) return 0.0f;
+    return boundedFactor(std::pow(t, exponent_));
 }
 
 LightRamp::LightRamp(const std::vector<RampEntry> &entries) {
@@ -90,8 +104,9 @@ Color LightRamp::lookup(float x) const {
     if (colors_.empty()) return Color::white();
     if (x < 0.0f) return colors_.front();
     if (x > 1.0f) return Color::black();
-    size_t i = 0;
-    while (i < positions_.size() && positions_[i] < x) ++i;
+    // The first position not below x (positions are sorted by the constructor).
+    const size_t i = size_t(std::lower_bound(positions_.begin(), positions_.end(), x) -
+                            positions_.begin());
     if (i == 0) return colors_.front();
     if (i == positions_.size()) return colors_.back();
     const float span = positions_[i] - positions_[i - 1];
@@ -127,23 +142,29 @@ SimplePointLight::SimplePointLight(const LightParameters &p)
 
 SimpleSpotLight::SimpleSpotLight(const LightParameters &p) : SimplePointLight(p) {
     shadow_ = samplerSettings(p, ShadowSamplerSettings::kPoint, p.spotLightShadowRadius);
-    const float half = p.spotLightConeAngle * 0.5f * kDegToRad;
-    const float pen = p.spotLightPenumbraAngle * kDegToRad;
+    const float half = radians(p.spotLightConeAngle) * 0.5f;
+    const float pen = radians(p.spotLightPenumbraAngle);
     float outer = half, inner = half;
     if (pen > 0.0f)
         outer = half + pen;
     else
         inner = half - std::fabs(pen);
+    // A cone cannot open wider than all directions, nor an inner cone close below nothing.
+    outer = std::clamp(outer, 0.0f, kPi);
+    inner = std::clamp(inner, 0.0f, outer);
     cosOuter_ = std::cos(outer);
     cosInner_ = std::cos(inner);
-    penumbraExponent_ = p.spotLightPenumbraExponent;
+    penumbraExponent_ =
+        std::isfinite(p.spotLightPenumbraExponent) ? p.spotLightPenumbraExponent : 0.0f;
     axis_ = objectToWorld_.transformVector(Vec3(0, -1, 0)).normalized();
     goboU_ = objectToWorld_.transformVector(Vec3(1, 0, 0)).normalized();
     goboV_ = objectToWorld_.transformVector(Vec3(0, 0, 1)).normalized();
-    goboScale_ = 1.0f / (2.0f * std::tan(outer));
+    // The gobo covers the cone out to its outer angle; a plane cannot hold a cone of 90 degrees
+    // or more, so the projection stops at 89 degrees, and a closed cone maps to the centre.
+    const float projected = std::min(outer, 89.0f * kDegToRad);
+    goboScale_ = projected > 1e-6f ? 1.0f / (2.0f * std::tan(projected)) : 0.0f;
     if (!p.spotLightGoboTexture.empty()) {
         if (FileSystemUtilities::canRead(p.spotLightGoboTexture)) {
-            hasGobo_ = true;
             goboFile_ = p.spotLightGoboTexture;
         } else {
             message(kMsgError, 3, "Gobo file %s failed to load", p.spotLightGoboTexture.c_str());
@@ -155,8 +176,8 @@ SimpleDirectionalLight::SimpleDirectionalLight(const LightParameters &p)
     : SimpleLightSourceBase(p) {
     direction_ = -objectToWorld_.transformVector(Vec3(0, -1, 0)).normalized();
     bounds_ = infiniteBox();
-    shadow_ =
-        samplerSettings(p, ShadowSamplerSettings::kDirectional, p.directionalLightShadowAngle);
+    shadow_ = samplerSettings(p, ShadowSamplerSettings::kDirectional,
+                              radians(p.directionalLightShadowAngle));
     photons_.power = photonPower(p, 300.0f);
 }
 
@@ -170,13 +191,14 @@ SimpleAreaLight::SimpleAreaLight(const LightParameters &p)
                     objectToWorld_.transformVector(Vec3(0, 1, 0)))
                   .normalized();
     bounds_ = grownBox(corners_, 4, cutoff);
+    cutoff2_ = cutoff * cutoff;
     attenuation_ = makeAttenuation(p, cutoff);
     shadow_ = samplerSettings(p, ShadowSamplerSettings::kArea, 0.0f);
     photons_.power = photonPower(p, 12.0f);
 }
 
 SimpleWindowLight::SimpleWindowLight(const LightParameters &p) : SimpleAreaLight(p) {
-    halfAngle_ = p.directionalLightShadowAngle * 0.5f;
+    halfAngle_ = std::clamp(radians(p.directionalLightShadowAngle) * 0.5f, 0.0f, 1.5f);
     tanHalfAngle_ = std::tan(halfAngle_);
     shadow_ = samplerSettings(p, ShadowSamplerSettings::kDirectional, halfAngle_);
     shadow_.clipAtPlane = true;
@@ -201,9 +223,9 @@ EnvironmentLight::EnvironmentLight(std::string name,
 }
 
 uint32_t iblSubLightCount(int32_t samples) {
-    for (uint32_t k = 0; k < 31; ++k)
+    for (uint32_t k = 0; (1u << k) < kMaxIblSubLights; ++k)
         if ((int64_t(1) << k) >= int64_t(samples)) return 1u << k;
-    return 1;
+    return kMaxIblSubLights;
 }
 
 int64_t iblScaledPhotonEnergy(int32_t energy) {
@@ -230,6 +252,8 @@ KDHDRLight::KDHDRLight(const EnvironmentValues &v)
     photons_.specularPhotons = v.iblEmitPhotons ? v.iblCausticsPhotons : 0;
 }
 
+KDHDRLight::~KDHDRLight() = default;
+
 std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values) {
     if (!FileSystemUtilities::canRead(values.iblImageFile)) {
         message(kMsgError, 6, "Error reading IBL lightprobe");
@@ -240,7 +264,7 @@ std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &value
 
 std::unique_ptr<LightSource> createLight(const LightParameters &p, bool &castShadows) {
     castShadows = p.castShadows;
-    switch (static_cast<LightType>(p.type)) {
+    switch (p.type) {
         case LightType::kPoint:
             return std::make_unique<SimplePointLight>(p);
         case LightType::kDirectional:

@@ -59,7 +59,7 @@ TEST(Lights, ConstructionByType) {
     p.indirectLightScale = 0.5f;
     bool shadows = false;
 
-    p.type = 0;
+    p.type = LightType::kPoint;
     auto point = createLight(p, shadows);
     ASSERT_STREQ(point->className(), "SimplePointLight");
     auto &pl = static_cast<SimplePointLight &>(*point);
@@ -73,7 +73,7 @@ TEST(Lights, ConstructionByType) {
     EXPECT_EQ(pl.intensityScale(3), 1.0f);
     EXPECT_FLOAT_EQ(pl.photonEmission().power.r, 24.0f);
 
-    p.attenuationType = 1;
+    p.attenuationType = AttenuationType::kUnreal;
     p.castShadows = false;
     auto unreal = createLight(p, shadows);
     EXPECT_FALSE(shadows);
@@ -82,14 +82,14 @@ TEST(Lights, ConstructionByType) {
         static_cast<SimplePointLight &>(*unreal).attenuation());
     ASSERT_TRUE(u);
     EXPECT_EQ(u->radius(), 10.0f);
-    p.attenuationType = 0;
+    p.attenuationType = AttenuationType::kStandard;
     p.decayClampToOne = false;
     auto standard = createLight(p, shadows);
     EXPECT_TRUE(dynamic_cast<const StandardAttenuation *>(
         static_cast<SimplePointLight &>(*standard).attenuation()));
 
     // Directional: no attenuation, the direction towards the light, photons x 300.
-    p.type = 1;
+    p.type = LightType::kDirectional;
     auto dir = createLight(p, shadows);
     auto &dl = static_cast<SimpleDirectionalLight &>(*dir);
     EXPECT_EQ(dl.attenuation(), nullptr);
@@ -97,7 +97,7 @@ TEST(Lights, ConstructionByType) {
     EXPECT_FLOAT_EQ(dl.photonEmission().power.r, 600.0f);
 
     // Spot: a negative penumbra narrows the inner cone.
-    p.type = 2;
+    p.type = LightType::kSpot;
     p.spotLightConeAngle = 60.0f;
     p.spotLightPenumbraAngle = -10.0f;
     auto spot = createLight(p, shadows);
@@ -118,25 +118,25 @@ TEST(Lights, ConstructionByType) {
     EXPECT_NE(out.find("[ERROR]    Gobo file /no/such/gobo.tga failed to load"), std::string::npos);
 
     // Area lights get an attenuation although they have no ramp.
-    p.type = 3;
+    p.type = LightType::kArea;
     p.lightRampColors = {{1, 1, 1, 0}};
     auto area = createLight(p, shadows);
     auto &al = static_cast<SimpleAreaLight &>(*area);
     EXPECT_NE(al.attenuation(), nullptr);
     EXPECT_EQ(al.normal(), Vec3(0, 0, 1));
 
-    p.type = 4;
+    p.type = LightType::kWindow;
     p.directionalLightShadowAngle = 0.5f;
     out = captureMessages([&] {
         auto w = createLight(p, shadows);
         auto &wl = static_cast<SimpleWindowLight &>(*w);
-        EXPECT_FLOAT_EQ(wl.halfAngle(), 0.25f);
+        EXPECT_FLOAT_EQ(wl.halfAngle(), 0.25f * 3.14159265f / 180);  // half of 0.5 degrees
         EXPECT_TRUE(wl.shadowSampler().clipAtPlane);
         EXPECT_EQ(wl.photonEmission().power, Color());
     });
     EXPECT_NE(out.find("Photon emission from window lights not supported"), std::string::npos);
 
-    p.type = 5;
+    p.type = LightType::kEnvironment;
     p.lowerColor = Color(0, 0, 1, 1);
     p.castShadows = true;
     auto env = createLight(p, shadows);
@@ -146,7 +146,7 @@ TEST(Lights, ConstructionByType) {
     EXPECT_EQ(shader.evaluateDirection({0, 1, 0}), p.color);
     EXPECT_EQ(shader.evaluateDirection({0, -1, 0}), p.lowerColor);
 
-    p.type = 9;
+    p.type = static_cast<LightType>(9);
     out = captureMessages([&] { EXPECT_EQ(createLight(p, shadows), nullptr); });
     EXPECT_NE(out.find("Unknown type 9 of light l"), std::string::npos);
 }
@@ -156,7 +156,7 @@ TEST(Lights, ImageBasedLightParameters) {
     EXPECT_EQ(iblSubLightCount(256), 256u);
     EXPECT_EQ(iblSubLightCount(0), 1u);
     EXPECT_EQ(iblSubLightCount(-5), 1u);
-    EXPECT_EQ(iblSubLightCount(INT32_MAX), 1u);  // no power of two below 2^31 fits
+    EXPECT_EQ(iblSubLightCount(INT32_MAX), 65536u);  // capped
     EXPECT_EQ(iblScaledPhotonEnergy(10000), 1100000000);
     EXPECT_EQ(iblScaledPhotonEnergy(100000), INT32_MAX);  // saturates instead of wrapping
     EXPECT_EQ(iblScaledPhotonEnergy(-100000), INT32_MIN);
