@@ -71,10 +71,15 @@ inline float boundedFactor(float f) { return f < kMaxAttenuation ? f : kMaxAtten
 }  // namespace
 
 float StandardAttenuation::attenuate(float d) const {
+    // The common exponents without pow.
+    if (exponent_ == 2.0f) return boundedFactor(1.0f / (safeDistance(d) * safeDistance(d)));
+    if (exponent_ == 0.0f) return 1.0f;
     return boundedFactor(std::pow(1.0f / safeDistance(d), exponent_));
 }
 
 float ClampedStandardAttenuation::attenuate(float d) const {
+    if (exponent_ == 2.0f) return std::fmin(1.0f, 1.0f / (safeDistance(d) * safeDistance(d)));
+    if (exponent_ == 0.0f) return 1.0f;
     return std::fmin(1.0f, std::pow(1.0f / safeDistance(d), exponent_));
 }
 

@@ -37,13 +37,13 @@ void LightSource::illuminateBoth(Color &shadowed, Color &unshadowed, const Vec3 
 // Point light.
 
 Color SimplePointLight::unshadowed(const Vec3 &p, const LightContext &ctx) const {
-    float a = 1.0f;
     if (ramp_.empty()) {
-        a = attenuationAt((p - position_).length(), ctx);
+        const float a = attenuationAt((p - position_).length(), ctx);
         if (color_.luminance() * a < kLightCutLuminance) return Color::black();
+        return color_ * (a * intensityScale(ctx.rayType));
     }
     const Color r = ramp_.lookup(worldToLight_.transformPoint(p).length());
-    return color_ * r * (a * intensityScale(ctx.rayType));
+    return color_ * r * intensityScale(ctx.rayType);
 }
 
 Color SimplePointLight::illuminate(const Vec3 &p, const Vec3 &, LightContext &ctx,

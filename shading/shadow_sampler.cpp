@@ -111,12 +111,14 @@ bool shadowSegmentBlocked(const Vec3 &p, const Vec3 &target, LightContext &ctx) 
 Color tracePointShadow(const ShadowSamplerSettings &s, const Vec3 &lightPosition, const Vec3 &p,
                        LightContext &ctx, float importance) {
     if (!traces(s, ctx)) return Color::white();
+    // Every ray towards a disk of radius 0 is the same ray: one ray, no draws.
+    const float radius = s.size > 0.0f && std::isfinite(s.size) ? s.size : 0.0f;
+    if (radius == 0.0f)
+        return shadowSegmentBlocked(p, lightPosition, ctx) ? Color::black() : Color::white();
     const Vec3 w = (lightPosition - p).normalized();
     Vec3 u, v;
     perpendicularBasis(w, u, v);
-    const float radius = s.size > 0.0f && std::isfinite(s.size) ? s.size : 0.0f;
-    // Every ray towards a disk of radius 0 is the same ray.
-    const uint32_t n = radius > 0.0f ? shadowSampleCount(s, ctx, importance) : 1;
+    const uint32_t n = shadowSampleCount(s, ctx, importance);
     u *= radius;
     v *= radius;
     return stratified(n, ctx, p, [&](float a, float b, Vec3 &q) {
@@ -147,6 +149,9 @@ Color traceDirectionalShadow(const ShadowSamplerSettings &s, const Vec3 &toLight
     const float angle = std::clamp(std::isfinite(s.size) ? s.size : 0.0f, 0.0f, 1.5f);
     const float spread = std::tan(angle);
     const uint32_t n = spread > 0.0f ? shadowSampleCount(s, ctx, importance) : 1;
+    if (spread == 0.0f && !window)
+        return shadowSegmentBlocked(p, p + toLight * kDirectionalReach, ctx) ? Color::black()
+                                                                             : Color::white();
     u *= spread;
     v *= spread;
     return stratified(n, ctx, p, [&](float a, float b, Vec3 &q) {
