@@ -196,7 +196,8 @@ void BM_Overhead(benchmark::State &state) {
         const size_t count = size_t(counter.count(kRayShadow));
         size_t hits = 0;
         double t2 = threadSeconds();
-        for (size_t k = 0; k < count; ++k) hits += f.grid.occluded(rays[k].ray, rays[k].tmax, nullptr);
+        for (size_t k = 0; k < count; ++k)
+            hits += f.grid.occluded(rays[k].ray, rays[k].tmax, nullptr);
         double t3 = threadSeconds();
         benchmark::DoNotOptimize(hits);
         lightSeconds += t1 - t0;

@@ -110,8 +110,8 @@ Color LightRamp::lookup(float x) const {
     if (x < 0.0f) return colors_.front();
     if (x > 1.0f) return Color::black();
     // The first position not below x (positions are sorted by the constructor).
-    const size_t i = size_t(std::lower_bound(positions_.begin(), positions_.end(), x) -
-                            positions_.begin());
+    const size_t i =
+        size_t(std::lower_bound(positions_.begin(), positions_.end(), x) - positions_.begin());
     if (i == 0) return colors_.front();
     if (i == positions_.size()) return colors_.back();
     const float span = positions_[i] - positions_[i - 1];

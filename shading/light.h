@@ -446,8 +446,8 @@ Vec3 probeDirection(float u, float v);
 
 /// One directional sub-light of the image-based light: the energy centre of a probe region.
 struct IBLSubLight {
-    Vec3 direction;  ///< Unit direction towards the region (after turning and swapping).
-    Color color;     ///< Sum of radiance x solid angle over the region, / (2 pi^2).
+    Vec3 direction;         ///< Unit direction towards the region (after turning and swapping).
+    Color color;            ///< Sum of radiance x solid angle over the region, / (2 pi^2).
     Vec3 spreadU, spreadV;  ///< Half extents of the region across the direction (for jitter).
 };
 

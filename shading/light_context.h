@@ -29,7 +29,7 @@ struct ShadowTracer {
 /// belongs to the caller.
 struct LightContext {
     const ShadowTracer *tracer = nullptr;  ///< Null: no shadow rays, bias 0.
-    Random *random = nullptr;  ///< The thread's generator (null: the centre of every stratum).
+    Random *random = nullptr;       ///< The thread's generator (null: the centre of every stratum).
     RayCounter *counter = nullptr;  ///< Counts the shadow rays (may be null).
     uint8_t rayType = kRayPrimary;  ///< Ray type of the shading context: picks the light's scale.
     uint8_t rayDepth = 0;           ///< Depth of the ray being shaded.

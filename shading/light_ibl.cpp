@@ -101,15 +101,13 @@ bool KDHDRLight::buildSubLights(const LightProbeImage &probe) {
             split = true;
             --splits;
             if (rh < 2 || (rw >= 2 && across >= along)) {
-                const int32_t k = halvingCut(r.x0, r.x1, [&](int32_t a, int32_t b) {
-                    return table.sum(a, r.y0, b, r.y1);
-                });
+                const int32_t k = halvingCut(
+                    r.x0, r.x1, [&](int32_t a, int32_t b) { return table.sum(a, r.y0, b, r.y1); });
                 next.push_back({r.x0, r.y0, k, r.y1});
                 next.push_back({k, r.y0, r.x1, r.y1});
             } else {
-                const int32_t k = halvingCut(r.y0, r.y1, [&](int32_t a, int32_t b) {
-                    return table.sum(r.x0, a, r.x1, b);
-                });
+                const int32_t k = halvingCut(
+                    r.y0, r.y1, [&](int32_t a, int32_t b) { return table.sum(r.x0, a, r.x1, b); });
                 next.push_back({r.x0, r.y0, r.x1, k});
                 next.push_back({r.x0, k, r.x1, r.y1});
             }

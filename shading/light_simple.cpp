@@ -28,8 +28,8 @@ Color LightSource::shadowTransmission(const Vec3 &, LightContext &, float) const
     return Color::white();
 }
 
-void LightSource::illuminateBoth(Color &shadowed, Color &unshadowed, const Vec3 &p,
-                                 const Vec3 &n, LightContext &ctx) const {
+void LightSource::illuminateBoth(Color &shadowed, Color &unshadowed, const Vec3 &p, const Vec3 &n,
+                                 LightContext &ctx) const {
     unshadowed = illuminate(p, n, ctx, false);
     shadowed = shadowedRgb(unshadowed, shadowTransmission(p, ctx, 1.0f));
 }
