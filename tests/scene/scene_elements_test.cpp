@@ -54,8 +54,8 @@ TEST(SceneElements, ReadsEveryKindIntoCompactRecords) {
 
     auto *light = dynamic_cast<XMLLightSourceCompact *>(records[1].get());
     ASSERT_TRUE(light);
-    EXPECT_EQ(light->light.type, 2);
-    EXPECT_EQ(light->light.attenuationType, 1);
+    EXPECT_EQ(light->light.type, ox::LightType::kSpot);
+    EXPECT_EQ(light->light.attenuationType, ox::AttenuationType::kUnreal);
     EXPECT_EQ(light->light.decayCutoff, 20.0f);
     EXPECT_EQ(light->light.color, Color(1, 0.5f, 0.25f, 1));
     ASSERT_EQ(light->light.lightRampColors.size(), 2u);
@@ -92,7 +92,7 @@ TEST(SceneElements, DefaultFlagWordAndBadDocuments) {
         ASSERT_TRUE(readSceneDocument(
             "<OXScene><LightSource><Type>spot</Type></LightSource></OXScene>", records, error));
     });
-    EXPECT_EQ(static_cast<XMLLightSourceCompact &>(*records[0]).light.type, 0);
+    EXPECT_EQ(static_cast<XMLLightSourceCompact &>(*records[0]).light.type, ox::LightType::kPoint);
 }
 
 }  // namespace
