@@ -1,0 +1,127 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "core/types.h"
+#include "render/layer.h"
+#include "render/layer_tiled.h"
+
+/// The frame: a set of named layers of one size that renders and bakes fill, filters
+/// transform and writers store.
+namespace ox {
+
+/// A set of named layers of equal size, ordered by name (bytewise). The frame owns its layers
+/// until they are detached. The layer map itself is not locked: add, delete, detach and
+/// rename layers only while no thread pastes or reads.
+class Frame {
+public:
+    /// An empty frame of width x height pixels.
+    Frame(int32_t width, int32_t height) : width_(width), height_(height) {}
+    ~Frame() = default;
+    Frame(const Frame &) = delete;
+    Frame &operator=(const Frame &) = delete;
+
+    int32_t width() const { return width_; }
+    int32_t height() const { return height_; }
+
+    /// Takes ownership of a layer. Refused (false, one message; the layer is destroyed) when
+    /// a layer of that name exists, when its size differs from the frame's, or when it has no
+    /// storage.
+    bool addLayer(std::unique_ptr<Layer> layer);
+    /// Creates and adds a tiled boolean, float or colour layer; null when refused.
+    template <typename T>
+    LayerT<T> *addTiledLayer(const std::string &name, int32_t tileSize = kLayerTileSize);
+    /// Creates and adds a linear custom-float layer of `channels` floats per pixel; null
+    /// when refused.
+    CustomFloatLayer *addCustomFloatLayer(const std::string &name, int32_t channels);
+
+    /// The layer of that name, or null.
+    Layer *getLayer(const std::string &name) const;
+    /// The layer of that name when it is a boolean layer, else null.
+    LayerT<bool> *getBoolLayer(const std::string &name) const;
+    /// The layer of that name when it is a float layer, else null.
+    LayerT<float> *getFloatLayer(const std::string &name) const;
+    /// The layer of that name when it is a colour layer, else null.
+    LayerT<Color> *getColorLayer(const std::string &name) const;
+    /// The layer of that name when it is a custom-float layer, else null.
+    CustomFloatLayer *getCFLayer(const std::string &name) const;
+    /// True when a layer of that name exists.
+    bool hasLayer(const std::string &name) const { return layers_.count(name) != 0; }
+    /// The layer names in order.
+    std::vector<std::string> layerNames() const;
+    /// The layers in name order.
+    const std::map<std::string, std::unique_ptr<Layer>> &layers() const { return layers_; }
+
+    /// Pastes into the boolean, float or colour layer of that name (T = bool, float, Color).
+    /// False with one message when the layer is missing, of another kind, or refuses.
+    template <typename T>
+    bool pasteRegion(const std::string &name, const Region &region, const T *data,
+                     int64_t stride = -1);
+    /// Reads from the boolean, float or colour layer of that name; as pasteRegion.
+    template <typename T>
+    bool readRegion(const std::string &name, const Region &region, T *data, int64_t stride = -1);
+    /// Pastes into the custom-float layer of that name (stride in pixels).
+    bool pasteCFRegion(const std::string &name, const Region &region, const float *data,
+                       int64_t stride = -1);
+    /// Reads from the custom-float layer of that name (stride in pixels).
+    bool readCFRegion(const std::string &name, const Region &region, float *data,
+                      int64_t stride = -1);
+
+    /// Removes and destroys a layer (its observer registrations go with it).
+    bool deleteLayer(const std::string &name);
+    /// Removes a layer without destroying it; the caller owns the result (null when absent).
+    std::unique_ptr<Layer> detachLayer(const std::string &name);
+    /// Calls the layer's synchronize.
+    bool flushLayer(const std::string &name);
+    /// Gives a layer a new name; refused when `from` is missing or `to` exists (unless equal).
+    bool renameLayer(const std::string &from, const std::string &to);
+
+    /// Registers an observer on a layer (false when the layer is missing).
+    bool registerObserver(const std::string &name, LayerObserver *observer);
+    /// Unregisters an observer from a layer (false when the layer is missing).
+    bool unregisterObserver(const std::string &name, LayerObserver *observer);
+
+private:
+    Layer *typedLayer(const std::string &name, LayerKind kind, bool paste) const;
+
+    int32_t width_, height_;
+    std::map<std::string, std::unique_ptr<Layer>> layers_;
+};
+
+/// Frame utilities.
+class FrameUtils {
+public:
+    /// A new frame of the region's size holding a copy of each named layer's region (tiled
+    /// 64 x 64 for boolean, float and colour layers, linear for custom-float ones). Null
+    /// after one message when a layer is missing or a copy fails.
+    static std::unique_ptr<Frame> crop(Frame &frame, const Region &region,
+                                       const std::vector<std::string> &layerNames);
+};
+
+// ---------------------------------------------------------------------------------------------
+
+template <typename T>
+LayerT<T> *Frame::addTiledLayer(const std::string &name, int32_t tileSize) {
+    auto layer = std::make_unique<TiledMemoryLayerT<T>>(name, width_, height_, tileSize, tileSize);
+    LayerT<T> *p = layer.get();
+    return addLayer(std::move(layer)) ? p : nullptr;
+}
+
+template <typename T>
+bool Frame::pasteRegion(const std::string &name, const Region &region, const T *data,
+                        int64_t stride) {
+    Layer *l = typedLayer(name, layerKindOf<T>(), true);
+    return l && static_cast<LayerT<T> *>(l)->paste(region, data, stride);
+}
+
+template <typename T>
+bool Frame::readRegion(const std::string &name, const Region &region, T *data, int64_t stride) {
+    Layer *l = typedLayer(name, layerKindOf<T>(), false);
+    return l && static_cast<LayerT<T> *>(l)->read(region, data, stride);
+}
+
+}  // namespace ox
