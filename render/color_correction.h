@@ -26,6 +26,7 @@ public:
 /// The nil correction: a copy.
 class NilColorCorrection final : public ColorCorrectionInterface {
 public:
+    using ColorCorrectionInterface::correct;
     void correct(const Color *input, Color *output, size_t n) const override;
 };
 
@@ -34,6 +35,7 @@ class GammaColorCorrection final : public ColorCorrectionInterface {
 public:
     /// gamma must be positive and finite (createColorCorrection checks it).
     explicit GammaColorCorrection(float gamma) : inverse_(1.0f / gamma) {}
+    using ColorCorrectionInterface::correct;
     void correct(const Color *input, Color *output, size_t n) const override;
 
 private:
@@ -43,6 +45,7 @@ private:
 /// The sRGB transfer function on r, g and b.
 class SRGBColorCorrection final : public ColorCorrectionInterface {
 public:
+    using ColorCorrectionInterface::correct;
     void correct(const Color *input, Color *output, size_t n) const override;
     /// The sRGB transfer function of one channel.
     static float toSRGB(float c);
