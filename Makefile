@@ -34,7 +34,8 @@ sanitize: deps
 	cd $(SAN_DIR) && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
 		ctest --output-on-failure -j $(JOBS) --timeout 900
 
-# ThreadSanitizer over the test programs of the threads, locks, work server and tile renderer.
+# ThreadSanitizer over the test programs of the threads, locks, work server, tile renderer and
+# tiled frame layers.
 TSAN_TESTS ?= platform render
 tsan: deps
 	cmake -S . -B $(TSAN_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Debug -DOX_SANITIZE=thread -DOX_BUILD_BENCH=OFF
