@@ -189,24 +189,15 @@ bool writeTGA(const std::string &fileName, LayerT<Color> &layer, bool withAlpha,
         message(kMsgError, 6, "Could not open output file: %s", fileName.c_str());
         return false;
     }
-    const uint8_t header[18] = {0,
-                                0,
-                                2,
-                                0,
-                                0,
-                                0,
-                                0,
-                                0,
-                                0,
-                                0,
-                                0,
-                                0,
-                                uint8_t(w & 0xff),
-                                uint8_t(w >> 8),
-                                uint8_t(h & 0xff),
-                                uint8_t(h >> 8),
-                                uint8_t(withAlpha ? 32 : 24),
-                                uint8_t(withAlpha ? 8 : 0)};
+    // ID length, colour-map type, image type 2 (true colour), colour-map spec (5 bytes), x and
+    // y origin, width, height (little-endian), pixel depth and descriptor (alpha bits).
+    uint8_t header[18] = {0, 0, 2};
+    header[12] = uint8_t(w & 0xff);
+    header[13] = uint8_t(w >> 8);
+    header[14] = uint8_t(h & 0xff);
+    header[15] = uint8_t(h >> 8);
+    header[16] = uint8_t(withAlpha ? 32 : 24);
+    header[17] = uint8_t(withAlpha ? 8 : 0);
     bool ok = std::fwrite(header, 1, sizeof header, f) == sizeof header;
     static constexpr int kBGRA[4] = {2, 1, 0, 3};
     const int channels = withAlpha ? 4 : 3;
