@@ -141,6 +141,14 @@ uint32_t pointDataTypeSize(PointDataType type) {
     return kTypeSizes[code];
 }
 
+const char *pointDataTypeName(PointDataType type) {
+    static const char *const kNames[] = {"int8",  "uint8",   "int16",   "int32", "uint32",
+                                         "float", "color32", "flags32", "double"};
+    uint32_t code = uint32_t(type);
+    OX_CHECK(code < std::size(kNames));
+    return kNames[code];
+}
+
 bool pointDataTypeForSize(uint32_t size, PointDataType &type) {
     switch (size) {
         case 1:

@@ -56,6 +56,12 @@ uint32_t pointDataTypeSize(PointDataType type);
 /// size no data type has.
 bool pointDataTypeForSize(uint32_t size, PointDataType &type);
 
+/// The name of a data type ("float", "int32", ...).
+const char *pointDataTypeName(PointDataType type);
+/// Appends the text of one element (at `element`, little-endian) as the XML encoding writes it:
+/// integers in decimal, floats with 9 and doubles with 17 significant digits.
+void appendPointValueText(const uint8_t *element, PointDataType type, std::string &out);
+
 /// Version written into new files.
 constexpr uint32_t kPointCloudVersion = 1;
 /// Bytes of the fixed text fields; a name keeps at most one byte less (the terminator).

@@ -496,6 +496,11 @@ bool PointCloudXmlHandler::finish(PointCloud &cloud) {
 
 }  // namespace
 
+void appendPointValueText(const uint8_t *element, PointDataType type, std::string &out) {
+    char buf[40];
+    out.append(valueText(element, type, buf));
+}
+
 bool PointCloudXMLReader::process(PointCloud &cloud) {
     const std::string &name = source_.name;
     XmlStreamStatus status;
