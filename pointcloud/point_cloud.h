@@ -80,7 +80,7 @@ struct PointVariable {
 
 /// The header fields other than the counts and the variables.
 struct PointCloudHeader {
-    uint32_t version = kPointCloudVersion;
+    uint32_t version = kPointCloudVersion;  ///< as read; writers always write the current one
     std::string description;
     std::string type = "point";  ///< type name
     uint32_t typeId = 0;

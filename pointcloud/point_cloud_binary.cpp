@@ -209,7 +209,7 @@ bool PointCloudBinaryWriter::write(const PointCloud &cloud) {
 
     std::string head;
     head.reserve(kFixedHeaderBytes + kDefinitionBytes * cloud.variables().size());
-    putU32(head, h.version);
+    putU32(head, kPointCloudVersion);  // the layout written is always this version's
     putText(head, cutName(h.description, "description"));
     putText(head, cutName(h.type, "type name"));
     putU32(head, h.typeId);

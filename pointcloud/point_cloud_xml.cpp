@@ -603,7 +603,7 @@ bool PointCloudXMLWriter::write(const PointCloud &cloud) {
 
     w.startElement("pointCloud");
     w.startElement("header");
-    number("version", h.version);
+    number("version", kPointCloudVersion);
     w.element("description", h.description);
     w.element("type", h.type);
     number("typeId", h.typeId);
