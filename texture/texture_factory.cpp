@@ -1,5 +1,6 @@
 #include "texture/texture_factory.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -82,7 +83,10 @@ std::shared_ptr<const MipImage> TextureFactory::load(const std::string &fileName
         return nullptr;
     }
     std::string bytes;
-    if (!FileSystemUtilities::readFile(fileName, bytes, size_t(settings_.maxImageBytes))) {
+    // A file is not much larger than the largest image it may hold; the slack is for headers,
+    // thumbnails and metadata.
+    const uint64_t maxFileBytes = settings_.maxImageBytes + (uint64_t(1) << 20);
+    if (!FileSystemUtilities::readFile(fileName, bytes, size_t(std::min<uint64_t>(maxFileBytes, SIZE_MAX)))) {
         const int err = FileSystemUtilities::lastError();
         message(kMsgError, 3, "Error opening texture %s (%s)", fileName.c_str(),
                 err ? std::strerror(err) : "cannot read the file");
