@@ -65,8 +65,8 @@ public:
 
     bool readPixels(TexelBuffer &out, const ReadLimits &limits) override {
         const uint64_t rowBytes = (uint64_t(info_.width) * (bits_ / 8) + 3) & ~uint64_t(3);
-        const uint64_t need = rowBytes * uint64_t(info_.height);
-        if (offset_ > size_ || need > size_ - offset_) {
+        // Compared by division: rowBytes x height may not fit in 64 bits.
+        if (offset_ > size_ || uint64_t(info_.height) > (size_ - offset_) / rowBytes) {
             message(kMsgError, 3, "getPixels() failed for image %s", name_.c_str());
             return false;
         }

@@ -96,7 +96,7 @@ std::shared_ptr<const MipImage> TextureFactory::load(const std::string &fileName
     std::unique_ptr<ImageReader> reader = factory->create();
     const auto *data = reinterpret_cast<const uint8_t *>(bytes.data());
     if (!reader->open(fileName, data, bytes.size(), options)) return nullptr;
-    const ImageInfo &info = reader->info();
+    const ImageInfo info = reader->info();  // a copy: the reader goes before the image is built
     message(kMsgDebug, 3, "Creating texture from %s with %dx%d, %d bpc, %s and %s",
             fileName.c_str(), info.width, info.height, info.bitsPerChannel,
             info.grey ? "grayscale" : "color", info.alpha ? "alpha" : "no alpha");
