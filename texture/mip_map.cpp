@@ -60,6 +60,22 @@ void downsampleTyped(const TexelBuffer &src, TexelBuffer &dst, Store store) {
     }
 }
 
+/// Levels of even sizes: plain 2 x 2 averages, accumulated in Acc.
+template <typename T, typename Acc, typename Store>
+void downsampleEven(const TexelBuffer &src, TexelBuffer &dst, Store store) {
+    const int channels = src.format().channels;
+    for (int32_t y = 0; y < dst.height(); ++y) {
+        const T *a = reinterpret_cast<const T *>(src.row(2 * y));
+        const T *b = reinterpret_cast<const T *>(src.row(2 * y + 1));
+        T *out = reinterpret_cast<T *>(dst.row(y));
+        for (int32_t x = 0; x < dst.width(); ++x, a += 2 * channels, b += 2 * channels)
+            for (int c = 0; c < channels; ++c)
+                *out++ = store((Acc(float(a[c])) + Acc(float(a[c + channels])) + Acc(float(b[c])) +
+                                Acc(float(b[c + channels]))) *
+                               Acc(0.25));
+    }
+}
+
 /// The common case of an 8-bit level with even sizes: exact integer 2 x 2 averages.
 void downsampleU8Even(const TexelBuffer &src, TexelBuffer &dst) {
     const int channels = src.format().channels;
@@ -75,9 +91,10 @@ void downsampleU8Even(const TexelBuffer &src, TexelBuffer &dst) {
 }  // namespace
 
 void downsampleLevel(const TexelBuffer &src, TexelBuffer &dst) {
+    const bool even = src.width() == 2 * dst.width() && src.height() == 2 * dst.height();
     switch (src.format().type) {
         case TexelType::kU8:
-            if (src.width() == 2 * dst.width() && src.height() == 2 * dst.height())
+            if (even)
                 downsampleU8Even(src, dst);
             else
                 downsampleTyped<uint8_t>(src, dst, [](double v) { return uint8_t(v + 0.5); });
@@ -89,10 +106,17 @@ void downsampleLevel(const TexelBuffer &src, TexelBuffer &dst) {
             downsampleTyped<uint32_t>(src, dst, [](double v) { return uint32_t(v + 0.5); });
             break;
         case TexelType::kF16:
-            downsampleTyped<Imath::half>(src, dst, [](double v) { return Imath::half(float(v)); });
+            if (even)
+                downsampleEven<Imath::half, float>(src, dst, [](float v) { return Imath::half(v); });
+            else
+                downsampleTyped<Imath::half>(src, dst,
+                                             [](double v) { return Imath::half(float(v)); });
             break;
         case TexelType::kF32:
-            downsampleTyped<float>(src, dst, [](double v) { return float(v); });
+            if (even)
+                downsampleEven<float, float>(src, dst, [](float v) { return v; });
+            else
+                downsampleTyped<float>(src, dst, [](double v) { return float(v); });
             break;
     }
 }

@@ -132,20 +132,22 @@ public:
             const Imf::PixelType type = info_.bitsPerChannel == 16 ? Imf::HALF : Imf::FLOAT;
             const size_t cb = size_t(out.format().bytesPerChannel());
             const size_t xStride = size_t(out.format().bytesPerTexel());
-            const size_t yStride = out.rowBytes();
-            // EXR rows run top-down; they are read in that order and flipped afterwards.
-            char *first = reinterpret_cast<char *>(out.data());
+            // EXR rows run top-down: file row minY goes to the buffer's top row and each later
+            // row one below, through a negative row stride (the library's strides are unsigned
+            // and wrap, which is how it takes negative ones).
+            const ptrdiff_t rowBytes = ptrdiff_t(out.rowBytes());
+            const uintptr_t top = reinterpret_cast<uintptr_t>(out.row(info_.height - 1));
             Imf::FrameBuffer fb;
             for (size_t c = 0; c < channels_.size(); ++c) {
-                char *base = first + c * cb - ptrdiff_t(minX_) * ptrdiff_t(xStride) -
-                             ptrdiff_t(minY_) * ptrdiff_t(yStride);
-                fb.insert(channels_[c], Imf::Slice(type, base, xStride, yStride));
+                const uintptr_t base = top + c * cb - uintptr_t(ptrdiff_t(minX_) * ptrdiff_t(xStride)) +
+                                       uintptr_t(ptrdiff_t(minY_) * rowBytes);
+                fb.insert(channels_[c], Imf::Slice(type, reinterpret_cast<char *>(base), xStride,
+                                                   size_t(-rowBytes)));
             }
             if (activeTiles_.empty()) {
                 Imf::InputFile file(stream);
                 file.setFrameBuffer(fb);
                 file.readPixels(minY_, minY_ + info_.height - 1);
-                out.flipRows();
                 return true;
             }
             std::memset(out.data(), 0, size_t(out.sizeBytes()));
@@ -156,7 +158,6 @@ public:
                     const Imath::Box2i box = file.dataWindowForTile(tx, ty, 0);
                     if (tileActive(box)) file.readTile(tx, ty, 0);
                 }
-            out.flipRows();
             return true;
         } catch (const std::exception &e) {
             message(kMsgError, 3, "Error reading EXRFile: %s", e.what());
