@@ -59,7 +59,8 @@ const std::vector<ox::TextureLookup> &lookups() {
             const float aniso = 1.0f + 7.0f * rng.next();
             const float angle = 6.2831853f * rng.next();
             const float c = std::cos(angle), s = std::sin(angle);
-            l = {rng.next(), rng.next(), c * width * aniso, s * width * aniso, -s * width, c * width};
+            l = {rng.next(),        rng.next(), c * width * aniso,
+                 s * width * aniso, -s * width, c * width};
         }
         return v;
     }();
@@ -91,7 +92,8 @@ BENCHMARK(BM_LookupAniso);
 
 std::string benchDir() {
     static const std::string dir = [] {
-        auto d = std::filesystem::temp_directory_path() / ("ox_texture_bench_" + std::to_string(::getpid()));
+        auto d = std::filesystem::temp_directory_path() /
+                 ("ox_texture_bench_" + std::to_string(::getpid()));
         std::filesystem::create_directories(d);
         return d.string();
     }();
@@ -108,7 +110,8 @@ const std::string &pngFile() {
         std::vector<uint8_t> px(size_t(kLoadSize) * kLoadSize * 4);
         for (int y = 0; y < kLoadSize; ++y)
             for (int x = 0; x < kLoadSize; ++x)
-                for (int c = 0; c < 4; ++c) px[(size_t(y) * kLoadSize + x) * 4 + c] = pattern(x, y, c);
+                for (int c = 0; c < 4; ++c)
+                    px[(size_t(y) * kLoadSize + x) * 4 + c] = pattern(x, y, c);
         png_image_write_to_file(&img, f.c_str(), 0, px.data(), 0, nullptr);
         return f;
     }();

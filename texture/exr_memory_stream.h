@@ -1,12 +1,11 @@
 #pragma once
 
+#include <Iex.h>
 #include <ImfIO.h>
 
 #include <cstdint>
 #include <cstring>
 #include <string>
-
-#include <Iex.h>
 
 /// An OpenEXR input stream over bytes in memory, so that EXR files are decoded from the same
 /// buffers as every other format.

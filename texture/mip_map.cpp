@@ -107,7 +107,8 @@ void downsampleLevel(const TexelBuffer &src, TexelBuffer &dst) {
             break;
         case TexelType::kF16:
             if (even)
-                downsampleEven<Imath::half, float>(src, dst, [](float v) { return Imath::half(v); });
+                downsampleEven<Imath::half, float>(src, dst,
+                                                   [](float v) { return Imath::half(v); });
             else
                 downsampleTyped<Imath::half>(src, dst,
                                              [](double v) { return Imath::half(float(v)); });

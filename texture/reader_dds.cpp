@@ -122,8 +122,7 @@ public:
             return false;
         }
         if (width == 0 || height == 0 || width > INT32_MAX || height > INT32_MAX) {
-            message(kMsgError, 3, "Error opening texture %s (%s)", name.c_str(),
-                    "bad image size");
+            message(kMsgError, 3, "Error opening texture %s (%s)", name.c_str(), "bad image size");
             return false;
         }
         info_.width = int32_t(width);

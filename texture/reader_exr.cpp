@@ -3,6 +3,7 @@
 // files written by this system carry the active-tiles attribute; only their active tiles are
 // read, the others stay empty. Every library exception is caught here.
 
+#include <Iex.h>
 #include <ImfChannelList.h>
 #include <ImfFrameBuffer.h>
 #include <ImfHeader.h>
@@ -10,7 +11,6 @@
 #include <ImfInputFile.h>
 #include <ImfStringAttribute.h>
 #include <ImfTiledInputFile.h>
-#include <Iex.h>
 
 #include <algorithm>
 #include <cstring>
@@ -39,7 +39,8 @@ public:
             Imf::InputFile file(stream);
             const Imf::Header &header = file.header();
             const Imath::Box2i dw = header.dataWindow();
-            const int64_t w = int64_t(dw.max.x) - dw.min.x + 1, h = int64_t(dw.max.y) - dw.min.y + 1;
+            const int64_t w = int64_t(dw.max.x) - dw.min.x + 1,
+                          h = int64_t(dw.max.y) - dw.min.y + 1;
             if (w <= 0 || h <= 0 || w > INT32_MAX || h > INT32_MAX) {
                 message(kMsgError, 3, "Error reading EXRFile: %s", name.c_str());
                 return false;
@@ -95,8 +96,8 @@ public:
             minY_ = dw.min.y;
             tiled_ = header.hasTileDescription();
             if (tiled_ && !options.layer.empty()) {
-                const auto *attr = header.findTypedAttribute<Imf::StringAttribute>(
-                    kActiveTilesAttribute);
+                const auto *attr =
+                    header.findTypedAttribute<Imf::StringAttribute>(kActiveTilesAttribute);
                 if (!attr) {
                     message(kMsgWarning, 3,
                             "No OpenEXR meta-data in file %s, required for optimized reading",
@@ -139,7 +140,8 @@ public:
             const uintptr_t top = reinterpret_cast<uintptr_t>(out.row(info_.height - 1));
             Imf::FrameBuffer fb;
             for (size_t c = 0; c < channels_.size(); ++c) {
-                const uintptr_t base = top + c * cb - uintptr_t(ptrdiff_t(minX_) * ptrdiff_t(xStride)) +
+                const uintptr_t base = top + c * cb -
+                                       uintptr_t(ptrdiff_t(minX_) * ptrdiff_t(xStride)) +
                                        uintptr_t(ptrdiff_t(minY_) * rowBytes);
                 fb.insert(channels_[c], Imf::Slice(type, reinterpret_cast<char *>(base), xStride,
                                                    size_t(-rowBytes)));
@@ -173,8 +175,10 @@ private:
         const int64_t x0 = (int64_t(box.min.x) - minX_) / kActiveTileSize;
         const int64_t x1 = (int64_t(box.max.x) - minX_) / kActiveTileSize;
         // File row r is picture row height - 1 - r counted from the bottom.
-        const int64_t y0 = (int64_t(info_.height) - 1 - (int64_t(box.max.y) - minY_)) / kActiveTileSize;
-        const int64_t y1 = (int64_t(info_.height) - 1 - (int64_t(box.min.y) - minY_)) / kActiveTileSize;
+        const int64_t y0 =
+            (int64_t(info_.height) - 1 - (int64_t(box.max.y) - minY_)) / kActiveTileSize;
+        const int64_t y1 =
+            (int64_t(info_.height) - 1 - (int64_t(box.min.y) - minY_)) / kActiveTileSize;
         for (int64_t y = y0; y <= y1; ++y)
             for (int64_t x = x0; x <= x1; ++x)
                 if (activeTiles_[size_t(y * cols + x)] == '1') return true;

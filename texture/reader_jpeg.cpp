@@ -1,10 +1,10 @@
 // JPEG through libjpeg: grey and colour (YCbCr, RGB, CMYK and YCCK converted to RGB).
 // Library errors come back through a jump out of the error manager and become a failed read.
 
+#include <jpeglib.h>
+
 #include <csetjmp>
 #include <cstdio>
-
-#include <jpeglib.h>
 
 #include "core/message.h"
 #include "texture/image_reader.h"

@@ -92,11 +92,10 @@ public:
         info_.height = int32_t(h);
         const bool plainLayout = (photometric == PHOTOMETRIC_MINISBLACK && spp <= 2) ||
                                  (photometric == PHOTOMETRIC_RGB && spp >= 3);
-        const bool plainSamples = (bits == 8 && format == SAMPLEFORMAT_UINT) ||
-                                  (bits == 16 && (format == SAMPLEFORMAT_UINT ||
-                                                  format == SAMPLEFORMAT_IEEEFP)) ||
-                                  (bits == 32 && (format == SAMPLEFORMAT_UINT ||
-                                                  format == SAMPLEFORMAT_IEEEFP));
+        const bool plainSamples =
+            (bits == 8 && format == SAMPLEFORMAT_UINT) ||
+            (bits == 16 && (format == SAMPLEFORMAT_UINT || format == SAMPLEFORMAT_IEEEFP)) ||
+            (bits == 32 && (format == SAMPLEFORMAT_UINT || format == SAMPLEFORMAT_IEEEFP));
         direct_ = plainLayout && plainSamples;
         if (direct_) {
             info_.bitsPerChannel = bits;
@@ -133,7 +132,9 @@ public:
 private:
     bool fail(const char *why = nullptr) {
         message(kMsgError, 3, "Error opening texture %s (%s)", name_.c_str(),
-                why && *why ? why : file_.error.empty() ? "cannot read TIFF" : file_.error.c_str());
+                why && *why           ? why
+                : file_.error.empty() ? "cannot read TIFF"
+                                      : file_.error.c_str());
         return false;
     }
 
@@ -153,8 +154,7 @@ private:
         if (size_t(lineSize) < size_t(info_.width) * bps) return false;
         for (int s = 0; s < spp_; ++s)
             for (int32_t y = 0; y < info_.height; ++y) {
-                if (TIFFReadScanline(tif_, line.data(), uint32_t(y), uint16_t(s)) < 0)
-                    return false;
+                if (TIFFReadScanline(tif_, line.data(), uint32_t(y), uint16_t(s)) < 0) return false;
                 uint8_t *dst = out.row(y) + size_t(s) * bps;
                 for (int32_t x = 0; x < info_.width; ++x)
                     std::memcpy(dst + size_t(x) * spp_ * bps, line.data() + size_t(x) * bps, bps);

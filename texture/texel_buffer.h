@@ -32,7 +32,9 @@ struct TexelFormat {
     static bool fromBits(int bitsPerChannel, bool isFloat, int channels, TexelFormat &out);
     int bitsPerChannel() const { return bytesPerChannel() * 8; }
     int bytesPerChannel() const {
-        return type == TexelType::kU8 ? 1 : (type == TexelType::kU16 || type == TexelType::kF16) ? 2 : 4;
+        return type == TexelType::kU8                                 ? 1
+               : (type == TexelType::kU16 || type == TexelType::kF16) ? 2
+                                                                      : 4;
     }
     int bytesPerTexel() const { return bytesPerChannel() * channels; }
     bool isFloat() const { return type == TexelType::kF16 || type == TexelType::kF32; }
@@ -66,7 +68,9 @@ public:
     int32_t height() const { return height_; }
     TexelFormat format() const { return format_; }
     bool empty() const { return !data_; }
-    uint64_t sizeBytes() const { return uint64_t(width_) * uint64_t(height_) * format_.bytesPerTexel(); }
+    uint64_t sizeBytes() const {
+        return uint64_t(width_) * uint64_t(height_) * format_.bytesPerTexel();
+    }
     size_t rowBytes() const { return size_t(width_) * format_.bytesPerTexel(); }
     uint8_t *data() { return data_.get(); }
     const uint8_t *data() const { return data_.get(); }

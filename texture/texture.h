@@ -144,8 +144,8 @@ inline Color aniso(const MipImage &img, const TextureLookup &at) {
     }
     const float major = std::sqrt(la), minor = std::sqrt(lb);
     if (!(major > 1.0f)) return bilinear(img.level(0), at.u, at.v);
-    const int taps = int(std::clamp(std::ceil(major / std::max(minor, 1e-6f)), 1.0f,
-                                    float(kMaxAnisoTaps)));
+    const int taps =
+        int(std::clamp(std::ceil(major / std::max(minor, 1e-6f)), 1.0f, float(kMaxAnisoTaps)));
     const float lod = lodOf(major / float(taps));
     // Taps spread evenly over the major axis, centred on the lookup point.
     const float du = (f.ax / float(img.width())), dv = (f.ay / float(img.height()));

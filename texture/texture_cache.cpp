@@ -68,8 +68,9 @@ TextureCache::TextureCache(std::string directory, bool readOnly)
 std::string TextureCache::cacheFileName(const std::string &source,
                                         const ReaderOptions &options) const {
     char hex[17];
-    std::snprintf(hex, sizeof hex, "%016llx",
-                  static_cast<unsigned long long>(hashText(absolutePath(source) + "\n" + options.key())));
+    std::snprintf(
+        hex, sizeof hex, "%016llx",
+        static_cast<unsigned long long>(hashText(absolutePath(source) + "\n" + options.key())));
     return directory_ + hex + ".exr";
 }
 
@@ -176,10 +177,10 @@ bool TextureCache::store(const std::string &source, const ReaderOptions &options
         return false;
     }
     const TexelFormat native = image.level(0).format();
-    const TexelFormat stored{
-        native.type == TexelType::kU8 || native.type == TexelType::kF16 ? TexelType::kF16
-                                                                        : TexelType::kF32,
-        4};
+    const TexelFormat stored{native.type == TexelType::kU8 || native.type == TexelType::kF16
+                                 ? TexelType::kF16
+                                 : TexelType::kF32,
+                             4};
     AtomicFile out(file);
     const std::string &temp = out.tempPath();
     if (temp.empty()) return false;

@@ -86,7 +86,8 @@ std::shared_ptr<const MipImage> TextureFactory::load(const std::string &fileName
     // A file is not much larger than the largest image it may hold; the slack is for headers,
     // thumbnails and metadata.
     const uint64_t maxFileBytes = settings_.maxImageBytes + (uint64_t(1) << 20);
-    if (!FileSystemUtilities::readFile(fileName, bytes, size_t(std::min<uint64_t>(maxFileBytes, SIZE_MAX)))) {
+    if (!FileSystemUtilities::readFile(fileName, bytes,
+                                       size_t(std::min<uint64_t>(maxFileBytes, SIZE_MAX)))) {
         const int err = FileSystemUtilities::lastError();
         message(kMsgError, 3, "Error opening texture %s (%s)", fileName.c_str(),
                 err ? std::strerror(err) : "cannot read the file");
@@ -103,7 +104,8 @@ std::shared_ptr<const MipImage> TextureFactory::load(const std::string &fileName
     TexelFormat format;
     if (!TexelFormat::fromBits(info.bitsPerChannel, info.isFloat,
                                (info.grey ? 1 : 3) + (info.alpha ? 1 : 0), format)) {
-        message(kMsgWarning, 3, "Could not create appropriate texelbuffer for %d, %d. Defaulting to 8, 4",
+        message(kMsgWarning, 3,
+                "Could not create appropriate texelbuffer for %d, %d. Defaulting to 8, 4",
                 info.bitsPerChannel, (info.grey ? 1 : 3) + (info.alpha ? 1 : 0));
         format = {TexelType::kU8, 4};
     }

@@ -67,8 +67,7 @@ private:
         std::shared_ptr<const MipImage> image;
     };
 
-    std::shared_ptr<const MipImage> load(const std::string &fileName,
-                                         const ReaderOptions &options);
+    std::shared_ptr<const MipImage> load(const std::string &fileName, const ReaderOptions &options);
 
     TextureSettings settings_;
     std::mutex mutex_;  // guards registry_ and entries_

@@ -20,8 +20,8 @@ protected:
     void SetUp() override {
         TempDirTest::SetUp();
         ::unsetenv(ox::kTextureCacheEnvironment);
-        oxtest::writeBytes("pic.tga", oxtest::makeTGA(oxtest::testPicture(9, 6), true, false, true,
-                                                      false, true));
+        oxtest::writeBytes(
+            "pic.tga", oxtest::makeTGA(oxtest::testPicture(9, 6), true, false, true, false, true));
     }
     static const ox::MipImage *imageOf(const std::unique_ptr<ox::OXTexture> &t) {
         auto *it = dynamic_cast<const ox::ImageTexture *>(t.get());
@@ -80,8 +80,8 @@ TEST_F(TextureFactoryTest, ThreadsAskingForOneFileGetOneRead) {
 
 TEST_F(TextureFactoryTest, FilesThatCannotBeReadGiveNoTextureAndOneMessage) {
     oxtest::writeBytes("bad.png", {1, 2, 3});
-    oxtest::writeBytes("big.tga", oxtest::makeTGA(oxtest::testPicture(64, 64), false, false, true,
-                                                  false, false));
+    oxtest::writeBytes(
+        "big.tga", oxtest::makeTGA(oxtest::testPicture(64, 64), false, false, true, false, false));
     ox::TextureSettings small;
     small.maxImageBytes = 64 * 64 * 4 - 1;
     ox::TextureFactory f(small);
@@ -107,18 +107,22 @@ TEST_F(TextureFactoryTest, FilesThatCannotBeReadGiveNoTextureAndOneMessage) {
 TEST_F(TextureFactoryTest, ALayoutWithoutBufferBecomesEightBitRGBA) {
     // A reader announcing 12 bits: the image is converted, never written in another layout.
     struct Reader final : ox::ImageReader {
-        bool open(const std::string &, const uint8_t *, size_t, const ox::ReaderOptions &) override {
+        bool open(const std::string &, const uint8_t *, size_t,
+                  const ox::ReaderOptions &) override {
             info_.width = 3, info_.height = 2, info_.bitsPerChannel = 12;
             return true;
         }
         bool readPixels(ox::TexelBuffer &out, const ox::ReadLimits &) override {
             if (!out.allocate("odd", 3, 2, {ox::TexelType::kU16, 1})) return false;
-            for (int i = 0; i < 6; ++i) reinterpret_cast<uint16_t *>(out.data())[i] = uint16_t(i * 13107);
+            for (int i = 0; i < 6; ++i)
+                reinterpret_cast<uint16_t *>(out.data())[i] = uint16_t(i * 13107);
             return true;
         }
     };
     struct Factory final : ox::IRFactory {
-        std::unique_ptr<ox::ImageReader> create() const override { return std::make_unique<Reader>(); }
+        std::unique_ptr<ox::ImageReader> create() const override {
+            return std::make_unique<Reader>();
+        }
     };
     oxtest::writeBytes("pic.odd", {0});
     ox::TextureFactory f;
@@ -168,8 +172,8 @@ TEST_F(TextureFactoryTest, CacheIsWrittenReusedRefreshedAndRepaired) {
     EXPECT_EQ(entries.size(), 1u);  // no temporary file left behind
 
     // A changed source is read again (and recached).
-    oxtest::writeBytes("pic.tga", oxtest::makeTGA(oxtest::testPicture(9, 6), false, false, true,
-                                                  false, false));
+    oxtest::writeBytes(
+        "pic.tga", oxtest::makeTGA(oxtest::testPicture(9, 6), false, false, true, false, false));
     fromCache(0, "changed source");
     fromCache(1, "recached");
 
@@ -192,7 +196,8 @@ TEST_F(TextureFactoryTest, CacheIsWrittenReusedRefreshedAndRepaired) {
 
 TEST_F(TextureFactoryTest, CacheOfAnHDRImageKeepsItsLayoutAndTheEnvironmentTurnsItOn) {
     std::vector<std::array<uint8_t, 4>> texels(20 * 10);
-    for (size_t i = 0; i < texels.size(); ++i) oxtest::rgbe(float(i) * 0.37f, 2.0f, 0.001f * float(i), texels[i].data());
+    for (size_t i = 0; i < texels.size(); ++i)
+        oxtest::rgbe(float(i) * 0.37f, 2.0f, 0.001f * float(i), texels[i].data());
     oxtest::writeBytes("sky.hdr", oxtest::makeHDR(20, 10, texels, true, true));
     ::setenv(ox::kTextureCacheEnvironment, "envcache", 1);
     std::unique_ptr<ox::OXTexture> first;

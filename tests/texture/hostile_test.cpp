@@ -26,8 +26,8 @@ const ox::ReaderRegistry &registry() {
 
 bool decode(const std::string &ext, const Bytes &b, const ox::ReadLimits &limits = {}) {
     ox::TexelBuffer out;
-    const bool ok = ox::decodeImage(registry(), ext, "hostile." + ext, b.data(), b.size(), {},
-                                    limits, out);
+    const bool ok =
+        ox::decodeImage(registry(), ext, "hostile." + ext, b.data(), b.size(), {}, limits, out);
     // A failed read leaves no half-filled buffer behind.
     EXPECT_TRUE(ok || out.empty());
     return ok;
@@ -52,8 +52,8 @@ std::vector<std::pair<std::string, Bytes>> samples() {
         {"png", oxtest::makePNG(p, PNG_COLOR_TYPE_PALETTE, 8)},
         {"jpg", oxtest::makeJPEG(p, false)},
     };
-    const std::string dir = std::filesystem::temp_directory_path() /
-                            ("ox_hostile_" + std::to_string(::getpid()));
+    const std::string dir =
+        std::filesystem::temp_directory_path() / ("ox_hostile_" + std::to_string(::getpid()));
     std::filesystem::create_directories(dir);
     auto f = [](int x, int y, int c) { return float(x - y + c); };
     if (oxtest::writeTIFF<float>(dir + "/a.tif", 13, 9, 3, SAMPLEFORMAT_IEEEFP, false, f))
@@ -118,7 +118,8 @@ TEST(HostileImages, FlippedBytesNeverReadOutOfBounds) {
 
 /// Rewrites the IHDR size of a PNG and its checksum.
 Bytes pngWithSize(Bytes b, uint32_t w, uint32_t h) {
-    for (int i = 0; i < 4; ++i) b[16 + i] = uint8_t(w >> (24 - 8 * i)), b[20 + i] = uint8_t(h >> (24 - 8 * i));
+    for (int i = 0; i < 4; ++i)
+        b[16 + i] = uint8_t(w >> (24 - 8 * i)), b[20 + i] = uint8_t(h >> (24 - 8 * i));
     const uLong crc = crc32(0, b.data() + 12, 17);
     for (int i = 0; i < 4; ++i) b[29 + i] = uint8_t(crc >> (24 - 8 * i));
     return b;
@@ -134,7 +135,8 @@ TEST(HostileImages, HugeSizesAreRefusedBeforeAllocation) {
     const Bytes bmp = oxtest::makeBMP(p, 32, false);
     const Bytes dds = oxtest::makeDDS(4, 4, "DXT1", Bytes(8, 0));
     const Bytes png = oxtest::makePNG(p, PNG_COLOR_TYPE_RGBA, 8);
-    const std::string hdrHead = "#?RADIANCE\nFORMAT=32-bit_rle_rgbe\n\n-Y 2000000000 +X 2000000000\n";
+    const std::string hdrHead =
+        "#?RADIANCE\nFORMAT=32-bit_rle_rgbe\n\n-Y 2000000000 +X 2000000000\n";
     const std::string hdrMid = "#?RADIANCE\nFORMAT=32-bit_rle_rgbe\n\n-Y 9000 +X 9000\n";
     struct Case {
         const char *what, *ext;
@@ -148,7 +150,8 @@ TEST(HostileImages, HugeSizesAreRefusedBeforeAllocation) {
         {"bmp most negative height", "bmp", patch(bmp, 22, {0x00, 0x00, 0x00, 0x80})},
         {"bmp -30000 high", "bmp", patch(bmp, 22, {0xd0, 0x8a, 0xff, 0xff})},
         {"bmp pixel offset past the end", "bmp", patch(bmp, 10, {0xff, 0xff, 0xff, 0x0f})},
-        {"dds 2^31-1 square", "dds", patch(dds, 12, {0xff, 0xff, 0xff, 0x7f, 0xff, 0xff, 0xff, 0x7f})},
+        {"dds 2^31-1 square", "dds",
+         patch(dds, 12, {0xff, 0xff, 0xff, 0x7f, 0xff, 0xff, 0xff, 0x7f})},
         {"dds 2^32-1 wide", "dds", patch(dds, 16, {0xff, 0xff, 0xff, 0xff})},
         {"png 1000000 square", "png", pngWithSize(png, 1000000, 1000000)},
         {"png 2^31-1 wide", "png", pngWithSize(png, 0x7fffffff, 1)},
@@ -188,10 +191,10 @@ TEST(HostileImages, BadRunLengthsAndWrongMagic) {
         b.resize(b.size() + 64, 0);
         return b;
     };
-    EXPECT_FALSE(decode("hdr", hdr({2, 2, 0, 8, 128 + 9, 1})));   // run of 9 in a row of 8
-    EXPECT_FALSE(decode("hdr", hdr({2, 2, 0, 8, 0})));            // zero-length literal
-    EXPECT_FALSE(decode("hdr", hdr({2, 2, 0, 9, 128 + 8, 1})));   // header for 9 texels
-    EXPECT_FALSE(decode("hdr", hdr({1, 1, 1, 200})));             // repeat with nothing before
+    EXPECT_FALSE(decode("hdr", hdr({2, 2, 0, 8, 128 + 9, 1})));  // run of 9 in a row of 8
+    EXPECT_FALSE(decode("hdr", hdr({2, 2, 0, 8, 0})));           // zero-length literal
+    EXPECT_FALSE(decode("hdr", hdr({2, 2, 0, 9, 128 + 8, 1})));  // header for 9 texels
+    EXPECT_FALSE(decode("hdr", hdr({1, 1, 1, 200})));            // repeat with nothing before
     const std::string xyze = "#?RADIANCE\nFORMAT=32-bit_rle_xyze\n\n-Y 1 +X 1\n\1\1\1\1";
     EXPECT_FALSE(decode("hdr", Bytes(xyze.begin(), xyze.end())));
 
@@ -216,13 +219,12 @@ TEST(HostileImages, BadRunLengthsAndWrongMagic) {
     header[4] = 100;
     for (const Bytes &b : {cube, dxt9, plain, header}) EXPECT_FALSE(decode("dds", b));
     const std::string out = GetCapturedStdout();
-    for (const char *m : {"Volume and cube map DDS files not supported",
-                          "Unsupported compression type in DDS file",
-                          "Reading of non compressed DDS files not supported",
-                          "Invalid header size in DDS file (100)",
-                          "Invalid Magic Number in DDS file (hostile.dds)",
-                          "Unsupported image format in tga file hostile.tga (imageType = 7)",
-                          "Unable to read HDRImage hostile.hdr"})
+    for (const char *m :
+         {"Volume and cube map DDS files not supported", "Unsupported compression type in DDS file",
+          "Reading of non compressed DDS files not supported",
+          "Invalid header size in DDS file (100)", "Invalid Magic Number in DDS file (hostile.dds)",
+          "Unsupported image format in tga file hostile.tga (imageType = 7)",
+          "Unable to read HDRImage hostile.hdr"})
         EXPECT_NE(out.find(m), std::string::npos) << m;
 }
 

@@ -48,16 +48,11 @@ inline Picture testPicture(int w, int h) {
     return p;
 }
 
-inline void put16(Bytes &b, unsigned v) {
-    b.push_back(uint8_t(v)), b.push_back(uint8_t(v >> 8));
-}
-inline void put32(Bytes &b, uint32_t v) {
-    put16(b, v & 0xffff), put16(b, v >> 16);
-}
+inline void put16(Bytes &b, unsigned v) { b.push_back(uint8_t(v)), b.push_back(uint8_t(v >> 8)); }
+inline void put32(Bytes &b, uint32_t v) { put16(b, v & 0xffff), put16(b, v >> 16); }
 
 /// TGA: type 2/10 (colour, 24 or 32 bits) or 3/11 (grey from the red channel, 8 bits).
-inline Bytes makeTGA(const Picture &p, bool rle, bool grey, bool alpha, bool topDown,
-                     bool footer) {
+inline Bytes makeTGA(const Picture &p, bool rle, bool grey, bool alpha, bool topDown, bool footer) {
     Bytes b;
     const int bpp = grey ? 1 : alpha ? 4 : 3;
     b.push_back(3);  // id length
@@ -226,13 +221,16 @@ inline Bytes makePNG(const Picture &p, int colorType, int depth) {
     if (colorType == PNG_COLOR_TYPE_PALETTE) {
         std::vector<png_color> pal(256);
         std::vector<png_byte> trans(256);
-        for (int i = 0; i < 256; ++i) pal[i] = {png_byte(i), png_byte(255 - i), 7}, trans[i] = png_byte(i);
+        for (int i = 0; i < 256; ++i)
+            pal[i] = {png_byte(i), png_byte(255 - i), 7}, trans[i] = png_byte(i);
         png_set_PLTE(png, info, pal.data(), 256);
         png_set_tRNS(png, info, trans.data(), 256, nullptr);
     }
     png_write_info(png, info);
-    const int channels = colorType == PNG_COLOR_TYPE_RGBA ? 4 : colorType == PNG_COLOR_TYPE_RGB ? 3
-                         : colorType == PNG_COLOR_TYPE_GRAY_ALPHA ? 2 : 1;
+    const int channels = colorType == PNG_COLOR_TYPE_RGBA         ? 4
+                         : colorType == PNG_COLOR_TYPE_RGB        ? 3
+                         : colorType == PNG_COLOR_TYPE_GRAY_ALPHA ? 2
+                                                                  : 1;
     const int bytes = depth / 8;
     std::vector<uint8_t> row(size_t(p.w) * channels * bytes);
     for (int y = 0; y < p.h; ++y) {
@@ -340,8 +338,8 @@ inline Bytes readBytes(const std::string &path) {
     return Bytes(t.begin(), t.end());
 }
 inline void writeBytes(const std::string &path, const Bytes &b) {
-    std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char *>(b.data()),
-                                                std::streamsize(b.size()));
+    std::ofstream(path, std::ios::binary)
+        .write(reinterpret_cast<const char *>(b.data()), std::streamsize(b.size()));
 }
 
 }  // namespace oxtest

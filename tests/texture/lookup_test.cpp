@@ -67,7 +67,8 @@ TEST(Lookups, BilinearBetweenFourKnownTexels) {
     EXPECT_FLOAT_EQ(at(0.5f, 0.5f), 1.5f);
     EXPECT_FLOAT_EQ(at(0.5f, 0.25f), 0.5f);
     // A quarter of the way from x = 0 to 1, three quarters from y = 0 to 1.
-    EXPECT_FLOAT_EQ(at(0.375f, 0.625f), (0.75f * 0 + 0.25f * 1) * 0.25f + (0.75f * 2 + 0.25f * 3) * 0.75f);
+    EXPECT_FLOAT_EQ(at(0.375f, 0.625f),
+                    (0.75f * 0 + 0.25f * 1) * 0.25f + (0.75f * 2 + 0.25f * 3) * 0.75f);
     // The texture repeats: u = 1.25 is u = 0.25; between the edges it blends across the seam.
     EXPECT_FLOAT_EQ(at(1.25f, -0.75f), 0.0f);
     EXPECT_FLOAT_EQ(at(0.0f, 0.25f), 0.5f);
@@ -118,10 +119,14 @@ TEST(Lookups, EWAFollowsAFootprintRotatedFortyFiveDegrees) {
 TEST(Lookups, HostileCoordinatesGiveFiniteColours) {
     auto img = greyImage(8, 4, [](int x, int y) { return float(x * y); });
     const float inf = std::numeric_limits<float>::infinity(), nan = std::nanf("");
-    const ox::TextureLookup cases[] = {
-        {nan, nan}, {inf, -inf}, {1e30f, -1e30f}, {0.5f, 0.5f, inf, 0, 0, 1},
-        {0.5f, 0.5f, nan, nan, nan, nan}, {0.5f, 0.5f, 1e30f, 1e30f, 1e-30f, 0},
-        {0.5f, 0.5f, 1e6f, 0, 0, 1e6f}, {-3.2f, 7.9f, 0.3f, -0.2f, 0.1f, 0.4f}};
+    const ox::TextureLookup cases[] = {{nan, nan},
+                                       {inf, -inf},
+                                       {1e30f, -1e30f},
+                                       {0.5f, 0.5f, inf, 0, 0, 1},
+                                       {0.5f, 0.5f, nan, nan, nan, nan},
+                                       {0.5f, 0.5f, 1e30f, 1e30f, 1e-30f, 0},
+                                       {0.5f, 0.5f, 1e6f, 0, 0, 1e6f},
+                                       {-3.2f, 7.9f, 0.3f, -0.2f, 0.1f, 0.4f}};
     for (int mode = 0; mode <= 5; ++mode) {
         auto tex = ox::makeTexture(img, mode);
         for (const auto &c : cases) {
