@@ -1,10 +1,12 @@
 // JPEG through libjpeg: grey and colour (YCbCr, RGB, CMYK and YCCK converted to RGB).
 // Library errors come back through a jump out of the error manager and become a failed read.
 
-#include <jpeglib.h>
-
+// clang-format off
 #include <csetjmp>
+#include <cstddef>
 #include <cstdio>
+#include <jpeglib.h>  // needs size_t and FILE declared before it
+// clang-format on
 
 #include "core/message.h"
 #include "texture/image_reader.h"

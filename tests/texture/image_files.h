@@ -13,6 +13,8 @@
 #include <png.h>
 #include <tiffio.h>
 
+#include <algorithm>
+#include <array>
 #include <cmath>
 #include <csetjmp>
 #include <cstdint>
