@@ -18,6 +18,7 @@ struct ErrorManager {
     jpeg_error_mgr pub;
     jmp_buf jump;
     char text[JMSG_LENGTH_MAX];
+    char warning[JMSG_LENGTH_MAX];  // the first warning (a truncated or damaged stream)
 };
 
 void errorExit(j_common_ptr cinfo) {
@@ -26,14 +27,17 @@ void errorExit(j_common_ptr cinfo) {
     longjmp(err->jump, 1);
 }
 
-void silent(j_common_ptr, int) {}
+void onMessage(j_common_ptr cinfo, int level) {
+    auto *err = reinterpret_cast<ErrorManager *>(cinfo->err);
+    if (level < 0 && !err->warning[0]) cinfo->err->format_message(cinfo, err->warning);
+}
 
 class JPEGReader final : public ImageReader {
 public:
     JPEGReader() {
         cinfo_.err = jpeg_std_error(&err_.pub);
         err_.pub.error_exit = errorExit;
-        err_.pub.emit_message = silent;
+        err_.pub.emit_message = onMessage;
         err_.text[0] = 0;
         jpeg_create_decompress(&cinfo_);
     }
@@ -79,6 +83,9 @@ public:
             }
         }
         jpeg_finish_decompress(&cinfo_);
+        // libjpeg fills what a damaged stream lacks; the picture is kept, with one warning.
+        if (err_.warning[0])
+            message(kMsgWarning, 3, "Damaged JPEG file %s (%s)", name_.c_str(), err_.warning);
         return true;
     }
 
