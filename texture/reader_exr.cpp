@@ -11,6 +11,7 @@
 #include <ImfInputFile.h>
 #include <ImfStringAttribute.h>
 #include <ImfTiledInputFile.h>
+#include <ImfVersion.h>
 
 #include <algorithm>
 #include <cstring>
@@ -34,10 +35,16 @@ public:
         name_ = name;
         data_ = data;
         size_ = size;
+        if (!headersFit(data, size)) {
+            message(kMsgError, 3, "Error reading EXRFile: %s", name.c_str());
+            return false;
+        }
         try {
             ExrMemoryStream stream(name, data, size);
-            Imf::InputFile file(stream);
-            const Imf::Header &header = file.header();
+            stream.seekg(8);
+            int version = int(readLE32(data + 4));
+            header_.readFrom(stream, version);
+            const Imf::Header &header = header_;
             const Imath::Box2i dw = header.dataWindow();
             const int64_t w = int64_t(dw.max.x) - dw.min.x + 1,
                           h = int64_t(dw.max.y) - dw.min.y + 1;
@@ -128,6 +135,11 @@ public:
     bool readPixels(TexelBuffer &out, const ReadLimits &limits) override {
         if (!out.allocate(name_, info_.width, info_.height, nativeFormat(), limits.maxImageBytes))
             return false;
+        if (!chunksFit(limits)) {
+            message(kMsgError, 3, "Error reading EXRFile: %s", name_.c_str());
+            out.clear();
+            return false;
+        }
         try {
             ExrMemoryStream stream(name_, data_, size_);
             const Imf::PixelType type = info_.bitsPerChannel == 16 ? Imf::HALF : Imf::FLOAT;
@@ -168,6 +180,65 @@ public:
     }
 
 private:
+    /// Walks the attribute lists of the file's headers (name, type, size, value; an empty name
+    /// ends a header, and an empty header the list of a multi-part file): every size must lie
+    /// within the file before the library is allowed to allocate by it.
+    static bool headersFit(const uint8_t *data, size_t size) {
+        if (size < 8 || readLE32(data) != uint32_t(Imf::MAGIC)) return false;
+        const uint32_t version = readLE32(data + 4);
+        if (Imf::isNonImage(int(version))) return false;  // deep data are not textures
+        ByteReader in(data, size);
+        in.seek(8);
+        auto readName = [&](std::string &text) {
+            text.clear();
+            for (uint8_t c; in.byte(c);) {
+                if (c == 0) return true;
+                if (text.size() >= 255) return false;
+                text += char(c);
+            }
+            return false;
+        };
+        std::string attr, type;
+        for (int header = 0;; ++header) {
+            bool first = true;
+            for (;;) {
+                if (!readName(attr)) return false;
+                if (attr.empty()) break;
+                first = false;
+                uint8_t sz[4];
+                if (!readName(type) || !in.read(sz, 4)) return false;
+                const uint32_t n = readLE32(sz);
+                if (n > in.remaining() || !in.take(n)) return false;
+            }
+            if (first) return header > 0;  // the empty header that ends a multi-part list
+            if (!Imf::isMultiPart(int(version))) return true;
+        }
+    }
+
+    /// The library sizes its chunk table by the image's height (or tile count) and its buffers
+    /// by a chunk's width times every channel of the file: both are checked against the file's
+    /// length and the image limit first.
+    bool chunksFit(const ReadLimits &limits) const {
+        const Imath::Box2i dw = header_.dataWindow();
+        const uint64_t w = uint64_t(int64_t(dw.max.x) - dw.min.x + 1);
+        const uint64_t h = uint64_t(int64_t(dw.max.y) - dw.min.y + 1);
+        uint64_t lineBytes = 0;
+        for (auto it = header_.channels().begin(); it != header_.channels().end(); ++it)
+            lineBytes += (it.channel().type == Imf::HALF ? 2 : 4) * w;
+        uint64_t chunks, chunkLines;
+        if (header_.hasTileDescription()) {
+            const Imf::TileDescription &td = header_.tileDescription();
+            if (td.xSize == 0 || td.ySize == 0) return false;
+            chunks = ((w + td.xSize - 1) / td.xSize) * ((h + td.ySize - 1) / td.ySize);
+            chunkLines = td.ySize;
+            lineBytes = lineBytes / w * std::min<uint64_t>(w, td.xSize);
+        } else {
+            chunks = (h + 255) / 256;  // no compression packs more lines into one chunk
+            chunkLines = std::min<uint64_t>(h, 256);
+        }
+        return chunks <= size_ / 8 && lineBytes <= limits.maxImageBytes / chunkLines;
+    }
+
     /// True when any active-tiles cell (counted from the bottom row of the picture) overlaps the
     /// file's tile.
     bool tileActive(const Imath::Box2i &box) const {
@@ -187,6 +258,7 @@ private:
 
     const uint8_t *data_ = nullptr;
     size_t size_ = 0;
+    Imf::Header header_;
     std::vector<std::string> channels_;
     std::string activeTiles_;
     int minX_ = 0, minY_ = 0;
