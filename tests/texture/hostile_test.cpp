@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 #include <zlib.h>
 
+#include <algorithm>
 #include <array>
 #include <filesystem>
 
@@ -158,7 +159,20 @@ TEST(HostileImages, HugeSizesAreRefusedBeforeAllocation) {
         {"hdr 2e9 square", "hdr", Bytes(hdrHead.begin(), hdrHead.end())},
         {"hdr 9000 square of nothing", "hdr", Bytes(hdrMid.begin(), hdrMid.end())},
     };
+    // EXR: a data window of 2^31 rows (the chunk table would not fit in the file) and an
+    // attribute claiming 2 GiB of value.
+    const Bytes exr = samples().back().second;
+    auto find = [&](const char *text) {
+        const std::string t(text, std::strlen(text) + 1);
+        return size_t(std::search(exr.begin(), exr.end(), t.begin(), t.end()) - exr.begin());
+    };
+    const size_t window = find("dataWindow") + 11 + 6 + 4;  // name, "box2i", size
+    const size_t channels = find("channels") + 9 + 7;       // name, "chlist"
+    ASSERT_LT(window + 16, exr.size());
     CaptureStdout();
+    EXPECT_TRUE(decode("exr", exr));
+    EXPECT_FALSE(decode("exr", patch(exr, window + 12, {0xf0, 0xff, 0xff, 0x7f})));
+    EXPECT_FALSE(decode("exr", patch(exr, channels, {0xff, 0xff, 0xff, 0x7f})));
     for (const Case &c : cases) EXPECT_FALSE(decode(c.ext, c.bytes)) << c.what;
     // Within the file but over the limit of one image.
     ox::ReadLimits small;
