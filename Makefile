@@ -34,9 +34,9 @@ sanitize: deps
 	cd $(SAN_DIR) && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
 		ctest --output-on-failure -j $(JOBS) --timeout 900
 
-# ThreadSanitizer over the test programs of the threads, locks, work server, tile renderer and
-# tiled frame layers.
-TSAN_TESTS ?= platform render
+# ThreadSanitizer over the test programs of the threads, locks, work server, tile renderer,
+# tiled frame layers and the texture manager.
+TSAN_TESTS ?= platform render texture
 tsan: deps
 	cmake -S . -B $(TSAN_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Debug -DOX_SANITIZE=thread -DOX_BUILD_BENCH=OFF
 	cmake --build $(TSAN_DIR) -j $(JOBS) --target $(addsuffix _tests,$(TSAN_TESTS))
