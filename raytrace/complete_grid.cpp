@@ -358,7 +358,7 @@ bool CompleteGrid::query(const Grid &grid, const PrimitiveStore &store, const Ra
             case kItemInstance: {
                 const IntersectInstanceGrid &ig = store.instances[s.inst];
                 const IntersectTriangle &t = ig.store->triangles[s.prim];
-                hit->id = s.fromPacket ? s.id : t.id;
+                hit->id = s.id;
                 hit->instance = ig.instance, hit->flags = ig.flags;
                 hit->primitive = &t;
                 break;

@@ -763,6 +763,7 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 s.limit = t, s.u = u, s.v = v;
                 s.kind = kItemMotion;
                 s.prim = index;
+                s.fromPacket = false;
                 s.found = hit = true;
                 break;
             }
@@ -775,10 +776,14 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 ls.limit = s.limit;
                 if (!inst.grid->traverse<kAny>(local, ls)) break;
                 if constexpr (kAny) return true;
+                // The whole hit comes from the shape grid: the triangle's identifier too, which
+                // a packet of the shape grid carries and an earlier candidate must not leave.
                 s.limit = ls.limit, s.u = ls.u, s.v = ls.v;
                 s.kind = kItemInstance;
                 s.prim = ls.prim;
                 s.inst = index;
+                s.id = ls.fromPacket ? ls.id : inst.store->triangles[ls.prim].id;
+                s.fromPacket = false;
                 s.found = hit = true;
                 break;
             }

@@ -66,10 +66,10 @@ struct TraceState {
     uint8_t kind = 0;   ///< Item kind of the hit (see Grid::ItemKind).
     uint32_t prim = 0;  ///< Index of the triangle (or motion triangle) in its store.
     uint32_t inst = 0;  ///< For hits through an instance: the instance's index in the store.
-    uint32_t id = 0;    ///< Triangle hit: its index inside its shape (from the packet).
+    uint32_t id = 0;  ///< Packet or instance hit: the triangle's index inside its shape.
     uint32_t instance = kNoInstance;  ///< Triangle hit: its scene instance (from the packet).
     uint32_t flags = 0;               ///< Triangle hit: its flag word (from the packet).
-    bool fromPacket = false;          ///< id, instance and flags are set.
+    bool fromPacket = false;          ///< A packet hit: id, instance and flags are its lane's.
 };
 
 /// True when an object with these flags is seen by rays that need one of the required bits.

@@ -4,6 +4,7 @@
 
 #include <cmath>
 #include <limits>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -45,66 +46,118 @@ Mtx4 rotationY(float a) {
     return m;
 }
 
+// How the structure holds an instance: as world copies of its triangles, as a shape grid seen
+// through the placement, or as moving triangles (per-step placements).
+enum class Held { kCopied, kInstanced, kMoving };
+
+// The whole closest hit as the structure must report it. p0 is the first corner of the triangle
+// hit as stored (object space for instanced shapes, world space for copies).
 struct Reference {
-    float t = -1.0f;
-    uint32_t id = 0, instance = kNoInstance;
+    float t = -1.0f, u = 0.0f, v = 0.0f;
+    uint32_t id = 0, instance = kNoInstance, flags = 0;
+    bool moving = false;
+    Vec3 p0;
 };
+
+// How each instance is held under the parameters (the structure's own rule, motion first).
+std::vector<Held> heldAs(const std::vector<InstanceInput> &ins, const ADSParameters &params) {
+    std::map<uint64_t, size_t> uses;
+    for (const InstanceInput &in : ins) ++uses[in.shape];
+    std::vector<Held> held;
+    for (const InstanceInput &in : ins)
+        held.push_back(!in.stepTransforms.empty() ? Held::kMoving
+                       : CompleteGrid::choosesInstancing(params.useInstancing,
+                                                         params.instancingThreshold, uses[in.shape],
+                                                         in.mesh.triangleCount)
+                           ? Held::kInstanced
+                           : Held::kCopied);
+    return held;
+}
 
 // Brute force over every triangle of every instance with the same single-triangle test and the
 // same arithmetic the structure uses: world copies for copied instances, the object-space ray
-// for instanced ones.
-Reference bruteForce(const std::vector<InstanceInput> &ins, bool instanced, const Ray &ray,
-                     float tmax) {
+// for instanced ones, the corners at the ray's time for moving ones. first/count restrict the
+// triangles tested (for checking ties).
+Reference bruteForce(const std::vector<InstanceInput> &ins, const std::vector<Held> &held,
+                     const Ray &ray, float tmax, size_t first = 0, size_t count = SIZE_MAX) {
     Reference best;
     float limit = tmax;
     TraceRay world;
     if (!world.prepare(ray.origin, ray.direction, rayTypeRequiredFlags(ray.type), ray.time))
         return best;
-    for (const InstanceInput &in : ins) {
+    for (size_t k = 0; k < ins.size(); ++k) {
+        const InstanceInput &in = ins[k];
         TraceRay local = world;
         uint32_t flags = in.flags;
-        if (instanced) {
+        if (held[k] == Held::kInstanced) {
             IntersectInstanceGrid ig;
             if (!in.objectToWorld.inverse(ig.worldToObject)) continue;
             ig.testFlags = in.objectToWorld.determinant3() < 0 ? flags ^ kFlagOpposite : flags;
             if (!flagsVisible(flags, world.required) || !instanceRay(ig, world, local)) continue;
             flags = ig.testFlags;
         }
-        for (size_t i = 0; i < in.mesh.triangleCount; ++i) {
+        size_t steps = in.stepTransforms.size() - 1;
+        std::vector<Vec3> corners;
+        for (size_t i = first; i < in.mesh.triangleCount && i - first < count; ++i) {
             Vec3 p[3];
-            for (int c = 0; c < 3; ++c) {
-                p[c] = in.mesh.positions[in.mesh.indices[3 * i + c]];
-                if (!instanced) p[c] = affinePoint(in.objectToWorld, p[c]);
+            for (int c = 0; c < 3; ++c) p[c] = in.mesh.positions[in.mesh.indices[3 * i + c]];
+            if (held[k] == Held::kCopied) {
+                for (Vec3 &q : p) q = affinePoint(in.objectToWorld, q);
+            } else if (held[k] == Held::kMoving) {
+                corners.clear();
+                for (const Mtx4 &m : in.stepTransforms)
+                    for (const Vec3 &q : p) corners.push_back(affinePoint(m, q));
+                MotionHitInterpolator::cornersAt(corners.data(), uint32_t(steps), world.time, p);
             }
             float t, u, v;
             if (intersectTriangle(p[0], p[1] - p[0], p[2] - p[0], flags, local, limit, t, u, v)) {
                 limit = t;
-                best.t = t, best.id = uint32_t(i), best.instance = in.index;
+                best = {t, u, v, uint32_t(i), in.index, in.flags, held[k] == Held::kMoving, p[0]};
             }
         }
     }
     return best;
 }
 
-// Distance at which the named triangle is hit (ties between triangles are legitimate).
-float hitOf(const std::vector<InstanceInput> &ins, bool instanced, const Ray &ray,
-            uint32_t instance, uint32_t id) {
-    for (const InstanceInput &in : ins)
-        if (in.index == instance) {
-            InstanceInput one = in;
-            one.mesh.indices = in.mesh.indices + 3 * id;
-            one.mesh.triangleCount = 1;
-            return bruteForce({one}, instanced, ray, kInfiniteDistance).t;
-        }
-    return -2.0f;
+// The hit on one named triangle (ties between triangles are legitimate).
+Reference hitOf(const std::vector<InstanceInput> &ins, const std::vector<Held> &held,
+                const Ray &ray, uint32_t instance, uint32_t id) {
+    for (size_t k = 0; k < ins.size(); ++k)
+        if (ins[k].index == instance) return bruteForce({ins[k]}, {held[k]}, ray, kInfiniteDistance, id, 1);
+    return Reference();
 }
 
-// Compares closest hits and occlusion answers on random rays from inside the scene box.
-// At least minHits rays must hit (default a sixth), so that the comparison means something.
+// Every field of the hit against the reference; the primitive must be the triangle hit.
+void expectSameHit(const Hit &hit, const Reference &ref, int ray) {
+    EXPECT_EQ(hit.t, ref.t) << "ray " << ray;
+    EXPECT_EQ(hit.u, ref.u) << "ray " << ray;
+    EXPECT_EQ(hit.v, ref.v) << "ray " << ray;
+    EXPECT_EQ(hit.w, 0.0f) << "ray " << ray;
+    EXPECT_EQ(hit.id, ref.id) << "ray " << ray;
+    EXPECT_EQ(hit.instance, ref.instance) << "ray " << ray;
+    EXPECT_EQ(hit.flags, ref.flags) << "ray " << ray;
+    ASSERT_EQ(hit.moving, ref.moving) << "ray " << ray;
+    ASSERT_NE(hit.primitive, nullptr);
+    if (hit.moving) {
+        const auto *mt = static_cast<const MotionTriangle *>(hit.primitive);
+        EXPECT_EQ(mt->id, ref.id) << "ray " << ray;
+        EXPECT_EQ(mt->instance, ref.instance) << "ray " << ray;
+    } else {
+        const auto *tri = static_cast<const IntersectTriangle *>(hit.primitive);
+        EXPECT_EQ(tri->id, ref.id) << "ray " << ray;
+        EXPECT_EQ(tri->p0, ref.p0) << "ray " << ray;
+    }
+}
+
+// Compares whole closest hits and occlusion answers on random rays, most from inside the scene
+// box, at random shutter times. At least minHits rays must hit (default a sixth), so that the
+// comparison means something.
 void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSParameters &params,
-                            bool instanced, int rays, uint64_t seed, int minHits = -1) {
+                            int rays, uint64_t seed, int minHits = -1,
+                            const MotionBlurHandler *motion = nullptr) {
     CompleteGrid grid;
-    ASSERT_TRUE(grid.build(ins, params));
+    ASSERT_TRUE(grid.build(ins, params, motion));
+    std::vector<Held> held = heldAs(ins, params);
     Rng rng(seed);
     BBox box = grid.bounds();
     float diag = box.extent().length();
@@ -122,20 +175,26 @@ void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSPara
         if (ray.direction.lengthSquared() == 0.0f) ray.direction = {0.0f, 1.0f, 0.0f};
         ray.direction = ray.direction.normalized();
         ray.type = i % 3 == 0 ? kRayShadow : kRayPrimary;
+        ray.time = rng.uniform();
         Hit hit;
         bool found = grid.intersect(ray, hit, kInfiniteDistance, nullptr);
-        Reference ref = bruteForce(ins, instanced, ray, kInfiniteDistance);
+        Reference ref = bruteForce(ins, held, ray, kInfiniteDistance);
         ASSERT_EQ(found, ref.t >= 0.0f) << "ray " << i;
         if (found) {
             ++hits;
-            ASSERT_EQ(hit.t, ref.t) << "ray " << i;
+            // Another triangle at exactly the same distance may be reported: then the whole hit
+            // must be that triangle's.
             if (hit.id != ref.id || hit.instance != ref.instance) {
-                ASSERT_EQ(hitOf(ins, instanced, ray, hit.instance, hit.id), ref.t) << "ray " << i;
+                Reference other = hitOf(ins, held, ray, hit.instance, hit.id);
+                ASSERT_EQ(other.t, ref.t) << "ray " << i;
+                ref = other;
             }
+            expectSameHit(hit, ref, i);
+            if (::testing::Test::HasFailure()) return;
         }
         float tmax = diag * rng.uniform() * 0.5f;
         bool occ = grid.occluded(ray, tmax, nullptr);
-        ASSERT_EQ(occ, bruteForce(ins, instanced, ray, tmax).t >= 0.0f) << "ray " << i;
+        ASSERT_EQ(occ, bruteForce(ins, held, ray, tmax).t >= 0.0f) << "ray " << i;
     }
     EXPECT_GT(hits, minHits < 0 ? rays / 6 : minHits);
 }
@@ -155,7 +214,7 @@ TEST(CompleteGridTest, MatchesBruteForceOnOneMeshWithAndWithoutPackingAndNesting
                 CompleteGrid g;
                 ASSERT_TRUE(g.build({instanceOf(blob, 0, Mtx4(), flags, 0)}, p));
                 EXPECT_EQ(g.grid().nestedGridCount() > 0, depth > 0);
-                checkAgainstBruteForce({instanceOf(blob, 0, Mtx4(), flags, 0)}, p, false, 1500,
+                checkAgainstBruteForce({instanceOf(blob, 0, Mtx4(), flags, 0)}, p, 1500,
                                        depth + sse);
             }
 }
@@ -171,7 +230,7 @@ TEST(CompleteGridTest, MatchesBruteForceOverLargeEmptySpacesWithDefaultSettings)
         instanceOf(blob, 1, Mtx4::translation({4.0f, 2.0f, -3.0f}), kAllFlags, 2, "blob")};
     ADSParameters p;
     p.useInstancing = 0;
-    checkAgainstBruteForce(ins, p, false, 3000, 77, 100);
+    checkAgainstBruteForce(ins, p, 3000, 77, 100);
 }
 
 TEST(CompleteGridTest, MatchesBruteForceWithInstancesCopiedOrInstanced) {
@@ -193,7 +252,44 @@ TEST(CompleteGridTest, MatchesBruteForceWithInstancesCopiedOrInstanced) {
             p.useInstancing = mode;
             p.useSSE = sse;
             p.gridThreshold = 4;
-            checkAgainstBruteForce(ins, p, mode == kInstancingAlways, 1500, 7 + mode + sse);
+            checkAgainstBruteForce(ins, p, 1500, 7 + mode + sse);
+        }
+}
+
+TEST(CompleteGridTest, MatchesBruteForceWhenCopiedInstancedAndMovingShapesMeet) {
+    // Default instancing: the blob, placed three times, is instanced (one placement mirrored);
+    // the coil, used twice but small, and the single sphere are copied; one blob moves and is
+    // copied as moving triangles. They interpenetrate, so rays meet packets of copies, shape
+    // grids and moving triangles in the same cells, one after the other.
+    Mesh blob = testmesh::blob(24, 30), coil = testmesh::coil(40, 8, 0.4f),
+         ball = testmesh::blob(10, 12, 0.7f);
+    Mtx4 mirror = Mtx4::scale({-1.0f, 1.0f, 1.0f}) * Mtx4::translation({1.2f, 0.3f, 0.0f});
+    uint32_t single = kAllFlags & ~kFlagDoubleSided;
+    std::vector<InstanceInput> ins = {
+        instanceOf(blob, 0, Mtx4(), single, 0),
+        instanceOf(blob, 0, rotationY(0.9f) * Mtx4::translation({0.8f, 0.4f, 0.2f}), kAllFlags,
+                   1),
+        instanceOf(blob, 0, mirror, single, 2),
+        instanceOf(coil, 1, Mtx4::translation({0.3f, 0.1f, 0.0f}), kAllFlags, 3),
+        instanceOf(coil, 1, rotationY(1.3f) * Mtx4::translation({0.6f, -0.2f, 0.4f}), single, 4),
+        instanceOf(ball, 2, Mtx4::translation({0.5f, 0.2f, -0.1f}), kAllFlags, 5),
+        instanceOf(blob, 3, Mtx4::translation({0.2f, -0.3f, 0.3f}), kAllFlags, 6)};
+    ins[6].stepTransforms = {Mtx4::translation({0.2f, -0.3f, 0.3f}),
+                             rotationY(0.4f) * Mtx4::translation({0.7f, 0.0f, 0.1f})};
+    MotionBlurHandler motion(MotionBlurHandler::k3D, 1);
+    for (bool sse : {true, false})
+        for (uint32_t depth : {0u, 4u}) {
+            SCOPED_TRACE(::testing::Message() << "sse " << sse << " depth " << depth);
+            ADSParameters p;
+            p.useSSE = sse;
+            p.gridMaxDepth = depth;
+            p.gridThreshold = 4;
+            p.instancingThreshold = 1000;
+            std::vector<Held> held = heldAs(ins, p);
+            ASSERT_EQ(held[0], Held::kInstanced);
+            ASSERT_EQ(held[3], Held::kCopied);
+            ASSERT_EQ(held[5], Held::kCopied);
+            checkAgainstBruteForce(ins, p, 3000, 31 + depth + sse, -1, &motion);
         }
 }
 
