@@ -61,6 +61,17 @@ private:
     int32_t table_[kTableSize] = {};
 };
 
+/// The seed of stream `stream` of a run seeded with `seed`: both mixed (SplitMix64 finaliser) so
+/// that neighbouring streams start far apart in the generator's cycle. A tile's generator is
+/// seeded with its run's seed and its index, so its numbers do not depend on which thread
+/// renders it or when.
+constexpr uint64_t streamSeed(uint64_t seed, uint64_t stream) {
+    uint64_t z = seed + 0x9E3779B97F4A7C15ull * (stream + 1);
+    z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ull;
+    z = (z ^ (z >> 27)) * 0x94D049BB133111EBull;
+    return z ^ (z >> 31);
+}
+
 /// Seed of the process-wide generator when it is first used.
 constexpr uint64_t kProcessRandomSeed = 262484787;
 

@@ -45,6 +45,7 @@ bool TileInterface::build(uint32_t xMin, uint32_t xMax, uint32_t yMin, uint32_t 
             t.yMin = uint32_t(yMin + j * th);
             t.yMax = uint32_t(std::min(yMin + (j + 1) * th - 1, int64_t(yMax)));
             t.valid = true;
+            t.index = order[size_t(k)];
         }
     } catch (const std::bad_alloc &) {
         tiles_.clear();

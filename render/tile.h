@@ -11,6 +11,8 @@ namespace ox {
 struct Tile {
     uint32_t xMin = 0, xMax = 0, yMin = 0, yMax = 0;
     bool valid = false;  ///< false for the tile returned when none is left
+    /// Place in the region's tile grid, row * columns + column, whatever the hand-out order.
+    uint32_t index = 0;
 
     /// Width in pixels.
     uint32_t width() const { return xMax - xMin + 1; }

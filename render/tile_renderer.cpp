@@ -3,14 +3,8 @@
 #include <algorithm>
 
 #include "core/message.h"
-#include "core/random.h"
 
 namespace ox {
-namespace {
-
-constexpr uint64_t kRenderThreadSeed = 0xD4D4D4;
-
-}  // namespace
 
 void RenderFrameThread::run() { renderer_.renderThread(index_); }
 
@@ -24,6 +18,8 @@ bool TileRenderer::run(const TileRunSettings &settings, RenderIOInterface &io) {
                             settings.tileWidth, settings.tileHeight);
     // More threads than tiles would only start threads that find nothing to do.
     threadCount_ = std::clamp(settings.threadCount, 1, std::max(1, tiles_->count()));
+    seed_ = settings.seed;
+    random_.assign(size_t(threadCount_), ThreadRandom());
     if (ok) ok = prepare(threadCount_);
     if (ok && tiles_->count() > 0) {
         std::vector<std::unique_ptr<RenderFrameThread>> threads;
@@ -51,7 +47,6 @@ bool TileRenderer::run(const TileRunSettings &settings, RenderIOInterface &io) {
 }
 
 void TileRenderer::renderThread(int threadIndex) {
-    reseedProcessRandom(kRenderThreadSeed);
     Tile tile;
     bool rendered = false;  // a tile was rendered and is not yet counted
     for (;;) {
@@ -71,6 +66,7 @@ void TileRenderer::renderThread(int threadIndex) {
             if (!stop) have = tiles_->nextTile(tile);
         }
         if (!have) return;
+        random_[size_t(threadIndex)].generator.seed(streamSeed(seed_, tile.index));
         rendered = renderTile(threadIndex, tile);
         if (!rendered) {
             failed_.store(true);

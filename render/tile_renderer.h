@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "core/random.h"
 #include "core/render_io.h"
 #include "platform/mutex.h"
 #include "platform/thread.h"
@@ -15,6 +16,9 @@
 /// number of render threads take tiles one by one from one ordered list.
 namespace ox {
 
+/// The seed of a run's tile generators unless the run names another (13948116).
+constexpr uint64_t kDefaultRunSeed = 0xD4D4D4;
+
 /// What a tile run covers and how it is split.
 struct TileRunSettings {
     uint32_t xMin = 0, xMax = 0, yMin = 0, yMax = 0;  ///< inclusive region
@@ -22,6 +26,7 @@ struct TileRunSettings {
     int32_t tileHeight = kDefaultTileSize;            ///< tile edge along y
     int32_t scheme = kTileHilbert;                    ///< TileSchemeType
     int32_t threadCount = 1;                          ///< render threads (at least 1)
+    uint64_t seed = kDefaultRunSeed;                  ///< seed of the tiles' generators
 };
 
 class TileRenderer;
@@ -68,8 +73,13 @@ protected:
     /// threads); false stops the run (after one message).
     virtual bool prepare(int threadCount) { return true; }
     /// Renders one tile on thread threadIndex; false stops the run (after one message).
-    /// Called concurrently from all threads, never with the tile mutex held.
+    /// Called concurrently from all threads, never with the tile mutex held. Random numbers
+    /// come from tileRandom(threadIndex).
     virtual bool renderTile(int threadIndex, const Tile &tile) = 0;
+    /// The generator of the tile thread threadIndex is rendering, seeded with the run's seed
+    /// and the tile's index just before renderTile: a tile draws the same numbers on any
+    /// thread, in any order, with any thread count. Only that thread may use it.
+    Random &tileRandom(int threadIndex) { return random_[size_t(threadIndex)].generator; }
     /// Called on the joining thread after thread threadIndex ended, in index order: merge
     /// that thread's statistics here.
     virtual void threadFinished(int threadIndex) {}
@@ -83,6 +93,12 @@ private:
 
     std::unique_ptr<OXMutex> tileMutex_;  // guards tiles_ hand-out and progress reports
     std::unique_ptr<TileInterface> tiles_;
+    // One generator per thread, each on its own cache lines.
+    struct alignas(64) ThreadRandom {
+        Random generator;
+    };
+    std::vector<ThreadRandom> random_;
+    uint64_t seed_ = kDefaultRunSeed;
     RenderIOInterface *io_ = nullptr;
     int threadCount_ = 0;
     std::atomic<bool> failed_{false};

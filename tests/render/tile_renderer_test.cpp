@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <cstdint>
 #include <thread>
 #include <vector>
 
@@ -46,6 +47,29 @@ private:
     int w_;
     std::vector<std::atomic<int>> pixels_;
     int failAt_;
+};
+
+/// Fills every pixel with bytes drawn from the tile's generator, pixels in row order.
+class NoiseRenderer : public ox::TileRenderer {
+public:
+    NoiseRenderer(int w, int h) : w_(w), bytes_(size_t(w) * size_t(h) * 3) {}
+    const std::vector<uint8_t> &bytes() const { return bytes_; }
+
+protected:
+    bool renderTile(int thread, const ox::Tile &tile) override {
+        ox::Random &random = tileRandom(thread);
+        for (uint32_t y = tile.yMin; y <= tile.yMax; ++y)
+            for (uint32_t x = tile.xMin; x <= tile.xMax; ++x)
+                for (int c = 0; c < 3; ++c)
+                    bytes_[(size_t(y) * size_t(w_) + x) * 3 + size_t(c)] =
+                        uint8_t(random.nextIndex(256));
+        std::this_thread::yield();  // let the other thread take tiles meanwhile
+        return true;
+    }
+
+private:
+    int w_;
+    std::vector<uint8_t> bytes_;  // each tile writes only its own pixels
 };
 
 ox::TileRunSettings settingsFor(int w, int h, int tile, int scheme, int threads) {
@@ -112,6 +136,36 @@ TEST(TileRendererTest, FewTilesAndNoTiles) {
     ASSERT_TRUE(empty.run(s, io));
     EXPECT_EQ(empty.tilesRendered.load(), 0);
     EXPECT_TRUE(empty.released);
+}
+
+
+TEST(TileRendererTest, TileRandomNumbersDependOnTheSeedAndTileOnly) {
+    // 45 x 37 pixels in tiles of 8: a ragged last column and row.
+    auto render = [](int scheme, int threads, uint64_t seed) {
+        NoiseRenderer r(45, 37);
+        oxtest::FakeIO io;
+        ox::TileRunSettings s = settingsFor(45, 37, 8, scheme, threads);
+        s.seed = seed;
+        EXPECT_TRUE(r.run(s, io));
+        return r.bytes();
+    };
+    const std::vector<uint8_t> reference = render(ox::kTileLeftToRight, 1, ox::kDefaultRunSeed);
+    for (int scheme : {ox::kTileHilbert, ox::kTileConcentric, ox::kTileRandom})
+        for (int threads : {1, 2}) {
+            SCOPED_TRACE(::testing::Message() << "scheme " << scheme << " threads " << threads);
+            EXPECT_TRUE(render(scheme, threads, ox::kDefaultRunSeed) == reference);
+        }
+    EXPECT_FALSE(render(ox::kTileLeftToRight, 2, 7) == reference);
+
+    // Tile (1, 0) starts with the system generator seeded from the run seed and its index 1,
+    // and differs from tile 0.
+    ox::Random tile1(ox::streamSeed(ox::kDefaultRunSeed, 1)),
+        tile0(ox::streamSeed(ox::kDefaultRunSeed, 0));
+    uint8_t first1 = uint8_t(tile1.nextIndex(256)), first0 = uint8_t(tile0.nextIndex(256));
+    EXPECT_EQ(reference[8 * 3], first1);
+    EXPECT_EQ(reference[0], first0);
+    EXPECT_NE(std::vector<uint8_t>(reference.begin(), reference.begin() + 24),
+              std::vector<uint8_t>(reference.begin() + 24, reference.begin() + 48));
 }
 
 }  // namespace
