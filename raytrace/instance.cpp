@@ -3,7 +3,7 @@
 namespace ox {
 
 std::unique_ptr<Instance> Instance::create(std::string name, const Mtx4 &objectToWorld,
-                                           const Shape *shape, const Material *overrideMaterial,
+                                           const Shape *shape, const MaterialHandle *overrideMaterial,
                                            uint32_t flags) {
     if (!shape || !objectToWorld.isFinite()) return nullptr;
     Mtx4 inv;

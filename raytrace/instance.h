@@ -32,7 +32,7 @@ public:
     /// Makes an instance; null when the shape is missing or the matrix is not finite or not
     /// invertible (the caller reports "Failed to create instance").
     static std::unique_ptr<Instance> create(std::string name, const Mtx4 &objectToWorld,
-                                            const Shape *shape, const Material *overrideMaterial,
+                                            const Shape *shape, const MaterialHandle *overrideMaterial,
                                             uint32_t flags);
 
     /// The instance name (key of light links and bake targets).
@@ -58,9 +58,9 @@ public:
     bool hasFlag(uint32_t bit) const { return (flags_ & bit) != 0; }
 
     /// The replacing material, or null when the shape's own materials apply.
-    const Material *overrideMaterial() const { return override_; }
+    const MaterialHandle *overrideMaterial() const { return override_; }
     /// The material of triangle t of the shape as this instance shows it.
-    const Material *material(uint32_t t) const {
+    const MaterialHandle *material(uint32_t t) const {
         return override_ ? override_ : shape_->material(t);
     }
 
@@ -80,7 +80,7 @@ private:
     Mtx4 objectToWorld_;
     Mtx4 worldToObject_;
     const Shape *shape_ = nullptr;
-    const Material *override_ = nullptr;
+    const MaterialHandle *override_ = nullptr;
     uint32_t flags_ = RenderStats::kDefault;
     std::unique_ptr<VertexBakeSamplingOptions> sampling_;
 };

@@ -12,7 +12,7 @@ void Shape::computeBounds() {
 
 size_t Shape::memoryBytes() const {
     return vertices_.memoryBytes() + triangles_.capacity() * sizeof(Triangle) +
-           materials_.capacity() * sizeof(const Material *) + name_.capacity();
+           materials_.capacity() * sizeof(const MaterialHandle *) + name_.capacity();
 }
 
 }  // namespace ox

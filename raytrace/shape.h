@@ -10,9 +10,14 @@
 
 namespace ox {
 
-/// A material of the scene: the surface shader and its photon twin, registered together under
-/// one name. Defined by the shading code (shading/material.h); geometry only points at it.
-class Material;
+/// What geometry knows of a material: its identity, nothing more. Triangles and instances name
+/// their material through it; the shading code's materials derive from it and turn a pointer
+/// back into theirs (materialOf in shading/material.h). Never deleted through this type.
+class MaterialHandle {
+protected:
+    MaterialHandle() = default;
+    ~MaterialHandle() = default;
+};
 
 /// One shape (mesh): its vertex list, its triangles, the material of every triangle (an index
 /// into the shape's material slots) and its object-space bounding box. Built once by the mesh
@@ -36,10 +41,10 @@ public:
     uint32_t triangleCount() const { return static_cast<uint32_t>(triangles_.size()); }
 
     /// Material slots; Triangle::material indexes this list.
-    const std::vector<const Material *> &materials() const { return materials_; }
-    std::vector<const Material *> &materials() { return materials_; }
+    const std::vector<const MaterialHandle *> &materials() const { return materials_; }
+    std::vector<const MaterialHandle *> &materials() { return materials_; }
     /// The material of triangle t (null when its slot is out of range).
-    const Material *material(uint32_t t) const {
+    const MaterialHandle *material(uint32_t t) const {
         uint32_t slot = triangles_[t].material;
         return slot < materials_.size() ? materials_[slot] : nullptr;
     }
@@ -72,7 +77,7 @@ private:
     std::string name_;
     VertexList vertices_;
     std::vector<Triangle> triangles_;
-    std::vector<const Material *> materials_;
+    std::vector<const MaterialHandle *> materials_;
     BBox bounds_;
 };
 

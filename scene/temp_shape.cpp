@@ -84,7 +84,7 @@ ShapeBuildStatus buildTempShape(vtm::VornTempMeshBase &reader,
         builder->finish(*result, name);
         builder.reset();
         result->vertices().setUvSetNames(reader.uvSetNames());
-        result->materials() = std::move(slots);
+        result->materials().assign(slots.begin(), slots.end());
         shape = std::move(result);
     } catch (const std::bad_alloc &) {
         return fail("Out of memory: Too many triangles. Lower the tessellation settings!");

@@ -6,6 +6,7 @@
 
 #include "raytrace/shape.h"
 #include "scene/mesh_builder.h"
+#include "shading/material.h"
 #include "scene/vtm.h"
 
 namespace ox {

@@ -8,13 +8,14 @@
 #include <unordered_map>
 #include <vector>
 
+#include "raytrace/shape.h"
 #include "shading/shader.h"
 
 namespace ox {
 
 /// A material of the scene: a surface shader and its photon twin, registered together under the
 /// surface shader's name. Triangles and instances point at materials.
-class Material {
+class Material final : public MaterialHandle {
 public:
     Material(std::unique_ptr<SurfaceShaderInterface> surface,
              std::unique_ptr<PhotonShaderInterface> photon)
@@ -31,6 +32,11 @@ private:
     std::unique_ptr<SurfaceShaderInterface> surface_;
     std::unique_ptr<PhotonShaderInterface> photon_;
 };
+
+/// The material behind the identity geometry holds (null stays null).
+inline const Material *materialOf(const MaterialHandle *m) {
+    return static_cast<const Material *>(m);
+}
 
 /// The scene's materials by name. Shapes build on several threads and register the variants
 /// they need, so lookups and find-or-insert are safe to call concurrently; a registered material

@@ -68,8 +68,8 @@ TEST(Shape, MaterialsBoundsAndNormals) {
     v.setPosition(3, {0, 3, -2});
     for (uint32_t i = 0; i < 4; ++i) v.normal(i) = Vec3(0, 1, 0);
     shape.triangles() = {{{0, 1, 2}, 0}, {{0, 2, 3}, 1}, {{0, 2, 3}, 7}};
-    const Material *a = reinterpret_cast<const Material *>(0x10);
-    const Material *b = reinterpret_cast<const Material *>(0x20);
+    const MaterialHandle *a = reinterpret_cast<const MaterialHandle *>(0x10);
+    const MaterialHandle *b = reinterpret_cast<const MaterialHandle *>(0x20);
     shape.materials() = {a, b};
     shape.computeBounds();
     EXPECT_EQ(shape.bounds(), BBox(Vec3(0, 0, -2), Vec3(2, 3, 0)));
@@ -80,7 +80,7 @@ TEST(Shape, MaterialsBoundsAndNormals) {
     EXPECT_NEAR(shape.interpolatedNormal(1, 0.2f, 0.3f).length(), 1.0f, 1e-6f);
 
     // An instance override replaces every material of the shape; the shape keeps its own.
-    const Material *o = reinterpret_cast<const Material *>(0x30);
+    const MaterialHandle *o = reinterpret_cast<const MaterialHandle *>(0x30);
     auto inst =
         Instance::create("i", Mtx4::translation({1, 0, 0}), &shape, o, RenderStats::kDefault);
     ASSERT_TRUE(inst);

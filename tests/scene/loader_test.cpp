@@ -114,10 +114,10 @@ TEST(ZPXLoader, LoadsAWholeScene) {
     EXPECT_EQ(scene.shapes()[0]->name(), "plane");  // in the order of the inputs
     ASSERT_EQ(scene.instances().size(), 3u);
     const Instance &wall1 = *scene.instances()[1];
-    EXPECT_EQ(wall1.overrideMaterial()->name(), "green");
-    EXPECT_EQ(wall1.material(0)->name(), "green");
+    EXPECT_EQ(materialOf(wall1.overrideMaterial())->name(), "green");
+    EXPECT_EQ(materialOf(wall1.material(0))->name(), "green");
     EXPECT_EQ(scene.instances()[2]->overrideMaterial(), nullptr);
-    EXPECT_EQ(scene.instances()[2]->material(0)->name(), "blue");
+    EXPECT_EQ(materialOf(scene.instances()[2]->material(0))->name(), "blue");
     EXPECT_FALSE(scene.instances()[2]->hasFlag(0x2));
     ASSERT_NE(scene.instances()[0]->vertexBakeSamplingOptions(), nullptr);
 
@@ -296,12 +296,12 @@ TEST(ZPXLoader, ShapesEdgeCases) {
     EXPECT_EQ(phong->parameters().shininess, 1.0f);
     EXPECT_EQ(scene.findShape("s")->material(0), m);
     // Shapes built in parallel share one variant of "uvm" per UV layout.
-    const Material *variant = scene.findShape("v0")->material(0);
+    const Material *variant = materialOf(scene.findShape("v0")->material(0));
     EXPECT_EQ(variant->name(), "uvm|uv:1,-1,-1,-1,-1,-1,-1");
     EXPECT_EQ(variant->photon()->name(), "uvm|uv:1,-1,-1,-1,-1,-1,-1_photon");
     for (int i = 1; i < 6; ++i)
         EXPECT_EQ(scene.findShape("v" + std::to_string(i))->material(0), variant);
-    EXPECT_EQ(scene.findShape("v6")->material(0)->name(), "uvm|uv:0,-1,-1,-1,-1,-1,-1");
+    EXPECT_EQ(materialOf(scene.findShape("v6")->material(0))->name(), "uvm|uv:0,-1,-1,-1,-1,-1,-1");
     EXPECT_EQ(scene.materials().size(), 4u);
 }
 

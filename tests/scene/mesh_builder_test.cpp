@@ -263,8 +263,8 @@ TEST(TempShape, MaterialsIndicesAndEmptyMeshes) {
     r = buildMesh(m.mesh, {}, 1);
     ASSERT_EQ(r.status, ShapeBuildStatus::kBuilt);
     EXPECT_EQ(r.shape->triangleCount(), 5u);
-    EXPECT_EQ(r.shape->material(4), reinterpret_cast<const Material *>(0x200));
-    EXPECT_EQ(r.shape->material(0), reinterpret_cast<const Material *>(0x100));
+    EXPECT_EQ(r.shape->material(4), reinterpret_cast<const MaterialHandle *>(0x200));
+    EXPECT_EQ(r.shape->material(0), reinterpret_cast<const MaterialHandle *>(0x100));
 
     MeshMaker e("e", 1);
     e.mesh.groups.push_back({"nope", 0});
