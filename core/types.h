@@ -3,6 +3,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <limits>
 #include <utility>
 
 /// Shared value types: colours, vectors, matrices, bounding boxes and pixel regions.
@@ -69,8 +70,9 @@ struct Vec3 {
     constexpr Vec3() = default;
     constexpr Vec3(float x_, float y_, float z_) : x(x_), y(y_), z(z_) {}
 
-    float &operator[](int i) { return (&x)[i]; }
-    float operator[](int i) const { return (&x)[i]; }
+    /// Component i: 0 x, 1 y, anything else z.
+    float &operator[](int i) { return i == 0 ? x : (i == 1 ? y : z); }
+    float operator[](int i) const { return i == 0 ? x : (i == 1 ? y : z); }
 
     Vec3 operator+(const Vec3 &o) const { return {x + o.x, y + o.y, z + o.z}; }
     Vec3 operator-(const Vec3 &o) const { return {x - o.x, y - o.y, z - o.z}; }
@@ -188,9 +190,12 @@ struct Mtx4 {
     bool inverse(Mtx4 &out) const;
 };
 
+/// The largest finite float (3.4028235e38): unbounded distances, empty boxes, open limits.
+inline constexpr float kLargestFloat = std::numeric_limits<float>::max();
+
 /// Axis-aligned box of six floats; the empty box has min +FLT_MAX and max -FLT_MAX.
 struct BBox {
-    static constexpr float kEmptyMin = 3.4028235e38f;
+    static constexpr float kEmptyMin = kLargestFloat;
     Vec3 min{kEmptyMin, kEmptyMin, kEmptyMin};
     Vec3 max{-kEmptyMin, -kEmptyMin, -kEmptyMin};
 
@@ -238,17 +243,36 @@ struct Region {
     bool operator==(const Region &o) const = default;
 };
 
-/// Shading component mask bits, shared by light flags and render passes.
-enum ShadingComponent : uint32_t {
-    kShadeDiffuse = 0x1,
-    kShadeSpecular = 0x2,
-    kShadeAmbient = 0x4,
-    kShadeReflections = 0x8,
-    kShadeRefractions = 0x10,
-    kShadeSubSurface = 0x20,
-    kShadeShadows = 0x40,
-    kShadeIncandescence = 0x80,
-    kShadeIndirect = 0x100,
+/// A pixel rectangle with inclusive bounds, the form in which regions are cut into tiles and
+/// handed out; row 0 is the bottom row.
+struct Tile {
+    uint32_t xMin = 0, xMax = 0, yMin = 0, yMax = 0;
+    bool valid = false;  ///< false for the tile returned when none is left
+    /// Place in the region's tile grid, row * columns + column, whatever the hand-out order.
+    uint32_t index = 0;
+
+    /// Width in pixels.
+    uint32_t width() const { return xMax - xMin + 1; }
+    /// Height in pixels.
+    uint32_t height() const { return yMax - yMin + 1; }
+    bool operator==(const Tile &o) const = default;
 };
+
+/// The tile covering a region (exclusive maxima made inclusive). An empty or invalid region, or
+/// one reaching below 0, gives an invalid all-zero tile.
+constexpr Tile tileOfRegion(const Region &r) {
+    if (!r.valid || r.xMax <= r.xMin || r.yMax <= r.yMin || r.xMin < 0 || r.yMin < 0) return Tile{};
+    return Tile{uint32_t(r.xMin), uint32_t(r.xMax) - 1u, uint32_t(r.yMin), uint32_t(r.yMax) - 1u,
+                true};
+}
+
+/// The region a tile covers (inclusive maxima made exclusive). An invalid tile, one with a
+/// maximum below its minimum, or one whose bounds do not fit a region gives the invalid region.
+constexpr Region regionOfTile(const Tile &t) {
+    constexpr uint32_t kLast = uint32_t(INT32_MAX) - 1u;  // the largest inclusive max that fits
+    if (!t.valid || t.xMax < t.xMin || t.yMax < t.yMin || t.xMax > kLast || t.yMax > kLast)
+        return Region();
+    return Region(int32_t(t.xMin), int32_t(t.yMin), int32_t(t.xMax) + 1, int32_t(t.yMax) + 1);
+}
 
 }  // namespace ox

@@ -4,6 +4,7 @@
 #include <cmath>
 #include <exception>
 #include <map>
+#include <stdexcept>
 
 #include "core/message.h"
 #include "raytrace/instance.h"
@@ -141,8 +142,7 @@ InstanceInput instanceInput(const Instance &instance, uint32_t index) {
     in.mesh.pz = shape.vertices().pz();
     in.mesh.vertexCount = shape.vertices().size();
     in.mesh.triangleCount = shape.triangleCount();
-    in.mesh.indices = shape.triangles().empty() ? nullptr : shape.triangles()[0].v;
-    in.mesh.indexStride = sizeof(Triangle) / sizeof(uint32_t);
+    in.mesh.triangles = shape.triangles().data();
     in.objectToWorld = instance.objectToWorld();
     in.flags = instance.flags();
     in.index = index;
@@ -178,18 +178,23 @@ size_t CompleteGrid::sizeBytes() const {
 
 bool CompleteGrid::build(const std::vector<InstanceInput> &instances, const ADSParameters &params,
                          const MotionBlurHandler *motion) {
-    // Allocation failures of a scene too large for memory end the build with one message.
+    // A scene beyond the structure's limits (more cell references than its 32-bit lists can
+    // index) or beyond the memory ends the build with one message that says which.
+    const char *failure = nullptr;
     try {
         return buildStructure(instances, params, motion);
+    } catch (const std::length_error &) {
+        failure = "The scene is too large for the acceleration structure: too many cell references";
     } catch (const std::exception &) {
-        store_ = PrimitiveStore();
-        secondStore_ = PrimitiveStore();
-        shapes_.clear();
-        grid_.build(store_, {}, BBox(), GridParams());
-        second_.build(secondStore_, {}, BBox(), GridParams());
-        message(kMsgError, 1, "Not enough memory to build the acceleration structure");
-        return false;
+        failure = "Not enough memory to build the acceleration structure";
     }
+    store_ = PrimitiveStore();
+    secondStore_ = PrimitiveStore();
+    shapes_.clear();
+    grid_.build(store_, {}, BBox(), GridParams());
+    second_.build(secondStore_, {}, BBox(), GridParams());
+    message(kMsgError, 1, "%s", failure);
+    return false;
 }
 
 bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,

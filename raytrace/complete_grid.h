@@ -8,6 +8,7 @@
 #include "core/types.h"
 #include "raytrace/grid.h"
 #include "raytrace/ray.h"
+#include "raytrace/triangle.h"
 
 namespace ox {
 
@@ -21,7 +22,7 @@ public:
     virtual bool intersect(const Ray &ray, Hit &hit, float tmax, RayCounter *counter) const = 0;
     /// Closest hit without a distance limit.
     virtual bool intersect(const Ray &ray, Hit &hit, RayCounter *counter) const {
-        return intersect(ray, hit, 3.4028235e38f, counter);
+        return intersect(ray, hit, kInfiniteDistance, counter);
     }
     /// Closest hit in the second structure kept beside the main one.
     virtual bool intersectSecond(const Ray &ray, Hit &hit, float tmax,
@@ -52,24 +53,26 @@ struct ADSParameters {
 };
 
 /// Object-space triangle mesh as the grid reads it (borrowed, not copied): positions either as
-/// Vec3 (positions) or as three float arrays (px, py, pz); triangle i has its corner indices at
-/// indices[i * indexStride + 0..2].
+/// Vec3 (positions) or as three float arrays (px, py, pz); triangle i has its corner indices
+/// either in a shape's triangles (triangles[i].v) or at indices[i * 3 + 0..2].
 struct MeshInput {
     const Vec3 *positions = nullptr;
     const float *px = nullptr, *py = nullptr, *pz = nullptr;
     size_t vertexCount = 0;
+    const Triangle *triangles = nullptr;
     const uint32_t *indices = nullptr;
-    size_t indexStride = 3;
     size_t triangleCount = 0;
 
     /// True when the position and index arrays are present (or there are no triangles).
     bool usable() const {
-        return triangleCount == 0 || (indices && (positions || (px && py && pz)));
+        return triangleCount == 0 || ((triangles || indices) && (positions || (px && py && pz)));
     }
     /// Position of vertex i.
     Vec3 position(size_t i) const { return positions ? positions[i] : Vec3(px[i], py[i], pz[i]); }
     /// Corner c of triangle t.
-    uint32_t corner(size_t t, int c) const { return indices[t * indexStride + c]; }
+    uint32_t corner(size_t t, int c) const {
+        return triangles ? triangles[t].v[c] : indices[t * 3 + c];
+    }
 };
 
 /// One scene instance as handed to the grid.

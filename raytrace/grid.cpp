@@ -22,6 +22,7 @@ bool boxesOverlap(const BBox &a, const BBox &b) {
 
 struct D3 {
     double x, y, z;
+    double operator[](int a) const { return a == 0 ? x : (a == 1 ? y : z); }
 };
 D3 sub(const D3 &a, const D3 &b) { return {a.x - b.x, a.y - b.y, a.z - b.z}; }
 D3 crossD(const D3 &a, const D3 &b) {
@@ -40,9 +41,9 @@ bool triangleBoxOverlap(const Vec3 &a, const Vec3 &b, const Vec3 &c, const BBox 
                sub({c.x, c.y, c.z}, center)};
     // Box faces.
     for (int axis = 0; axis < 3; ++axis) {
-        double lo = std::min({(&v[0].x)[axis], (&v[1].x)[axis], (&v[2].x)[axis]});
-        double hi = std::max({(&v[0].x)[axis], (&v[1].x)[axis], (&v[2].x)[axis]});
-        if (lo > (&h.x)[axis] || hi < -(&h.x)[axis]) return false;
+        double lo = std::min({v[0][axis], v[1][axis], v[2][axis]});
+        double hi = std::max({v[0][axis], v[1][axis], v[2][axis]});
+        if (lo > h[axis] || hi < -h[axis]) return false;
     }
     D3 e[3] = {sub(v[1], v[0]), sub(v[2], v[1]), sub(v[0], v[2])};
     const D3 axes[3] = {{1, 0, 0}, {0, 1, 0}, {0, 0, 1}};
@@ -152,7 +153,6 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     params_ = params;
     params_.maxDepth = std::min(params.maxDepth, kMaxDepthLimit);
     depth_ = depth;
-    mode_ = params.sse ? 3 : 2;
     cells_.clear();
     items_.clear();
     packets_.clear();
@@ -874,8 +874,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             _mm_store_si128(reinterpret_cast<__m128i *>(at),
                             _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), top)));
             // (Above 2^24 cells a coordinate may round one or two past the last cell.)
-            int64_t c = std::min(at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2],
-                                 lastCell);
+            int64_t c =
+                std::min(at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2], lastCell);
             __builtin_prefetch(distance + c);
             __builtin_prefetch(cells + c);
         }

@@ -102,26 +102,8 @@ struct GridStats {
     uint64_t voxels = 0, occupied = 0, elements = 0, maxElements = 0;
 };
 
-/// What a voxel can hold, as seen when building: box overlap, intersection, bounds, size and
-/// kind. Triangles, packets and instances are plain records in the cells (dispatched by their
-/// item kind, with no virtual call per ray); nested grids and instance grids are Intersectables.
-class Intersectable {
-public:
-    virtual ~Intersectable() = default;
-    /// True when the primitive may touch the box (used when inserting into voxels).
-    virtual bool overlapsBox(const BBox &box) const = 0;
-    /// Closest hit below state.limit.
-    virtual bool intersect(const TraceRay &ray, TraceState &state) const = 0;
-    /// Bounding box.
-    virtual BBox bounds() const = 0;
-    /// Bytes held.
-    virtual size_t sizeBytes() const = 0;
-    /// Kind identifier (the ItemKind of the primitive).
-    virtual int kind() const = 0;
-};
-
 /// Uniform voxel grid over primitives; crowded cells are refined into nested grids.
-class Grid final : public Intersectable {
+class Grid final {
 public:
     static constexpr uint32_t kMaxDepthLimit = 16;
 
@@ -144,16 +126,10 @@ public:
                const GridParams &params, uint32_t depth = 0, bool widenBox = true);
 
     /// Closest hit below state.limit; updates state and returns true when one was found.
-    bool intersect(const TraceRay &ray, TraceState &state) const override {
+    bool intersect(const TraceRay &ray, TraceState &state) const {
         return traverse<false>(ray, state);
     }
-    bool overlapsBox(const BBox &b) const override {
-        return !empty() && b.min.x <= box_.max.x && b.max.x >= box_.min.x &&
-               b.min.y <= box_.max.y && b.max.y >= box_.min.y && b.min.z <= box_.max.z &&
-               b.max.z >= box_.min.z;
-    }
-    BBox bounds() const override { return box_; }
-    int kind() const override { return kItemChild; }
+    BBox bounds() const { return box_; }
     /// True when anything lies between 1e-6 and tmax.
     bool occluded(const TraceRay &ray, float tmax) const {
         TraceState s;
@@ -178,7 +154,7 @@ public:
     /// Deepest nesting level below this grid (0 = none).
     uint32_t nestingDepth() const;
     /// Bytes held by this grid and its nested grids.
-    size_t sizeBytes() const override;
+    size_t sizeBytes() const;
     /// Item codes of the cell (x, y, z) (for tests).
     std::vector<uint32_t> cellItems(int64_t x, int64_t y, int64_t z) const;
     /// The nested grid of a kItemChild code (for tests).
@@ -203,7 +179,6 @@ private:
     const PrimitiveStore *store_ = nullptr;
     GridParams params_;
     uint32_t depth_ = 0;
-    uint8_t mode_ = 2;
     int64_t nx_ = 0, ny_ = 0, nz_ = 0;
     Vec3 cellSize_, invCellSize_;
     float tolerance_ = 0.001f;

@@ -32,8 +32,8 @@ public:
     /// Makes an instance; null when the shape is missing or the matrix is not finite or not
     /// invertible (the caller reports "Failed to create instance").
     static std::unique_ptr<Instance> create(std::string name, const Mtx4 &objectToWorld,
-                                            const Shape *shape, const MaterialHandle *overrideMaterial,
-                                            uint32_t flags);
+                                            const Shape *shape,
+                                            const MaterialHandle *overrideMaterial, uint32_t flags);
 
     /// The instance name (key of light links and bake targets).
     const std::string &name() const { return name_; }

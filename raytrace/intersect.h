@@ -15,7 +15,7 @@ namespace ox {
 /// Hits at or below this distance are ignored (self-intersection guard).
 constexpr float kMinHitDistance = 1e-6f;
 /// The unbounded query distance.
-constexpr float kInfiniteDistance = 3.4028235e38f;
+constexpr float kInfiniteDistance = kLargestFloat;
 
 /// Ray data prepared once per query (and once per instance in object space).
 struct TraceRay {
@@ -66,7 +66,7 @@ struct TraceState {
     uint8_t kind = 0;   ///< Item kind of the hit (see Grid::ItemKind).
     uint32_t prim = 0;  ///< Index of the triangle (or motion triangle) in its store.
     uint32_t inst = 0;  ///< For hits through an instance: the instance's index in the store.
-    uint32_t id = 0;  ///< Packet or instance hit: the triangle's index inside its shape.
+    uint32_t id = 0;    ///< Packet or instance hit: the triangle's index inside its shape.
     uint32_t instance = kNoInstance;  ///< Triangle hit: its scene instance (from the packet).
     uint32_t flags = 0;               ///< Triangle hit: its flag word (from the packet).
     bool fromPacket = false;          ///< A packet hit: id, instance and flags are its lane's.
@@ -77,7 +77,6 @@ inline bool flagsVisible(uint32_t flags, uint32_t required) { return (flags & re
 
 /// One triangle as p0 and the edges e1 = p1 - p0, e2 = p2 - p0, with the object's flag word.
 struct IntersectTriangle {
-    static constexpr int kKind = 3;
     Vec3 p0, e1, e2;
     uint32_t flags = 0;
     uint32_t id = 0;                  ///< Triangle index inside its shape.
@@ -181,18 +180,6 @@ __attribute__((always_inline)) inline int intersectPacket(const IntersectSSETria
     float4 hit = andNot(miss, (t > float4(kMinHitDistance)) & (t < float4(tmax)));
     tOut = t, uOut = u, vOut = v;
     return movemask(hit);
-}
-
-/// Index of the lane with the smallest t among the set bits of mask (lowest lane on ties).
-inline int closestLane(int mask, const float4 &t) {
-    int best = -1;
-    float bt = 0.0f;
-    for (int i = 0; i < 4; ++i)
-        if (mask & (1 << i)) {
-            float ti = t[i];
-            if (best < 0 || ti < bt) best = i, bt = ti;
-        }
-    return best;
 }
 
 }  // namespace ox

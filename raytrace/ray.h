@@ -49,8 +49,19 @@ enum RenderStatsFlag : uint32_t {
 
 /// Flag bits of which an object needs at least one to be seen by a ray type (0 = sees nothing).
 constexpr uint32_t rayTypeRequiredFlags(int type) {
-    constexpr uint32_t kTable[kRayTypeCount] = {0x1,  0x20, 0x40,   0x2,     0xC00,  0x80,
-                                                0x20, 0x0,  0x4000, 0x10000, 0x20000};
+    constexpr uint32_t kTable[kRayTypeCount] = {
+        kFlagPrimaryVisibility,        // primary
+        kFlagVisibleInReflections,     // reflection
+        kFlagVisibleInRefractions,     // refraction
+        kFlagCastShadows,              // shadow
+        kFlagCastGI | kFlagReceiveGI,  // photon
+        kFlagVisibleInFG,              // final gather
+        kFlagVisibleInReflections,     // glossy reflection
+        0u,                            // environment: sees nothing
+        kFlagCastOcclusion,            // occlusion
+        kFlagEnvelop,                  // envelope
+        kFlagIsImagePlane,             // image plane
+    };
     return type >= 0 && type < kRayTypeCount ? kTable[type] : 0u;
 }
 

@@ -18,11 +18,6 @@ struct float4 {
     static float4 zero() { return _mm_setzero_ps(); }
 
     operator __m128() const { return v; }
-    float operator[](int i) const {
-        alignas(16) float t[4];
-        _mm_store_ps(t, v);
-        return t[i];
-    }
 };
 
 inline float4 operator+(float4 a, float4 b) { return _mm_add_ps(a, b); }
@@ -36,11 +31,6 @@ inline float4 operator|(float4 a, float4 b) { return _mm_or_ps(a, b); }
 inline float4 operator^(float4 a, float4 b) { return _mm_xor_ps(a, b); }
 /// a & ~mask.
 inline float4 andNot(float4 mask, float4 a) { return _mm_andnot_ps(mask, a); }
-/// Lane-wise select: mask ? a : b.
-inline float4 select(float4 mask, float4 a, float4 b) {
-    return _mm_or_ps(_mm_and_ps(mask, a), _mm_andnot_ps(mask, b));
-}
-inline float4 vmin4(float4 a, float4 b) { return _mm_min_ps(a, b); }
 /// One bit per lane from the sign bits.
 inline int movemask(float4 a) { return _mm_movemask_ps(a); }
 

@@ -113,15 +113,15 @@ bool surfacePoint(const Ray &ray, const Hit &hit, const Instance &instance, Surf
     }
 
     if (list.hasColors())
-        p.color = list.color(tri.v[0]) * w0 + list.color(tri.v[1]) * w1 +
-                  list.color(tri.v[2]) * w2;
+        p.color = list.color(tri.v[0]) * w0 + list.color(tri.v[1]) * w1 + list.color(tri.v[2]) * w2;
 
     p.uvSetCount = std::min<uint32_t>(list.uvSetCount(), SurfacePoint::kMaxUvSets);
     for (uint32_t k = 0; k < p.uvSetCount; ++k) p.uvs[k] = surfaceUv(p, k);
 
     // The shading frame from UV set 0's tangent; the bitangent keeps its set's side.
-    Vec3 t = p.uvSetCount ? unitOrZero(p.uvs[0].tangent - p.normal * dot(p.normal, p.uvs[0].tangent))
-                          : Vec3();
+    Vec3 t = p.uvSetCount
+                 ? unitOrZero(p.uvs[0].tangent - p.normal * dot(p.normal, p.uvs[0].tangent))
+                 : Vec3();
     if (t.lengthSquared() == 0.0f) t = anyOrthogonal(p.normal);
     Vec3 b = cross(p.normal, t);
     if (p.uvSetCount && dot(b, p.uvs[0].bitangent) < 0.0f) b = -b;

@@ -44,9 +44,9 @@ struct SurfacePoint {
     /// tangent, any frame around `normal`.
     Vec3 tangent, bitangent;
     Vec3 dPdx, dPdy;  ///< Change of position per unit image x and y (zero without differentials).
-    float u = 0.0f, v = 0.0f;  ///< The hit's barycentrics.
+    float u = 0.0f, v = 0.0f;                                  ///< The hit's barycentrics.
     float dudx = 0.0f, dvdx = 0.0f, dudy = 0.0f, dvdy = 0.0f;  ///< Their change per image unit.
-    Color color;               ///< Interpolated vertex colour; (0, 0, 0, 0) without colours.
+    Color color;  ///< Interpolated vertex colour; (0, 0, 0, 0) without colours.
     SurfaceUv uvs[kMaxUvSets];
     uint32_t uvSetCount = 0;  ///< Sets filled in uvs: min(the shape's sets, kMaxUvSets).
     /// The triangle's material as the instance shows it (its override, else the shape's slot);

@@ -4,22 +4,10 @@
 #include <memory>
 #include <vector>
 
+#include "core/types.h"
+
 /// Tiles and the four orders in which the tile renderer hands them out.
 namespace ox {
-
-/// A rectangle of pixels or texels with inclusive bounds.
-struct Tile {
-    uint32_t xMin = 0, xMax = 0, yMin = 0, yMax = 0;
-    bool valid = false;  ///< false for the tile returned when none is left
-    /// Place in the region's tile grid, row * columns + column, whatever the hand-out order.
-    uint32_t index = 0;
-
-    /// Width in pixels.
-    uint32_t width() const { return xMax - xMin + 1; }
-    /// Height in pixels.
-    uint32_t height() const { return yMax - yMin + 1; }
-    bool operator==(const Tile &o) const = default;
-};
 
 /// The `tileScheme` setting; stored as these integers.
 enum TileSchemeType : int32_t {

@@ -98,11 +98,11 @@ TEST(Instance, RejectsBadPlacementsAndKeepsFlags) {
     EXPECT_FALSE(Instance::create("c", Mtx4(), nullptr, nullptr, 0));
 
     auto inst = Instance::create("d", Mtx4::scale({-2, 1, 1}), &shape, nullptr,
-                                 RenderStats::kCastShadows | RenderStats::kSelfOcclusion);
+                                 kFlagCastShadows | kFlagSelfOcclusion);
     ASSERT_TRUE(inst);
     EXPECT_TRUE(inst->mirrors());
-    EXPECT_TRUE(inst->hasFlag(RenderStats::kSelfOcclusion));
-    EXPECT_FALSE(inst->hasFlag(RenderStats::kPrimaryVisibility));
+    EXPECT_TRUE(inst->hasFlag(kFlagSelfOcclusion));
+    EXPECT_FALSE(inst->hasFlag(kFlagPrimaryVisibility));
     EXPECT_TRUE(inst->worldBounds().isEmpty());
     // Normals follow the inverse transpose: a scale of -2 in x halves and flips x.
     Vec3 n = inst->normalToWorld({1, 0, 0});

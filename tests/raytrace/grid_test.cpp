@@ -123,7 +123,8 @@ Reference bruteForce(const std::vector<InstanceInput> &ins, const std::vector<He
 Reference hitOf(const std::vector<InstanceInput> &ins, const std::vector<Held> &held,
                 const Ray &ray, uint32_t instance, uint32_t id) {
     for (size_t k = 0; k < ins.size(); ++k)
-        if (ins[k].index == instance) return bruteForce({ins[k]}, {held[k]}, ray, kInfiniteDistance, id, 1);
+        if (ins[k].index == instance)
+            return bruteForce({ins[k]}, {held[k]}, ray, kInfiniteDistance, id, 1);
     return Reference();
 }
 
@@ -267,8 +268,7 @@ TEST(CompleteGridTest, MatchesBruteForceWhenCopiedInstancedAndMovingShapesMeet) 
     uint32_t single = kAllFlags & ~kFlagDoubleSided;
     std::vector<InstanceInput> ins = {
         instanceOf(blob, 0, Mtx4(), single, 0),
-        instanceOf(blob, 0, rotationY(0.9f) * Mtx4::translation({0.8f, 0.4f, 0.2f}), kAllFlags,
-                   1),
+        instanceOf(blob, 0, rotationY(0.9f) * Mtx4::translation({0.8f, 0.4f, 0.2f}), kAllFlags, 1),
         instanceOf(blob, 0, mirror, single, 2),
         instanceOf(coil, 1, Mtx4::translation({0.3f, 0.1f, 0.0f}), kAllFlags, 3),
         instanceOf(coil, 1, rotationY(1.3f) * Mtx4::translation({0.6f, -0.2f, 0.4f}), single, 4),

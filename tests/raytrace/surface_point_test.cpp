@@ -141,7 +141,7 @@ TEST(SurfacePointTest, FlatShadingOverrideMovingTrianglesAndBadHits) {
     auto shape = square();
     auto override = reinterpret_cast<const MaterialHandle *>(0x30);
     auto inst = Instance::create("flat", kPlacement, shape.get(), override,
-                                 RenderStats::kDefault & ~RenderStats::kSmoothShading);
+                                 RenderStats::kDefault & ~kFlagSmoothShading);
     ASSERT_TRUE(inst);
     // Without smooth shading the shading normal is the geometric one; no colours or UV sets:
     // zero colour and any frame around the normal.

@@ -138,7 +138,6 @@ TEST(TileRendererTest, FewTilesAndNoTiles) {
     EXPECT_TRUE(empty.released);
 }
 
-
 TEST(TileRendererTest, TileRandomNumbersDependOnTheSeedAndTileOnly) {
     // 45 x 37 pixels in tiles of 8: a ragged last column and row.
     auto render = [](int scheme, int threads, uint64_t seed) {

@@ -47,7 +47,7 @@ TEST(TileTest, RegionSplitting) {
     ASSERT_EQ(t.count(), 1);
     EXPECT_EQ(t.tiles()[0], (ox::Tile{7, 7, 9, 9, true}));
 
-    ASSERT_TRUE(t.build(0, 99, 0, 49, 32, 32));                // 100 x 50
+    ASSERT_TRUE(t.build(0, 99, 0, 49, 32, 32));                   // 100 x 50
     EXPECT_EQ(t.tiles()[3], (ox::Tile{96, 99, 0, 31, true, 3}));  // right column 4 wide
     EXPECT_EQ(t.tiles()[4], (ox::Tile{0, 31, 32, 49, true, 4}));  // top row 18 high
 

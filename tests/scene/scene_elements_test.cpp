@@ -47,8 +47,8 @@ TEST(SceneElements, ReadsEveryKindIntoCompactRecords) {
     EXPECT_EQ(inst->lightLinkMode, 1);
     EXPECT_EQ(inst->lightLinkedLights, (std::vector<std::string>{"sun", "lamp"}));
     EXPECT_EQ(inst->renderStats.flags,
-              (RenderStats::kDefault & ~RenderStats::kCastShadows & ~RenderStats::kSelfOcclusion) |
-                  RenderStats::kShadowBias);
+              (RenderStats::kDefault & ~kFlagCastShadows & ~kFlagSelfOcclusion) |
+                  kFlagShadowBias);
     EXPECT_EQ(inst->vertexBakeSamplingOptions.type, 0);
     EXPECT_EQ(inst->vertexBakeSamplingOptions.maxSamples, 12);
 
