@@ -10,6 +10,7 @@
 #include <new>
 
 #include "app/exit_status.h"
+#include "config/settings_frame.h"
 #include "core/benchmark.h"
 #include "core/message.h"
 #include "core/render_io_console.h"
@@ -61,27 +62,25 @@ int32_t runDriver(const RunEnvironment &env, int32_t action, RunContext &context
 }
 
 int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
-    // 1. Denormal numbers are flushed for the whole run (worker threads set it themselves).
+    // Denormal numbers would slow shading by orders of magnitude; flushed for the whole run
+    // (worker threads set it themselves).
     setFlushDenormalsToZero();
-    // 2. The banner.
+    // The banner first, so that every log starts by naming the build that wrote it.
     message(kMsgInfo, 6, "Zarnex Vorn (Rev: %d)", kRevision);
-    // 3. The C library allocator needs no switch of heap kind on this platform.
-    // 4. The main thread's benchmark timers, then the command line.
+    // The main thread's benchmark timers must exist before anything is timed.
     BenchmarkRegistry::instance().attachThread();
     CommandLineOptions options;
     if (!parseCommandLine(args, env.loadInputList, options)) {
         message(kMsgError, 6, "%s", kUsageText);
         return kStatusSyntaxError;
     }
-    // 5. Crash handling.
+    // Crash handling and priority come from the command line and hold for the whole run.
     installCrashHandler(options.crashSilently);
-    // 6. Priority.
     if (options.priority != kCommandPriorityNone) setProcessPriority(options.priority - 1);
-    // 7. The output directory.
     const std::string outputDirectory =
         options.outputDirectory.empty() ? std::string("./") : options.outputDirectory;
-    // 8. Default filters until the real configuration is read. The debug file waits for the
-    //    output tree.
+    // Messages need filters before the configuration is read; the debug file waits until the
+    // output tree exists.
     std::unique_ptr<RunSettingsInterface> settings =
         env.makeSettings ? env.makeSettings() : std::make_unique<DefaultRunSettings>();
     OutputVerbosityFlags flags = settings->outputVerbosity();
@@ -97,7 +96,7 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
                           outputDirectory, baseName,  format,   threads};
     };
 
-    // 9. Actions that need no configuration.
+    // Writing defaults and merging files must work without (or despite) a configuration.
     switch (options.action) {
         case kActionWriteConfig:
             return writeFile(*settings, false);
@@ -113,43 +112,38 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
         default:
             break;
     }
-    // 10. The configuration.
     if (!options.configFiles.empty() && !settings->load(options.configFiles.front())) {
         message(kMsgError, 6, "Unable to load settings from file %s",
                 options.configFiles.front().c_str());
         return kStatusConfigLoad;
     }
-    // 11. The split needs nothing more.
+    // Splitting a configuration reads it but creates no output tree.
     if (options.action == kActionSplitConfig) {
         RunContext c = context(resolveFileFormat(options.fileFormat, settings->imageFormat()),
                                settings->renderThreads());
         return runDriver(env, options.action, c);
     }
-    // 12. The configuration's filters.
+    // From here on the configuration's own filters apply.
     flags = settings->outputVerbosity();
     const bool wantDebugFile = flags.debugFile;
     flags.debugFile = false;
     applyOutputVerbosity(flags, outputDirectory);
-    // 13. The output tree, then the debug file inside it.
+    // The debug file lives inside the output tree, so the tree comes first.
     if (const int32_t status = prepareOutputTree(outputDirectory, *settings); status != 0)
         return status;
     if (wantDebugFile) {
         flags.debugFile = true;
         applyOutputVerbosity(flags, outputDirectory);
     }
-    // 14. The action.
     const int32_t action = resolveAction(options.action, *settings);
     if (action == kActionNone) {
         message(kMsgError, 6, "The renderType %d names no kind of run.", settings->renderType());
         return kStatusUnsupported;
     }
-    // 15. Threads.
     const int64_t threads = resolveRenderThreads(options.renderThreads, *settings, processors);
-    // 16. Inputs.
+    // Inputs are checked before any work starts, so a bad run fails fast.
     if (const int32_t status = checkInputs(action, *settings); status != 0) return status;
-    // 17, 18. Progress, base name and statistics exist already; the format.
     const int32_t format = resolveFileFormat(options.fileFormat, settings->imageFormat());
-    // 19. The driver.
     int32_t status = kStatusUnsupported;
     switch (action) {
         case kActionRender:
@@ -170,11 +164,9 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
             message(kMsgError, 6, "The %s cannot run on a scene.", describeAction(action).c_str());
             break;
     }
-    // 20. Summaries.
+    // Statistics and timings are reported whatever the outcome, for diagnosis.
     statistics.print();
     BenchmarkRegistry::instance().report();
-    // 21. This build has no preview window, so there is nothing to wait for.
-    // 22.
     return status;
 }
 
@@ -197,35 +189,22 @@ void installCrashHandler(bool crashSilently) {
 }
 
 int32_t resolveAction(int32_t action, RunSettingsInterface &settings) {
-    static const int32_t kFromRenderType[] = {kActionRender,         kActionTextureBake,
-                                              kActionVertexBake,     kActionSurfaceTransfer,
-                                              kActionVertexTransfer, kActionPointCloudBake};
+    // Actions and render types name the same kinds of run, in this pairing.
+    static const struct {
+        int32_t action;
+        RenderType type;
+    } kPairs[] = {{kActionRender, RenderType::Render},
+                  {kActionTextureBake, RenderType::TextureBake},
+                  {kActionVertexBake, RenderType::VertexBake},
+                  {kActionSurfaceTransfer, RenderType::SurfaceTransfer},
+                  {kActionVertexTransfer, RenderType::VertexTransfer},
+                  {kActionPointCloudBake, RenderType::PointCloudBake}};
     if (action == kActionNone) {
-        const int32_t type = settings.renderType();
-        action = type >= 0 && type < 6 ? kFromRenderType[type] : kActionNone;
+        for (const auto &pair : kPairs)
+            if (settings.renderType() == int32_t(pair.type)) action = pair.action;
     } else {
-        switch (action) {
-            case kActionRender:
-                settings.setRenderType(0);
-                break;
-            case kActionTextureBake:
-                settings.setRenderType(1);
-                break;
-            case kActionSurfaceTransfer:
-                settings.setRenderType(3);
-                break;
-            case kActionVertexBake:
-                settings.setRenderType(2);
-                break;
-            case kActionVertexTransfer:
-                settings.setRenderType(4);
-                break;
-            case kActionPointCloudBake:
-                settings.setRenderType(5);
-                break;
-            default:
-                break;
-        }
+        for (const auto &pair : kPairs)
+            if (action == pair.action) settings.setRenderType(int32_t(pair.type));
     }
     if (action == kActionVertexBake || action == kActionVertexTransfer ||
         action == kActionPointCloudBake)
@@ -261,10 +240,10 @@ int64_t resolveRenderThreads(int64_t commandLineThreads, RunSettingsInterface &s
 
 int32_t resolveFileFormat(int32_t fileFormat, int32_t imageFormat) {
     if (fileFormat != kFormatNone) return fileFormat;
-    switch (imageFormat) {
-        case 0:
+    switch (ImageFormatType(imageFormat)) {
+        case ImageFormatType::TGA:
             return kFormatTga;
-        case 7:
+        case ImageFormatType::EXRMultiLayer:
             return kFormatExrMultiLayer;
         default:
             return kFormatExr;
@@ -315,9 +294,10 @@ int32_t checkInputs(int32_t action, const RunSettingsInterface &settings) {
                 static_cast<long long>(target->height));
         return false;
     };
-    if (settings.renderType() == 1 && !checkSize(s.firstTextureBakeTarget, "BakeTextureTarget"))
+    if (settings.renderType() == int32_t(RenderType::TextureBake) &&
+        !checkSize(s.firstTextureBakeTarget, "BakeTextureTarget"))
         return kStatusZeroDimension;
-    if (settings.renderType() == 3 &&
+    if (settings.renderType() == int32_t(RenderType::SurfaceTransfer) &&
         !checkSize(s.firstSurfaceTransferTarget, "SurfaceTransferTexture"))
         return kStatusZeroDimension;
 

@@ -37,7 +37,7 @@ void squareToDisk(float u, float v, float &r, float &phi) {
 
 }  // namespace
 
-Camera::Camera(std::string name, const Mtx4 &objectToWorld, const EnvironmentShaderInterface *env)
+Camera::Camera(std::string name, const Mtx4 &objectToWorld, const EnvironmentHandle *env)
     : name_(std::move(name)),
       objectToWorld_(objectToWorld),
       environment_(env),
@@ -49,7 +49,7 @@ Camera::Camera(std::string name, const Mtx4 &objectToWorld, const EnvironmentSha
 Camera::~Camera() = default;
 
 PerspectiveCamera::PerspectiveCamera(std::string name, const Mtx4 &objectToWorld,
-                                     const EnvironmentShaderInterface *env, float fovX, float fovY,
+                                     const EnvironmentHandle *env, float fovX, float fovY,
                                      const Vec2 &shift, int lensA, int lensSwitch, float lensRatio,
                                      float focusDistance)
     : Camera(std::move(name), objectToWorld, env),
@@ -106,7 +106,7 @@ void PerspectiveCamera::generateRay(const Vec2 &image, const Vec2 &lens, Ray &ra
 }
 
 OrthoCamera::OrthoCamera(std::string name, const Mtx4 &objectToWorld,
-                         const EnvironmentShaderInterface *env, const Vec2 &imagePlaneSize)
+                         const EnvironmentHandle *env, const Vec2 &imagePlaneSize)
     : Camera(std::move(name), objectToWorld, env) {
     h_ = right_ * imagePlaneSize.x;
     v_ = up_ * imagePlaneSize.y;
@@ -129,7 +129,7 @@ bool EnvCamera::projectionFromIndex(int index, Projection &out) {
 }
 
 EnvCamera::EnvCamera(std::string name, const Mtx4 &objectToWorld,
-                     const EnvironmentShaderInterface *env, Projection projection)
+                     const EnvironmentHandle *env, Projection projection)
     : Camera(std::move(name), objectToWorld, env), projection_(projection) {}
 
 bool EnvCamera::direction(float s, float t, Vec3 &dir) const {

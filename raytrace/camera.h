@@ -8,13 +8,20 @@
 
 namespace ox {
 
-class EnvironmentShaderInterface;
+/// What the camera knows of the environment its missed rays show: its identity only. The
+/// shading code's environment shaders derive from it (environmentOf in shading/shader.h turns
+/// it back). Never deleted through this type.
+class EnvironmentHandle {
+protected:
+    EnvironmentHandle() = default;
+    ~EnvironmentHandle() = default;
+};
 
 /// A camera turns an image point (and a lens point) into a primary ray with differentials.
 class Camera {
 public:
     /// Takes the camera frame from the rows of objectToWorld: right, up, backward, position.
-    Camera(std::string name, const Mtx4 &objectToWorld, const EnvironmentShaderInterface *env);
+    Camera(std::string name, const Mtx4 &objectToWorld, const EnvironmentHandle *env);
     virtual ~Camera();
 
     /// Fills ray for the image point in [0, 1]^2 and the lens point in [0, 1]^2.
@@ -39,12 +46,12 @@ public:
     /// The placement the camera was built from.
     const Mtx4 &objectToWorld() const { return objectToWorld_; }
     /// The environment shown by rays that miss (may be null).
-    const EnvironmentShaderInterface *environment() const { return environment_; }
+    const EnvironmentHandle *environment() const { return environment_; }
 
 protected:
     std::string name_;
     Mtx4 objectToWorld_;
-    const EnvironmentShaderInterface *environment_;
+    const EnvironmentHandle *environment_;
     Vec3 right_, up_, back_, pos_;
 };
 
@@ -52,10 +59,9 @@ protected:
 class PerspectiveCamera final : public Camera {
 public:
     /// fovX, fovY in radians; shift of the image plane in units of the right and up vectors.
-    PerspectiveCamera(std::string name, const Mtx4 &objectToWorld,
-                      const EnvironmentShaderInterface *env, float fovX, float fovY,
-                      const Vec2 &shift, int lensA = 0, int lensSwitch = 0, float lensRatio = 0.0f,
-                      float focusDistance = 0.0f);
+    PerspectiveCamera(std::string name, const Mtx4 &objectToWorld, const EnvironmentHandle *env,
+                      float fovX, float fovY, const Vec2 &shift, int lensA = 0, int lensSwitch = 0,
+                      float lensRatio = 0.0f, float focusDistance = 0.0f);
 
     void generateRay(const Vec2 &image, const Vec2 &lens, Ray &ray) const override;
     Vec3 position() const override { return pos_; }
@@ -84,7 +90,7 @@ private:
 class OrthoCamera final : public Camera {
 public:
     /// imagePlaneSize: width and height of the view in world units.
-    OrthoCamera(std::string name, const Mtx4 &objectToWorld, const EnvironmentShaderInterface *env,
+    OrthoCamera(std::string name, const Mtx4 &objectToWorld, const EnvironmentHandle *env,
                 const Vec2 &imagePlaneSize);
 
     void generateRay(const Vec2 &image, const Vec2 &lens, Ray &ray) const override;
@@ -103,7 +109,7 @@ public:
     /// Maps an EnvironmentType index to a projection; false for an index outside 0..2.
     static bool projectionFromIndex(int index, Projection &out);
 
-    EnvCamera(std::string name, const Mtx4 &objectToWorld, const EnvironmentShaderInterface *env,
+    EnvCamera(std::string name, const Mtx4 &objectToWorld, const EnvironmentHandle *env,
               Projection projection);
 
     void generateRay(const Vec2 &image, const Vec2 &lens, Ray &ray) const override;

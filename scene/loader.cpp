@@ -60,14 +60,14 @@ std::unique_ptr<Instance> createInstance(const XMLInstanceCompact &r, const Shap
 
 std::unique_ptr<Camera> createCamera(const XMLCameraCompact &r,
                                      const EnvironmentShaderInterface *env) {
-    switch (r.type) {
-        case 0:
+    switch (SceneCameraType(r.type)) {
+        case SceneCameraType::PERSPECTIVE:
             return std::make_unique<PerspectiveCamera>(r.name, r.objectToWorld, env, r.fov.x,
                                                        r.fov.y, r.imagePlaneShift, 0, 0, 0.0f,
                                                        0.0f);
-        case 1:
+        case SceneCameraType::ORTHO:
             return std::make_unique<OrthoCamera>(r.name, r.objectToWorld, env, r.imagePlaneSize);
-        case 2: {
+        case SceneCameraType::ENVIRONMENT: {
             EnvCamera::Projection projection;
             if (!EnvCamera::projectionFromIndex(r.environmentType, projection)) return nullptr;
             return std::make_unique<EnvCamera>(r.name, r.objectToWorld, env, projection);
@@ -103,11 +103,13 @@ bool CreateTempShapeWork::run(const std::atomic<bool> &, int) {
         std::string why;
         auto reader = vtm::TempMeshReaderFactory::instance().open(path_, &status, &why);
         if (!reader) {
-            if (status == vtm::OpenStatus::kBadHeader)
-                message(kMsgError, 6, "Error reading header in %s", path_.c_str());
-            else
-                message(kMsgError, 6, "Error reading %s", path_.c_str());
-            return true;
+            // The file was readable when the scene was loaded: a shape lost now fails the load.
+            std::string text = (status == vtm::OpenStatus::kBadHeader ? "Error reading header in "
+                                                                      : "Error reading ") +
+                               path_;
+            if (!why.empty()) text += ": " + why;
+            setError(text);
+            return false;
         }
         std::unique_ptr<Shape> shape;
         std::string failure;
@@ -135,7 +137,7 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
         return false;
     };
     message(kMsgProgress, 6, "Loading Scene File");
-    Timer loadTimer, triangulationTimer;
+    Timer loadTimer;
     loadTimer.start();
 
     // Inputs: mesh files are pre-opened for their name and box, scene documents are read.
@@ -164,7 +166,6 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
     }
     loadTimer.stop();
     bench("ZPX Loading time: %s", loadTimer);
-    bench("ZPX Triangulation time: %s", triangulationTimer);
 
     std::vector<const XMLInstanceCompact *> instanceRecords;
     std::vector<const XMLLightSourceCompact *> lightRecords;

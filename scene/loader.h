@@ -56,8 +56,8 @@ public:
                         const MeshBuildOptions &options, std::unique_ptr<Shape> &slot)
         : path_(std::move(path)), materials_(materials), options_(options), slot_(slot) {}
 
-    /// An unreadable file yields no shape (and no failure); a failed shape (a missing material,
-    /// a damaged file) fails the item with its text.
+    /// A file that cannot be opened or a failed shape (a missing material, a damaged file)
+    /// fails the item with its text; an empty file yields no shape and no failure.
     bool run(const std::atomic<bool> &stop, int threadIndex) override;
 
 private:

@@ -3,6 +3,7 @@
 #include <string>
 
 #include "core/types.h"
+#include "raytrace/camera.h"
 
 namespace ox {
 
@@ -37,11 +38,16 @@ public:
 };
 
 /// The colour of rays that leave the scene.
-class EnvironmentShaderInterface : public ShaderInterfaceBase {
+class EnvironmentShaderInterface : public ShaderInterfaceBase, public EnvironmentHandle {
 public:
     using ShaderInterfaceBase::ShaderInterfaceBase;
     /// The colour seen along a unit direction, before the ray's colour weight.
     virtual Color evaluateDirection(const Vec3 &direction) const = 0;
 };
+
+/// The environment shader behind the identity a camera holds (null stays null).
+inline const EnvironmentShaderInterface *environmentOf(const EnvironmentHandle *e) {
+    return static_cast<const EnvironmentShaderInterface *>(e);
+}
 
 }  // namespace ox

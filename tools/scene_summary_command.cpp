@@ -74,7 +74,8 @@ std::string sceneSummary(const Scene &scene) {
     s += formatText("Instances: %zu\n", scene.instances().size());
     for (const auto &inst : scene.instances()) {
         s += "  " + inst->name() + ": shape " + inst->shape().name();
-        if (inst->overrideMaterial()) s += ", material " + inst->overrideMaterial()->name();
+        if (inst->overrideMaterial())
+            s += ", material " + materialOf(inst->overrideMaterial())->name();
         s += formatText(", flags 0x%05X\n", inst->flags());
     }
     const auto materials = scene.materials().materials();

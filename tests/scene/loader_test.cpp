@@ -3,9 +3,11 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <atomic>
 #include <cmath>
 #include <fstream>
 
+#include "scene/material_converter.h"
 #include "scene_test_util.h"
 #include "shading/phong.h"
 
@@ -232,6 +234,19 @@ TEST(ZPXLoader, FailuresStopTheLoad) {
     LoadResult r = fail(bad);
     EXPECT_EQ(r.error, "Failed to preopen file " + bad.dir.file("bad.vtm"));
     EXPECT_NE(r.out.find("[ERROR]    Failed to preopen file "), std::string::npos);
+
+    // A mesh file gone by the time its shape is built fails its work item, with the reason.
+    {
+        MaterialTable table;
+        SceneMaterialResolver resolver(table);
+        std::unique_ptr<Shape> slot;
+        CreateTempShapeWork work(bad.dir.file("gone.vtm"), resolver, MeshBuildOptions(), slot);
+        std::atomic<bool> stop{false};
+        EXPECT_FALSE(work.run(stop, 0));
+        EXPECT_EQ(work.errorText().rfind("Error reading " + bad.dir.file("gone.vtm"), 0), 0u)
+            << work.errorText();
+        EXPECT_EQ(slot, nullptr);
+    }
 
     // An instance of a shape that no mesh file gives.
     SceneFiles ghost;
