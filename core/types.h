@@ -66,13 +66,15 @@ using Vec2i = Vec2T<int32_t>;
 /// Three-component float vector (points, directions, normals).
 struct Vec3 {
     float x = 0.0f, y = 0.0f, z = 0.0f;
+    static constexpr float Vec3::*kComponents[3] = {&Vec3::x, &Vec3::y, &Vec3::z};
 
     constexpr Vec3() = default;
     constexpr Vec3(float x_, float y_, float z_) : x(x_), y(y_), z(z_) {}
 
-    /// Component i: 0 x, 1 y, anything else z.
-    float &operator[](int i) { return i == 0 ? x : (i == 1 ? y : z); }
-    float operator[](int i) const { return i == 0 ? x : (i == 1 ? y : z); }
+    /// Component i (0 x, 1 y, 2 z), through a member table: no branch, no pointer arithmetic
+    /// across members.
+    float &operator[](int i) { return this->*kComponents[i]; }
+    float operator[](int i) const { return this->*kComponents[i]; }
 
     Vec3 operator+(const Vec3 &o) const { return {x + o.x, y + o.y, z + o.z}; }
     Vec3 operator-(const Vec3 &o) const { return {x - o.x, y - o.y, z - o.z}; }
