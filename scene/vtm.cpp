@@ -39,12 +39,21 @@ bool VornTempMeshBase::fail(std::string why) {
 bool VornTempMeshBase::openRead(const std::string &path) {
     path_ = path;
     writing_ = false;
-    file_ = std::fopen(path.c_str(), "rb");
-    if (!file_) return fail("cannot open the file");
+    // Opened without blocking, so that a named pipe or a device is refused instead of waiting
+    // for a writer that never comes.
+    const int fd = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    if (fd < 0) return fail("cannot open the file");
     struct stat st;
-    if (fstat(fileno(file_), &st) != 0 || !S_ISREG(st.st_mode)) {
-        close();
+    if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
+        ::close(fd);
         return fail("not a regular file");
+    }
+    const int flags = fcntl(fd, F_GETFL);
+    if (flags >= 0) fcntl(fd, F_SETFL, flags & ~O_NONBLOCK);
+    file_ = fdopen(fd, "rb");
+    if (!file_) {
+        ::close(fd);
+        return fail("cannot open the file");
     }
     fileSize_ = static_cast<uint64_t>(st.st_size);
     buffer_.resize(kBufferSize);

@@ -1,6 +1,7 @@
 #include "scene/vtm.h"
 
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <bit>
 #include <cmath>
@@ -146,6 +147,16 @@ TEST(Vtm, HostileHeadersFailCleanly) {
     EXPECT_EQ(openBytes(dir, smallFile(1).b), S::kOk);
     EXPECT_EQ(openBytes(dir, smallFile(2).b), S::kOk);
     EXPECT_EQ(vtm::TempMeshReaderFactory::instance().open(dir.file("missing.vtm")), nullptr);
+    // A named pipe without a writer, a directory and a device are refused at once, not waited
+    // on or read without end.
+    ASSERT_EQ(mkfifo(dir.file("pipe.vtm").c_str(), 0600), 0);
+    for (const std::string &path : {dir.file("pipe.vtm"), dir.path(), std::string("/dev/zero")}) {
+        vtm::OpenStatus status = S::kOk;
+        std::string why;
+        EXPECT_EQ(vtm::TempMeshReaderFactory::instance().open(path, &status, &why), nullptr);
+        EXPECT_EQ(status, S::kCannotOpen) << path;
+        EXPECT_EQ(why, "not a regular file") << path;
+    }
 
     // A fourth letter before the 0 byte, a lower-case magic, version 3 and 0.
     const std::tuple<size_t, unsigned char, S> damaged[] = {{3, 'X', S::kBadMagic},
