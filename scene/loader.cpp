@@ -144,8 +144,10 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
     std::vector<std::unique_ptr<SceneCompactBase>> records;
     std::unordered_map<std::string, BBox> shapeBounds;
     std::vector<std::string> meshPaths;
+    bool sceneInput = false;
     for (const std::string &path : inputs) {
         const std::string ext = fileExtension(path);
+        sceneInput = sceneInput || ext == "vtm" || ext == "xml";
         if (ext == "vtm") {
             std::string why;
             auto reader = vtm::TempMeshReaderFactory::instance().open(path, nullptr, &why);
@@ -163,6 +165,11 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
         } else {
             message(kMsgWarning, 6, "Don't know what to do with file: %s", path.c_str());
         }
+    }
+    // Inputs that are all skipped would leave an empty scene that looks like a success.
+    if (!sceneInput) {
+        message(kMsgError, 6, "No scene or mesh file among the inputs");
+        return fail("No scene or mesh file among the inputs");
     }
     loadTimer.stop();
     bench("ZPX Loading time: %s", loadTimer);

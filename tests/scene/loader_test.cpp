@@ -167,15 +167,27 @@ TEST(ZPXLoader, FileKindsByExtension) {
     SceneFiles f;
     mkdir(f.dir.file("dir.xml").c_str(), 0755);
     std::vector<std::string> inputs = {f.dir.file("upper.XML"), f.dir.file("noext"),
-                                       f.dir.file("dir.xml/noext"), f.dir.file("mesh.vtm.bak")};
+                                       f.dir.file("dir.xml/noext"), f.dir.file("mesh.vtm.bak"),
+                                       "/dev/zero"};
+    // Inputs that are all skipped leave nothing to load: that is a failure, not an empty scene.
+    Scene none;
+    LoadResult r = load(inputs, none);
+    EXPECT_FALSE(r.ok);
+    EXPECT_EQ(r.error, "No scene or mesh file among the inputs");
+    EXPECT_NE(r.out.find("[ERROR]    No scene or mesh file among the inputs"), std::string::npos);
+    EXPECT_FALSE(load({}, none).ok);
+
+    f.xml("empty.xml", "");
+    inputs.push_back(f.inputs.back());
     Scene scene;
     SceneLoadSettings s = settings();
     s.jobKind = 1;  // a texture bake: the default camera comes without the message
-    LoadResult r = load(inputs, scene, s);
+    r = load(inputs, scene, s);
     ASSERT_TRUE(r.ok) << r.error;
-    for (const auto &p : inputs)
-        EXPECT_NE(r.out.find("[WARNING]  Don't know what to do with file: " + p), std::string::npos)
-            << p;
+    for (size_t k = 0; k + 1 < inputs.size(); ++k)
+        EXPECT_NE(r.out.find("[WARNING]  Don't know what to do with file: " + inputs[k]),
+                  std::string::npos)
+            << inputs[k];
     EXPECT_EQ(r.out.find("Adding fake camera"), std::string::npos);
     EXPECT_EQ(fileExtension("a/b.c/d.e"), "e");
     EXPECT_EQ(fileExtension("d."), "");
@@ -205,14 +217,16 @@ TEST(ZPXLoader, AutomaticBias) {
     EXPECT_EQ(scene.instances().size(), 2u);
 
     // No instances: no box for the automatic bias.
+    SceneFiles nothing;
+    nothing.xml("empty.xml", "");
     Scene empty;
-    r = load({}, empty, settings(0.0f));
+    r = load(nothing.inputs, empty, settings(0.0f));
     ASSERT_TRUE(r.ok);
     EXPECT_EQ(empty.bias(), 0.005f);
     EXPECT_NE(r.out.find("[WARNING]  The scene has no usable bounding box"), std::string::npos);
     for (float bad : {-1.0f, NAN, INFINITY}) {
         Scene other;
-        r = load({}, other, settings(bad));
+        r = load(nothing.inputs, other, settings(bad));
         ASSERT_TRUE(r.ok);
         EXPECT_EQ(other.bias(), 0.005f);
         EXPECT_NE(r.out.find("[WARNING]  Invalid ray tracing bias"), std::string::npos);
@@ -276,7 +290,9 @@ TEST(ZPXLoader, FailuresStopTheLoad) {
     SceneLoadSettings s = settings();
     s.environment.rtEnvironment = 3;
     s.environment.iblImageFile = "/no/such/probe.hdr";
-    EXPECT_EQ(fail(SceneFiles(), s).error, "Unable to create environment");
+    SceneFiles empty;
+    empty.xml("empty.xml", "");
+    EXPECT_EQ(fail(empty, s).error, "Unable to create environment");
 }
 
 TEST(ZPXLoader, ShapesEdgeCases) {

@@ -1,4 +1,5 @@
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <fstream>
 #include <string>
@@ -72,6 +73,9 @@ TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
                            "<OXScene><Instance><Name>i</Name><Shape>ghost</Shape>"
                            "</Instance></OXScene>");
     std::string bad = file("bad.vtm", std::string("VTM\0\3\0\0\0", 8));
+    // A named pipe given as a mesh file is refused at once; a device is no scene at all.
+    const std::string pipe = (dir_ / "pipe.vtm").string();
+    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
     const struct {
         std::string args;
         int status;
@@ -80,13 +84,15 @@ TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
         {xml, 1, "Unable to load the scene: Missing shapes"},
         {bad, 1, "[ERROR]    Failed to preopen file " + bad},
         {bad, 1, "unsupported temporary mesh version 3"},
+        {pipe, 1, pipe + ": not a regular file"},
+        {"/dev/zero", 1, "Unable to load the scene: No scene or mesh file among the inputs"},
         {xml + " -x " + (dir_ / "missing.xml").string(), 3, "Unable to load settings from file"},
         {"", 2, "Usage: thevorn-inspect"},
         {xml + " -q", 2, "Usage: thevorn-inspect"},
         {xml + " -x", 2, "Usage: thevorn-inspect"},
     };
     for (const auto &c : cases) {
-        RunResult r = runInspect(c.args);
+        RunResult r = oxtest::runProgram("timeout 120 " + kInspect, c.args);
         EXPECT_EQ(r.status, c.status) << c.args;
         EXPECT_NE(r.output.find(c.text), std::string::npos) << c.text << "\n" << r.output;
         EXPECT_EQ(r.output.find("Shapes:"), std::string::npos);
