@@ -7,6 +7,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <mutex>
@@ -272,29 +273,51 @@ bool readFileChecked(const std::string &path, uint64_t maxSize, std::string &out
         errno = EFBIG;
         return false;
     }
+    // Read to the end, whatever size was reported (files under /proc report 0), with the cap
+    // on the bytes actually read.
+    uint64_t done = 0;
+    bool tooLarge = false;
+    int err = 0;
     try {
         out.resize(size_t(size));
+        for (;;) {
+            if (done == out.size()) {
+                if (done >= maxSize) {
+                    char probe;
+                    ssize_t n = ::read(fd, &probe, 1);
+                    if (n < 0 && errno == EINTR) continue;
+                    tooLarge = n > 0;
+                    if (n < 0) err = errno;
+                    break;
+                }
+                out.resize(size_t(std::min<uint64_t>(maxSize, std::max<uint64_t>(done * 2, 4096))));
+            }
+            ssize_t n = ::read(fd, out.data() + done, size_t(out.size() - done));
+            if (n < 0 && errno == EINTR) continue;
+            if (n < 0) err = errno;
+            if (n <= 0) break;
+            done += uint64_t(n);
+        }
     } catch (const std::bad_alloc &) {
         ::close(fd);
         message(kMsgError, 1, "Out of memory reading file %s", path.c_str());
         errno = ENOMEM;
         return false;
     }
-    uint64_t done = 0;
-    while (done < size) {
-        ssize_t n = ::read(fd, out.data() + done, size_t(size - done));
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        done += uint64_t(n);
-    }
-    int err = errno;
     ::close(fd);
-    if (done != size) {
-        message(kMsgError, 1, "Error reading file %s (%llu of %llu bytes read)", path.c_str(),
-                (unsigned long long)done, (unsigned long long)size);
-        errno = err ? err : EIO;
+    if (tooLarge) {
+        message(kMsgError, 1, "File %s is too large (more than %llu bytes)", path.c_str(),
+                (unsigned long long)maxSize);
+        errno = EFBIG;
         return false;
     }
+    if (err != 0) {
+        message(kMsgError, 1, "Error reading file %s (%llu of %llu bytes read)", path.c_str(),
+                (unsigned long long)done, (unsigned long long)size);
+        errno = err;
+        return false;
+    }
+    out.resize(size_t(done));
     return true;
 }
 
@@ -354,7 +377,7 @@ using xmldetail::ValueReader;
 xmlExternalEntityLoader gPreviousLoader = nullptr;
 
 /// Loads files that XInclude (or the library) asks for: local regular files within the size
-/// limit only, never the network.
+/// limit only, never the network; the library's own loader is never asked.
 xmlParserInputPtr checkedEntityLoader(const char *url, const char *id, xmlParserCtxtPtr ctxt) {
     if (!url) return nullptr;
     std::string_view u(url);
@@ -369,11 +392,48 @@ xmlParserInputPtr checkedEntityLoader(const char *url, const char *id, xmlParser
     } else {
         path.assign(u);
     }
+    // The file is read here, with the cap on the bytes actually read: files under /proc
+    // report the size 0 whatever they hold, and a pipe must not be waited on.
+    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK);
+    if (fd < 0) return nullptr;
     struct stat st;
-    if (::stat(path.c_str(), &st) != 0 || !S_ISREG(st.st_mode) ||
-        uint64_t(st.st_size) > kMaxXmlFileSize)
+    if (::fstat(fd, &st) != 0 || !S_ISREG(st.st_mode) || uint64_t(st.st_size) > kMaxXmlFileSize) {
+        ::close(fd);
         return nullptr;
-    return gPreviousLoader ? gPreviousLoader(url, id, ctxt) : nullptr;
+    }
+    std::string data;
+    bool ok = true;
+    try {
+        char chunk[1 << 16];
+        for (;;) {
+            const ssize_t n = ::read(fd, chunk, sizeof chunk);
+            if (n < 0 && errno == EINTR) continue;
+            if (n < 0) ok = false;
+            if (n <= 0) break;
+            if (data.size() + size_t(n) > kMaxXmlFileSize) {
+                ok = false;
+                break;
+            }
+            data.append(chunk, size_t(n));
+        }
+    } catch (const std::bad_alloc &) {
+        ok = false;
+    }
+    ::close(fd);
+    if (!ok || data.size() > size_t(INT32_MAX)) return nullptr;
+    // The buffer keeps its own copy of the bytes.
+    xmlParserInputBufferPtr buffer =
+        xmlParserInputBufferCreateMem(data.data(), int(data.size()), XML_CHAR_ENCODING_NONE);
+    if (!buffer) return nullptr;
+    xmlParserInputPtr input = xmlNewIOInputStream(ctxt, buffer, XML_CHAR_ENCODING_NONE);
+    if (!input) {
+        xmlFreeParserInputBuffer(buffer);
+        return nullptr;
+    }
+    // The name lets relative references inside the included file resolve against it.
+    input->filename = reinterpret_cast<const char *>(
+        xmlCanonicPath(reinterpret_cast<const xmlChar *>(url)));
+    return input;
 }
 
 /// Installs the checked loader for the duration of one load. The loader is process-wide in

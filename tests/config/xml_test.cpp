@@ -251,6 +251,17 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All>"
               "<xi:include href=\"/dev/zero\" parse=\"text\"/></All></OXConfig>");
     captured([&] { EXPECT_FALSE(ox::loadSettings("dev.xml", x)); });
+
+    // Files under /proc report the size 0 but hold text: what is actually read counts, for the
+    // main file and for included ones.
+    writeFile("proc.xml",
+              "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>5</count>"
+              "<xi:include href=\"/proc/self/status\" parse=\"text\"/></All></OXConfig>");
+    Root p;
+    std::string out = captured([&] { EXPECT_TRUE(ox::loadSettings("proc.xml", p)); });
+    EXPECT_EQ(countOf(out, "Did XInclude inclusions"), 1);
+    EXPECT_EQ(p.all.count.get(), 5);
+    failsWith("/proc/self/status", "Error parsing file /proc/self/status in xmlsource");
 }
 
 TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
