@@ -8,8 +8,12 @@
 #include <cstring>
 #include <filesystem>
 
+#include <sys/resource.h>
+#include <unistd.h>
+
 #include "core/message.h"
 #include "platform/file_system.h"
+#include "tools/model_checks.h"
 #include "tools/scene_xml_writer.h"
 #include "tools/shape_file.h"
 
@@ -29,6 +33,23 @@ bool parseInt(const std::string &text, int &out) {
     const char *b = text.data(), *e = b + text.size();
     auto r = std::from_chars(b, e, out);
     return r.ec == std::errc() && r.ptr == e;
+}
+
+// A size in MiB, or with the suffix M (MiB) or G (GiB).
+bool parseMemorySize(const std::string &text, uint64_t &bytes) {
+    std::string digits = text;
+    unsigned shift = 20;
+    if (!digits.empty() && (digits.back() == 'G' || digits.back() == 'g'))
+        shift = 30, digits.pop_back();
+    else if (!digits.empty() && (digits.back() == 'M' || digits.back() == 'm'))
+        digits.pop_back();
+    uint64_t value = 0;
+    const char *b = digits.data(), *e = b + digits.size();
+    auto r = std::from_chars(b, e, value);
+    if (r.ec != std::errc() || r.ptr != e || digits.empty() || value > (uint64_t(1) << 40))
+        return false;
+    bytes = value << shift;
+    return true;
 }
 
 std::string formatVec(const Vec3 &v) { return formatText("(%g, %g, %g)", v.x, v.y, v.z); }
@@ -55,6 +76,8 @@ std::vector<std::string> importUsage() {
         "  --lightmap-padding N   empty texels between charts (default 2)",
         "  --lightmap-angle DEG   largest normal deviation inside one chart (default 45)",
         "  --progress / --no-progress  progress line while reading (default: files over 32 MiB)",
+        "  --max-memory SIZE      memory the import may use, in MiB or with a suffix M or G",
+        "                         (default: three quarters of the machine's memory)",
         "  --force                replace existing output files",
         "  -q, --quiet            only warnings and errors",
         "  -h, --help             this text",
@@ -153,6 +176,13 @@ bool parseImportCommand(const std::vector<std::string> &args, ImportCommand &com
             c.progressMode = 1;
         } else if (a == "--no-progress") {
             c.progressMode = -1;
+        } else if (a == "--max-memory") {
+            if (!value(v)) return false;
+            if (!parseMemorySize(v, c.maxMemoryBytes) || c.maxMemoryBytes < kMinImportMemoryBytes) {
+                message(kMsgError, 6, "Memory limit must be at least 64 MiB (as 64, 512M or 4G), not %s",
+                        v.c_str());
+                return false;
+            }
         } else if (a == "--force") {
             c.force = true;
         } else if (a == "-q" || a == "--quiet") {
@@ -305,6 +335,9 @@ void reportStats(const ImportStats &s) {
     if (s.polygonsTriangulated)
         message(kMsgWarning, 6, "Triangulated %llu polygons of more than three corners",
                 (unsigned long long)s.polygonsTriangulated);
+    if (s.hugePolygons)
+        message(kMsgWarning, 6, "Dropped %llu polygons of more than %u corners",
+                (unsigned long long)s.hugePolygons, kMaxPolygonCorners);
     if (s.emptyMeshes)
         message(kMsgWarning, 6, "Skipped %llu meshes without triangles",
                 (unsigned long long)s.emptyMeshes);
@@ -312,7 +345,47 @@ void reportStats(const ImportStats &s) {
 
 }  // namespace
 
+static int runImportSteps(const ImportCommand &command,
+                          const std::function<void(float)> &progress);
+
+uint64_t defaultImportMemoryLimit() {
+    const long pages = ::sysconf(_SC_PHYS_PAGES), pageSize = ::sysconf(_SC_PAGE_SIZE);
+    if (pages <= 0 || pageSize <= 0) return uint64_t(8) << 30;
+    return std::max(uint64_t(pages) / 4 * 3 * uint64_t(pageSize), kMinImportMemoryBytes);
+}
+
+bool applyImportMemoryLimit(uint64_t bytes) {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+    (void)bytes;
+    return true;
+#else
+#if defined(__has_feature)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer) || \
+    __has_feature(memory_sanitizer)
+    (void)bytes;
+    return true;
+#endif
+#endif
+    struct rlimit limit;
+    if (::getrlimit(RLIMIT_AS, &limit) != 0) return false;
+    if (limit.rlim_max != RLIM_INFINITY && rlim_t(bytes) > limit.rlim_max) bytes = limit.rlim_max;
+    limit.rlim_cur = rlim_t(bytes);
+    return ::setrlimit(RLIMIT_AS, &limit) == 0;
+#endif
+}
+
 int runImport(const ImportCommand &command, const std::function<void(float)> &progress) {
+    // Whatever allocation still fails under the memory limit ends the import cleanly.
+    try {
+        return runImportSteps(command, progress);
+    } catch (const std::bad_alloc &) {
+        message(kMsgError, 6, "Cannot import %s: out of memory", command.model.c_str());
+    }
+    return kImportFailed;
+}
+
+static int runImportSteps(const ImportCommand &command,
+                          const std::function<void(float)> &progress) {
     if (command.quiet) setTypeEnabled(kMsgInfo | kMsgProgress, false);
     ImportOptions options = command.options;
     std::error_code ec;

@@ -32,7 +32,20 @@ struct ImportCommand {
     int progressMode = 0;        ///< 0 automatic (large files), 1 always, -1 never
     int lightmapResolution = 0;  ///< 0 = no light-map UVs are generated
     LightmapOptions lightmap;
+    uint64_t maxMemoryBytes = 0;  ///< address space the import may use; 0 = the default
 };
+
+/// The smallest memory limit that can be asked for.
+constexpr uint64_t kMinImportMemoryBytes = uint64_t(64) << 20;
+
+/// The memory limit of an import when none is given: three quarters of the machine's memory.
+uint64_t defaultImportMemoryLimit();
+
+/// Limits the address space of the whole process to bytes, so that an allocation beyond it
+/// fails (and ends the import with "out of memory") instead of exhausting the machine. Builds
+/// with a sanitizer keep their own limits and are left alone. False when the limit cannot be
+/// set.
+bool applyImportMemoryLimit(uint64_t bytes);
 
 /// Files larger than this get a progress line unless told otherwise.
 constexpr uint64_t kProgressFileBytes = 32ull << 20;

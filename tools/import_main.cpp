@@ -31,5 +31,10 @@ int main(int argc, char **argv) {
         for (const std::string &line : ox::importUsage()) ox::consoleLine(line);
         return help ? ox::kImportOk : ox::kImportUsage;
     }
+    const uint64_t limit =
+        command.maxMemoryBytes ? command.maxMemoryBytes : ox::defaultImportMemoryLimit();
+    if (!ox::applyImportMemoryLimit(limit))
+        ox::message(ox::kMsgWarning, 6, "Cannot limit the memory of the import to %llu MiB",
+                    (unsigned long long)(limit >> 20));
     return ox::runImport(command, showProgress);
 }

@@ -1,10 +1,11 @@
 #include "tools/model_reader.h"
 
-#include <assimp/DefaultIOSystem.h>
+#include <assimp/IOSystem.hpp>
 #include <assimp/MemoryIOWrapper.h>
 #include <assimp/config.h>
 #include <assimp/postprocess.h>
 #include <assimp/scene.h>
+#include <sys/stat.h>
 
 #include <algorithm>
 #include <assimp/Importer.hpp>
@@ -18,9 +19,11 @@
 #include <new>
 #include <numbers>
 #include <string_view>
+#include <unordered_map>
 #include <unordered_set>
 
 #include "core/message.h"
+#include "tools/model_checks.h"
 
 namespace ox {
 
@@ -145,28 +148,47 @@ bool filterObjFaces(const std::string &text, std::string &filtered, uint64_t &dr
     return true;
 }
 
-// Serves one file from memory and every other (materials, textures) from the disk.
-class FilteredIOSystem : public Assimp::DefaultIOSystem {
+// The model's own file layer: the model is served from memory, and every side file the library
+// asks for (materials, buffers, images) is read through readModelFile, so that pipes, devices
+// and oversized files are refused; without disk access no side file exists.
+class ModelFileSystem : public Assimp::IOSystem {
 public:
-    FilteredIOSystem(std::string path, std::string text)
-        : path_(std::move(path)), text_(std::move(text)) {}
+    ModelFileSystem(std::string path, std::string_view bytes, bool disk)
+        : path_(std::move(path)), bytes_(bytes), disk_(disk) {}
     bool Exists(const char *file) const override {
-        return isMain(file) || Assimp::DefaultIOSystem::Exists(file);
+        if (!file) return false;
+        if (isMain(file)) return true;
+        // Anything but a directory "exists", so that Open can say why it refuses a pipe.
+        struct stat st;
+        return disk_ && ::stat(file, &st) == 0 && !S_ISDIR(st.st_mode);
     }
+    char getOsSeparator() const override { return '/'; }
     Assimp::IOStream *Open(const char *file, const char *mode) override {
+        if (!file || !mode || std::strpbrk(mode, "wa+")) return nullptr;
         if (isMain(file))
-            return new Assimp::MemoryIOStream(reinterpret_cast<const uint8_t *>(text_.data()),
-                                              text_.size(), false);
-        return Assimp::DefaultIOSystem::Open(file, mode);
+            return new Assimp::MemoryIOStream(reinterpret_cast<const uint8_t *>(bytes_.data()),
+                                              bytes_.size(), false);
+        if (!disk_) return nullptr;
+        std::string data, why;
+        if (!readModelFile(file, kMaxModelFileBytes, data, why)) {
+            message(kMsgWarning, 6, "Cannot read %s: %s", file, why.c_str());
+            return nullptr;
+        }
+        auto *copy = new uint8_t[std::max<size_t>(data.size(), 1)];
+        std::memcpy(copy, data.data(), data.size());
+        return new Assimp::MemoryIOStream(copy, data.size(), true);
     }
+    void Close(Assimp::IOStream *stream) override { delete stream; }
 
 private:
     bool isMain(const char *file) const {
+        if (path_ == file) return true;
         std::error_code ec;
-        return file && (path_ == file || fs::equivalent(path_, file, ec));
+        return disk_ && fs::equivalent(path_, file, ec);
     }
     std::string path_;
-    std::string text_;
+    std::string_view bytes_;
+    bool disk_;
 };
 
 class ProgressRelay : public Assimp::ProgressHandler {
@@ -268,7 +290,20 @@ public:
     bool walk(ImportedModel &model) {
         model_ = &model;
         materialIndex_.assign(scene_.mNumMaterials, -1);
-        if (scene_.mRootNode) walkNode(*scene_.mRootNode, Mtx4(), model);
+        // Depth first with a stack of its own: node chains may be any number of levels deep.
+        // A node met twice (a damaged hierarchy) is walked once.
+        std::vector<std::pair<const aiNode *, Mtx4>> stack;
+        std::unordered_set<const aiNode *> seen;
+        if (scene_.mRootNode) stack.emplace_back(scene_.mRootNode, Mtx4());
+        while (!stack.empty()) {
+            auto [node, parent] = stack.back();
+            stack.pop_back();
+            if (!seen.insert(node).second) continue;
+            nodeByName_.try_emplace(node->mName.C_Str(), node);
+            const Mtx4 world = walkNode(*node, parent, model);
+            for (unsigned i = node->mNumChildren; i-- > 0;)
+                if (node->mChildren[i]) stack.emplace_back(node->mChildren[i], world);
+        }
         for (unsigned i = 0; i < scene_.mNumCameras; ++i) addCamera(*scene_.mCameras[i], model);
         for (unsigned i = 0; i < scene_.mNumLights; ++i) addLight(*scene_.mLights[i], model);
         return true;
@@ -283,21 +318,28 @@ private:
     // which would apply it twice.
     Vec3 ownPosition(const aiString &name, const aiVector3D &position) const {
         Vec3 p = toVec3(position);
-        const aiNode *node = scene_.mRootNode ? scene_.mRootNode->FindNode(name) : nullptr;
+        const aiNode *node = findNode(name);
         if (gltf_ && node &&
             p == Vec3(node->mTransformation.a4, node->mTransformation.b4, node->mTransformation.c4))
             return Vec3();
         return p;
     }
 
+    // The first node of the name in walking order, as the library's own (recursive) search.
+    const aiNode *findNode(const aiString &name) const {
+        auto found = nodeByName_.find(name.C_Str());
+        return found == nodeByName_.end() ? nullptr : found->second;
+    }
+
     Mtx4 nodeWorld(const aiString &name) const {
-        const aiNode *node = scene_.mRootNode ? scene_.mRootNode->FindNode(name) : nullptr;
+        const aiNode *node = findNode(name);
         Mtx4 world;
         for (; node; node = node->mParent) world = world * toRowMatrix(node->mTransformation);
         return world;
     }
 
-    void walkNode(const aiNode &node, const Mtx4 &parent, ImportedModel &model) {
+    // Adds the instance of one node; returns its world matrix for its children.
+    Mtx4 walkNode(const aiNode &node, const Mtx4 &parent, ImportedModel &model) {
         const Mtx4 world = toRowMatrix(node.mTransformation) * parent;
         std::vector<unsigned> meshes;
         for (unsigned i = 0; i < node.mNumMeshes; ++i) {
@@ -326,8 +368,7 @@ private:
             instance.objectToWorld = convertInverse_ * world * convert_;
             model.instances.push_back(std::move(instance));
         }
-        for (unsigned i = 0; i < node.mNumChildren; ++i)
-            if (node.mChildren[i]) walkNode(*node.mChildren[i], world, model);
+        return world;
     }
 
     ImportedShape buildShape(const std::string &name, const std::vector<unsigned> &meshes,
@@ -706,6 +747,7 @@ private:
     Mtx4 convert_, convertInverse_, convertLinear_, normalMatrix_;
     bool mirror_ = false;
     std::map<std::vector<unsigned>, size_t> shapeOf_;
+    std::unordered_map<std::string, const aiNode *> nodeByName_;
     std::vector<int> materialIndex_;
     std::string defaultMaterial_;
     std::unordered_set<std::string> shapeNames_, instanceNames_, materialNames_, cameraNames_,
@@ -725,6 +767,7 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
             finite[v] = std::isfinite(p.x) && std::isfinite(p.y) && std::isfinite(p.z);
         }
         unsigned kept = 0;
+        unsigned primitives = 0;
         for (unsigned f = 0; f < mesh->mNumFaces; ++f) {
             aiFace &face = mesh->mFaces[f];
             bool drop = false;
@@ -744,10 +787,13 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
                     ++stats.badIndexFaces, drop = true;
                 else if (nonFinite)
                     ++stats.nonFiniteFaces, drop = true;
+                else if (face.mNumIndices > kMaxPolygonCorners)
+                    ++stats.hugePolygons, drop = true;
                 else if (face.mNumIndices > 3)
                     ++stats.polygonsTriangulated;
             }
             if (drop) continue;
+            primitives |= face.mNumIndices == 3 ? aiPrimitiveType_TRIANGLE : aiPrimitiveType_POLYGON;
             // Swapping keeps every index array owned by exactly one face of the array.
             if (kept != f) {
                 std::swap(mesh->mFaces[kept].mIndices, face.mIndices);
@@ -759,17 +805,17 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
         // Positions no face uses may still be NaN; they must not reach the later steps.
         for (unsigned v = 0; v < mesh->mNumVertices; ++v)
             if (!finite[v]) mesh->mVertices[v] = aiVector3D(0, 0, 0);
-        // An emptied mesh still claims triangles, which the later steps expect of every mesh;
-        // the walk skips meshes without faces.
+        // The kinds of face are those that remain: a polygon kind left behind by a dropped face
+        // makes the triangulation fail its own count. An emptied mesh claims triangles, which
+        // the later steps expect of every mesh; the walk skips meshes without faces.
         if (kept == 0) ++stats.emptyMeshes;
-        mesh->mPrimitiveTypes &= ~unsigned(aiPrimitiveType_POINT | aiPrimitiveType_LINE);
-        mesh->mPrimitiveTypes |= aiPrimitiveType_TRIANGLE;
+        mesh->mPrimitiveTypes = kept == 0 ? unsigned(aiPrimitiveType_TRIANGLE) : primitives;
         if (scene.mNumMaterials > 0 && mesh->mMaterialIndex >= scene.mNumMaterials)
             mesh->mMaterialIndex = 0;
     }
 }
 
-const char *const kTooMuchMemory = "it asks for more memory than there is (a damaged file?)";
+const char *const kTooMuchMemory = "out of memory (a damaged file, or --max-memory too small?)";
 
 // The reader's reason; a failed allocation (the library reports the exception's name) in words.
 std::string readerError(const Assimp::Importer &importer) {
@@ -809,44 +855,36 @@ std::string sanitizeName(const std::string &name, const std::string &fallback) {
     return out;
 }
 
-bool readModel(const std::string &path, const ImportOptions &options, ImportedModel &model,
-               ImportStats &stats) {
+namespace {
+
+// Reads a model whose main file is already in memory; side files come from the disk only when
+// disk is set.
+bool readModelBytes(const std::string &path, std::string bytes, bool disk,
+                    const ImportOptions &options, ImportedModel &model, ImportStats &stats) {
     if (!(options.unitScale > 0.0f) || !std::isfinite(options.unitScale)) {
         message(kMsgError, 6, "Unit scale must be a positive number");
         return false;
     }
-    std::error_code ec;
-    if (!fs::is_regular_file(path, ec)) {
-        message(kMsgError, 6, "Cannot read model %s: no such file", path.c_str());
-        return false;
-    }
-    FILE *probe = std::fopen(path.c_str(), "rb");
-    if (!probe) {
-        message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), std::strerror(errno));
-        return false;
-    }
-    std::fclose(probe);
-
     try {
+        const std::string ext = lowerExtension(path);
+        std::string why;
+        if (!checkDeclaredSizes(ext, bytes, why)) {
+            message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), why.c_str());
+            return false;
+        }
+        if (ext == ".obj") {
+            std::string filtered;
+            uint64_t dropped = 0;
+            if (filterObjFaces(bytes, filtered, dropped)) {
+                stats.badIndexFaces += dropped;
+                bytes = std::move(filtered);
+            }
+        }
         Assimp::Importer importer;
         importer.SetPropertyFloat(AI_CONFIG_PP_GSN_MAX_SMOOTHING_ANGLE,
                                   std::clamp(options.smoothingAngleDegrees, 0.0f, 175.0f));
         if (options.progress) importer.SetProgressHandler(new ProgressRelay(options.progress));
-
-        if (lowerExtension(path) == ".obj") {
-            std::string text, filtered;
-            if (FILE *f = std::fopen(path.c_str(), "rb")) {
-                char buffer[1 << 16];
-                size_t n;
-                while ((n = std::fread(buffer, 1, sizeof buffer, f)) > 0) text.append(buffer, n);
-                std::fclose(f);
-            }
-            uint64_t dropped = 0;
-            if (filterObjFaces(text, filtered, dropped)) {
-                stats.badIndexFaces += dropped;
-                importer.SetIOHandler(new FilteredIOSystem(path, std::move(filtered)));
-            }
-        }
+        importer.SetIOHandler(new ModelFileSystem(path, bytes, disk));
 
         const aiScene *read = importer.ReadFile(path, 0);
         if (!read) {
@@ -876,6 +914,23 @@ bool readModel(const std::string &path, const ImportOptions &options, ImportedMo
         return false;
     }
     return true;
+}
+
+}  // namespace
+
+bool readModel(const std::string &path, const ImportOptions &options, ImportedModel &model,
+               ImportStats &stats) {
+    std::string bytes, why;
+    if (!readModelFile(path, kMaxModelFileBytes, bytes, why)) {
+        message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), why.c_str());
+        return false;
+    }
+    return readModelBytes(path, std::move(bytes), true, options, model, stats);
+}
+
+bool readModelFromMemory(const std::string &name, std::string_view bytes,
+                         const ImportOptions &options, ImportedModel &model, ImportStats &stats) {
+    return readModelBytes(name, std::string(bytes), false, options, model, stats);
 }
 
 }  // namespace ox

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <functional>
 #include <string>
+#include <string_view>
 
 #include "tools/imported_model.h"
 
@@ -36,6 +37,7 @@ struct ImportStats {
     uint64_t nonFiniteFaces = 0;        ///< faces with a NaN or infinite corner
     uint64_t polygonsTriangulated = 0;  ///< faces of more than three corners
     uint64_t pointsAndLines = 0;        ///< faces of one or two corners (dropped)
+    uint64_t hugePolygons = 0;          ///< faces of more corners than can be triangulated
     uint64_t emptyMeshes = 0;           ///< meshes with no triangle left
     uint64_t missingTextures = 0;       ///< texture files that were not found
     uint64_t unsupportedLights = 0;     ///< lights of a kind the scene cannot show
@@ -49,6 +51,12 @@ Mtx4 conversionMatrix(const ImportOptions &options);
 /// what was dropped or repaired. The model is filled only on success.
 bool readModel(const std::string &path, const ImportOptions &options, ImportedModel &model,
                ImportStats &stats);
+
+/// Reads a model held in memory; name gives the format by its extension. No side file
+/// (materials, buffers, images outside the model) is read: the model is read as if they were
+/// missing.
+bool readModelFromMemory(const std::string &name, std::string_view bytes,
+                         const ImportOptions &options, ImportedModel &model, ImportStats &stats);
 
 /// Makes names safe for scene files and file names: control characters, path separators and
 /// bytes outside printable ASCII become '_'; an empty name becomes fallback.
