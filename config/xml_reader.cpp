@@ -431,8 +431,8 @@ xmlParserInputPtr checkedEntityLoader(const char *url, const char *id, xmlParser
         return nullptr;
     }
     // The name lets relative references inside the included file resolve against it.
-    input->filename = reinterpret_cast<const char *>(
-        xmlCanonicPath(reinterpret_cast<const xmlChar *>(url)));
+    input->filename =
+        reinterpret_cast<const char *>(xmlCanonicPath(reinterpret_cast<const xmlChar *>(url)));
     return input;
 }
 

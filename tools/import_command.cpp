@@ -1,5 +1,8 @@
 #include "tools/import_command.h"
 
+#include <sys/resource.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
@@ -7,9 +10,6 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
-
-#include <sys/resource.h>
-#include <unistd.h>
 
 #include "core/message.h"
 #include "platform/file_system.h"
@@ -179,7 +179,8 @@ bool parseImportCommand(const std::vector<std::string> &args, ImportCommand &com
         } else if (a == "--max-memory") {
             if (!value(v)) return false;
             if (!parseMemorySize(v, c.maxMemoryBytes) || c.maxMemoryBytes < kMinImportMemoryBytes) {
-                message(kMsgError, 6, "Memory limit must be at least 64 MiB (as 64, 512M or 4G), not %s",
+                message(kMsgError, 6,
+                        "Memory limit must be at least 64 MiB (as 64, 512M or 4G), not %s",
                         v.c_str());
                 return false;
             }
@@ -345,8 +346,7 @@ void reportStats(const ImportStats &s) {
 
 }  // namespace
 
-static int runImportSteps(const ImportCommand &command,
-                          const std::function<void(float)> &progress);
+static int runImportSteps(const ImportCommand &command, const std::function<void(float)> &progress);
 
 uint64_t defaultImportMemoryLimit() {
     const long pages = ::sysconf(_SC_PHYS_PAGES), pageSize = ::sysconf(_SC_PAGE_SIZE);

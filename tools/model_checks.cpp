@@ -18,8 +18,8 @@ namespace {
 uint64_t plyTypeBytes(std::string_view type) {
     if (type == "char" || type == "uchar" || type == "int8" || type == "uint8") return 1;
     if (type == "short" || type == "ushort" || type == "int16" || type == "uint16") return 2;
-    if (type == "int" || type == "uint" || type == "int32" || type == "uint32" ||
-        type == "float" || type == "float32")
+    if (type == "int" || type == "uint" || type == "int32" || type == "uint32" || type == "float" ||
+        type == "float32")
         return 4;
     if (type == "double" || type == "float64") return 8;
     return 0;

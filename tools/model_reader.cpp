@@ -1,6 +1,5 @@
 #include "tools/model_reader.h"
 
-#include <assimp/IOSystem.hpp>
 #include <assimp/MemoryIOWrapper.h>
 #include <assimp/config.h>
 #include <assimp/postprocess.h>
@@ -8,6 +7,7 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <assimp/IOSystem.hpp>
 #include <assimp/Importer.hpp>
 #include <assimp/ProgressHandler.hpp>
 #include <cerrno>
@@ -793,7 +793,8 @@ void sanitizeMeshes(aiScene &scene, ImportStats &stats) {
                     ++stats.polygonsTriangulated;
             }
             if (drop) continue;
-            primitives |= face.mNumIndices == 3 ? aiPrimitiveType_TRIANGLE : aiPrimitiveType_POLYGON;
+            primitives |=
+                face.mNumIndices == 3 ? aiPrimitiveType_TRIANGLE : aiPrimitiveType_POLYGON;
             // Swapping keeps every index array owned by exactly one face of the array.
             if (kept != f) {
                 std::swap(mesh->mFaces[kept].mIndices, face.mIndices);

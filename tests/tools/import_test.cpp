@@ -299,7 +299,6 @@ TEST_F(ImportTest, UnreadableModelGivesOneError) {
         EXPECT_TRUE(c.status != ox::kImportFailed || oneError(r.output)) << r.output;
     }
     EXPECT_FALSE(fs::exists("out"));
-
 }
 
 // Files that once crashed, hung or exhausted the import: each is a clean error, or a correct
@@ -334,18 +333,24 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
         std::vector<std::string> texts;
     } cases[] = {
         // A quad dropped for its NaN corner used to leave the mesh marked as holding polygons.
-        {data + "nan_quad.obj --list", ox::kImportOk,
+        {data + "nan_quad.obj --list",
+         ox::kImportOk,
          {"Dropped 1 faces with NaN or infinite positions", "Shapes: 0"}},
         {"deep.gltf --list", ox::kImportOk, {"Deep: perspective at (0, 10000, 0)"}},
-        {"huge_face.obj --list --lightmap-uv 64", ox::kImportOk,
+        {"huge_face.obj --list --lightmap-uv 64",
+         ox::kImportOk,
          {"Dropped 1 polygons of more than 1024 corners", "Shapes: 1 (1 triangles)"}},
-        {data + "json_chunk_claims_4g.glb -o out", ox::kImportFailed,
+        {data + "json_chunk_claims_4g.glb -o out",
+         ox::kImportFailed,
          {"chunk 0 declares 4294967280 bytes, more than the file holds"}},
-        {data + "vertices_2_30.ply -o out", ox::kImportFailed,
+        {data + "vertices_2_30.ply -o out",
+         ox::kImportFailed,
          {"declares 1073741824 elements vertex, " + kTooLarge}},
-        {data + "vertices_2_32.ply -o out", ox::kImportFailed,
+        {data + "vertices_2_32.ply -o out",
+         ox::kImportFailed,
          {"declares 4294967296 elements vertex, " + kTooLarge}},
-        {data + "ascii_vertices_2_30.ply -o out", ox::kImportFailed,
+        {data + "ascii_vertices_2_30.ply -o out",
+         ox::kImportFailed,
          {"declares 1073741824 elements vertex, " + kTooLarge}},
         {data + "long_newmtl.obj --list", ox::kImportOk, {"Shapes: 1 (1 triangles)"}},
     };
@@ -408,7 +413,8 @@ TEST_F(ImportTest, MemoryLimit) {
     const struct {
         const char *value;
         uint64_t bytes;
-    } good[] = {{"64", 64ull << 20}, {"512M", 512ull << 20}, {"4G", 4ull << 30}, {"2g", 2ull << 30}};
+    } good[] = {
+        {"64", 64ull << 20}, {"512M", 512ull << 20}, {"4G", 4ull << 30}, {"2g", 2ull << 30}};
     for (const auto &g : good) {
         ox::ImportCommand c;
         bool help = false;
