@@ -53,7 +53,10 @@ bool parseCount(std::string_view text, uint64_t &value) {
 // property needs its size in binary files and a digit and a separator in text files.
 bool checkPly(std::string_view bytes, std::string &why) {
     const size_t headerEnd = bytes.find("end_header");
-    if (headerEnd == std::string_view::npos) return true;  // the library reports it
+    if (headerEnd == std::string_view::npos) {
+        why = "the header has no end";
+        return false;
+    }
     const size_t bodyStart = bytes.find('\n', headerEnd);
     const uint64_t body = bodyStart == std::string_view::npos ? 0 : bytes.size() - bodyStart - 1;
     std::string_view header = bytes.substr(0, headerEnd);
@@ -71,7 +74,15 @@ bool checkPly(std::string_view bytes, std::string &why) {
         const std::vector<std::string_view> w = words(header.substr(pos, end - pos));
         pos = end + 1;
         if (w.empty()) continue;
-        if (w[0] == "format" && w.size() >= 2) {
+        // Only the header's own lines, with known types, are passed on: the library's reader
+        // can loop without end on a property of a type it does not know.
+        if (w[0] == "ply" || w[0] == "comment" || w[0] == "obj_info") continue;
+        if (w[0] == "format") {
+            if (w.size() < 2 || (w[1] != "ascii" && w[1] != "binary_little_endian" &&
+                                 w[1] != "binary_big_endian")) {
+                why = "the header names an unknown format";
+                return false;
+            }
             binary = w[1] != "ascii";
         } else if (w[0] == "element" && w.size() >= 3) {
             Element e;
@@ -84,14 +95,22 @@ bool checkPly(std::string_view bytes, std::string &why) {
             elements.push_back(std::move(e));
         } else if (w[0] == "property" && !elements.empty()) {
             Element &e = elements.back();
-            if (w.size() >= 4 && w[1] == "list")
-                e.minBytes += binary ? std::max<uint64_t>(plyTypeBytes(w[2]), 1) : 2;
-            else if (w.size() >= 2)
-                e.minBytes += binary ? std::max<uint64_t>(plyTypeBytes(w[1]), 1) : 2;
+            const bool list = w.size() >= 2 && w[1] == "list";
+            const uint64_t bytes =
+                list ? (w.size() >= 5 && plyTypeBytes(w[3]) > 0 ? plyTypeBytes(w[2]) : 0)
+                     : (w.size() >= 3 ? plyTypeBytes(w[1]) : 0);
+            if (bytes == 0) {
+                why = "the header holds a property of an unknown type in element " + e.name;
+                return false;
+            }
+            e.minBytes += binary ? bytes : 2;
             if (e.minBytes > 1 << 20) {
                 why = "the header declares too many properties of element " + e.name;
                 return false;
             }
+        } else {
+            why = "the header holds a line that is no header line";
+            return false;
         }
     }
     uint64_t need = 0;

@@ -353,6 +353,9 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
          ox::kImportFailed,
          {"declares 1073741824 elements vertex, " + kTooLarge}},
         {data + "long_newmtl.obj --list", ox::kImportOk, {"Shapes: 1 (1 triangles)"}},
+        // The library's reader looped without end on a header that never ends, with a
+        // property of an unknown type in it.
+        {data + "endless_header.ply --list", ox::kImportFailed, {"the header has no end"}},
     };
     for (const auto &c : cases) {
         // A hang shows as the status of timeout.
