@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <bit>
 #include <cmath>
 #include <cstring>
@@ -56,7 +57,8 @@ bool VornTempMeshBase::openRead(const std::string &path) {
         return fail("cannot open the file");
     }
     fileSize_ = static_cast<uint64_t>(st.st_size);
-    buffer_.resize(kBufferSize);
+    // A small file needs no more buffer than its own size.
+    buffer_.resize(size_t(std::clamp<uint64_t>(fileSize_, 1, kBufferSize)));
     return true;
 }
 
