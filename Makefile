@@ -2,10 +2,13 @@
 BUILD_DIR ?= build
 SAN_DIR   ?= build-asan
 TSAN_DIR  ?= build-tsan
+FUZZ_DIR  ?= build-fuzz
+FUZZ_SECONDS ?= 60
+FUZZ_TARGETS ?=
 JOBS      ?= $(shell nproc)
 CMAKE_ARGS ?=
 
-.PHONY: deps configure build test run bench sanitize tsan clean
+.PHONY: deps configure build test run bench sanitize tsan fuzz-build fuzz fuzz-ci clean
 
 deps:
 	@scripts/install-deps
@@ -44,5 +47,19 @@ tsan: deps
 		TSAN_OPTIONS="halt_on_error=1 second_deadlock_stack=1" $(TSAN_DIR)/tests/$$t/$${t}_tests; \
 	done
 
+# The libFuzzer targets (fuzz/), built with clang under the address and undefined-behaviour
+# sanitizers in a build directory of their own.
+fuzz-build: deps
+	CC=clang CXX=clang++ cmake -S . -B $(FUZZ_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Release -DOX_FUZZ=ON
+	cmake --build $(FUZZ_DIR) -j $(JOBS) --target ox_fuzz_all
+
+# Each target for FUZZ_SECONDS (default 60); new crashes are kept in fuzz/crashes/<target>/.
+fuzz: fuzz-build
+	scripts/fuzz run $(FUZZ_DIR) $(FUZZ_SECONDS) $(FUZZ_TARGETS)
+
+# CI: every target over its seed corpus, then 30 s of fresh fuzzing; any failure fails.
+fuzz-ci: fuzz-build
+	scripts/fuzz ci $(FUZZ_DIR) 30 $(FUZZ_TARGETS)
+
 clean:
-	rm -rf $(BUILD_DIR) $(SAN_DIR) $(TSAN_DIR)
+	rm -rf $(BUILD_DIR) $(SAN_DIR) $(TSAN_DIR) $(FUZZ_DIR)

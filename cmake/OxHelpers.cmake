@@ -8,7 +8,16 @@ target_compile_options(ox_warnings INTERFACE -Wall -Wextra -Wpedantic -Wshadow=l
 add_library(ox_opt INTERFACE)
 target_compile_options(ox_opt INTERFACE $<$<CONFIG:Release>:-O2> -fno-fast-math -g1)
 
-if(OX_SANITIZE STREQUAL "address")
+if(OX_FUZZ)
+    # Coverage for the fuzzers and the address and undefined-behaviour sanitizers in every
+    # library; the fuzz targets add the fuzzer's own main when they link.
+    if(NOT OX_SANITIZE STREQUAL "")
+        message(FATAL_ERROR "OX_FUZZ brings its own sanitizers; leave OX_SANITIZE empty")
+    endif()
+    target_compile_options(ox_opt INTERFACE -fsanitize=fuzzer-no-link,address,undefined
+        -fno-sanitize-recover=undefined -fno-omit-frame-pointer -gline-tables-only)
+    target_link_options(ox_opt INTERFACE -fsanitize=address,undefined)
+elseif(OX_SANITIZE STREQUAL "address")
     target_compile_options(ox_opt INTERFACE -fsanitize=address,undefined -fno-omit-frame-pointer
         -fno-sanitize-recover=undefined)
     target_link_options(ox_opt INTERFACE -fsanitize=address,undefined)
