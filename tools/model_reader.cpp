@@ -150,17 +150,21 @@ bool filterObjFaces(const std::string &text, std::string &filtered, uint64_t &dr
 
 // The model's own file layer: the model is served from memory, and every side file the library
 // asks for (materials, buffers, images) is read through readModelFile, so that pipes, devices
-// and oversized files are refused; without disk access no side file exists.
+// and oversized files are refused; without disk access side files come from the given reader.
 class ModelFileSystem : public Assimp::IOSystem {
 public:
-    ModelFileSystem(std::string path, std::string_view bytes, bool disk)
-        : path_(std::move(path)), bytes_(bytes), disk_(disk) {}
+    ModelFileSystem(std::string path, std::string_view bytes, bool disk, SideFileReader sideFiles)
+        : path_(std::move(path)), bytes_(bytes), disk_(disk), sideFiles_(std::move(sideFiles)) {}
     bool Exists(const char *file) const override {
         if (!file) return false;
         if (isMain(file)) return true;
+        if (!disk_) {
+            std::string unused;
+            return sideFiles_ && sideFiles_(file, unused);
+        }
         // Anything but a directory "exists", so that Open can say why it refuses a pipe.
         struct stat st;
-        return disk_ && ::stat(file, &st) == 0 && !S_ISDIR(st.st_mode);
+        return ::stat(file, &st) == 0 && !S_ISDIR(st.st_mode);
     }
     char getOsSeparator() const override { return '/'; }
     Assimp::IOStream *Open(const char *file, const char *mode) override {
@@ -168,9 +172,10 @@ public:
         if (isMain(file))
             return new Assimp::MemoryIOStream(reinterpret_cast<const uint8_t *>(bytes_.data()),
                                               bytes_.size(), false);
-        if (!disk_) return nullptr;
         std::string data, why;
-        if (!readModelFile(file, kMaxModelFileBytes, data, why)) {
+        if (!disk_) {
+            if (!sideFiles_ || !sideFiles_(file, data)) return nullptr;
+        } else if (!readModelFile(file, kMaxModelFileBytes, data, why)) {
             message(kMsgWarning, 6, "Cannot read %s: %s", file, why.c_str());
             return nullptr;
         }
@@ -189,6 +194,7 @@ private:
     std::string path_;
     std::string_view bytes_;
     bool disk_;
+    SideFileReader sideFiles_;
 };
 
 class ProgressRelay : public Assimp::ProgressHandler {
@@ -861,7 +867,8 @@ namespace {
 // Reads a model whose main file is already in memory; side files come from the disk only when
 // disk is set.
 bool readModelBytes(const std::string &path, std::string bytes, bool disk,
-                    const ImportOptions &options, ImportedModel &model, ImportStats &stats) {
+                    const SideFileReader &sideFiles, const ImportOptions &options,
+                    ImportedModel &model, ImportStats &stats) {
     if (!(options.unitScale > 0.0f) || !std::isfinite(options.unitScale)) {
         message(kMsgError, 6, "Unit scale must be a positive number");
         return false;
@@ -885,7 +892,7 @@ bool readModelBytes(const std::string &path, std::string bytes, bool disk,
         importer.SetPropertyFloat(AI_CONFIG_PP_GSN_MAX_SMOOTHING_ANGLE,
                                   std::clamp(options.smoothingAngleDegrees, 0.0f, 175.0f));
         if (options.progress) importer.SetProgressHandler(new ProgressRelay(options.progress));
-        importer.SetIOHandler(new ModelFileSystem(path, bytes, disk));
+        importer.SetIOHandler(new ModelFileSystem(path, bytes, disk, sideFiles));
 
         const aiScene *read = importer.ReadFile(path, 0);
         if (!read) {
@@ -926,12 +933,13 @@ bool readModel(const std::string &path, const ImportOptions &options, ImportedMo
         message(kMsgError, 6, "Cannot read model %s: %s", path.c_str(), why.c_str());
         return false;
     }
-    return readModelBytes(path, std::move(bytes), true, options, model, stats);
+    return readModelBytes(path, std::move(bytes), true, {}, options, model, stats);
 }
 
 bool readModelFromMemory(const std::string &name, std::string_view bytes,
-                         const ImportOptions &options, ImportedModel &model, ImportStats &stats) {
-    return readModelBytes(name, std::string(bytes), false, options, model, stats);
+                         const ImportOptions &options, ImportedModel &model, ImportStats &stats,
+                         const SideFileReader &sideFiles) {
+    return readModelBytes(name, std::string(bytes), false, sideFiles, options, model, stats);
 }
 
 }  // namespace ox

@@ -52,11 +52,15 @@ Mtx4 conversionMatrix(const ImportOptions &options);
 bool readModel(const std::string &path, const ImportOptions &options, ImportedModel &model,
                ImportStats &stats);
 
-/// Reads a model held in memory; name gives the format by its extension. No side file
-/// (materials, buffers, images outside the model) is read: the model is read as if they were
-/// missing.
+/// Gives the bytes of a side file of a model (materials, buffers, images outside the model) by
+/// the name the model uses; false when there is none.
+using SideFileReader = std::function<bool(const std::string &name, std::string &bytes)>;
+
+/// Reads a model held in memory; name gives the format by its extension. Side files come from
+/// sideFiles only, never from the disk; without it the model is read as if they were missing.
 bool readModelFromMemory(const std::string &name, std::string_view bytes,
-                         const ImportOptions &options, ImportedModel &model, ImportStats &stats);
+                         const ImportOptions &options, ImportedModel &model, ImportStats &stats,
+                         const SideFileReader &sideFiles = {});
 
 /// Makes names safe for scene files and file names: control characters, path separators and
 /// bytes outside printable ASCII become '_'; an empty name becomes fallback.

@@ -394,20 +394,31 @@ TEST_F(ImportTest, PipesAreRefusedNotWaitedOn) {
     EXPECT_NE(r.output.find("pipe.bin: not a regular file"), std::string::npos) << r.output;
 }
 
-// A model read from memory never touches the disk: its side files are missing, whatever
-// exists beside the working directory.
-TEST_F(ImportTest, ReadingFromMemoryReadsNoSideFile) {
+// A model read from memory never touches the disk: its side files come from the given reader
+// only, whatever exists in the working directory.
+TEST_F(ImportTest, ReadingFromMemoryReadsNoSideFileFromTheDisk) {
     writeText("side.mtl", "newmtl red\nKd 1 0 0\n");
     const std::string obj = "mtllib side.mtl\nv 0 0 0\nv 1 0 0\nv 0 1 0\nusemtl red\nf 1 2 3\n";
-    ox::ImportedModel fromMemory, fromDisk;
-    ox::ImportStats stats;
-    ASSERT_TRUE(ox::readModelFromMemory("side.obj", obj, {}, fromMemory, stats));
     writeText("side.obj", obj);
+    ox::ImportedModel fromDisk, alone, withReader;
+    ox::ImportStats stats;
     ASSERT_TRUE(ox::readModel("side.obj", {}, fromDisk, stats));
-    ASSERT_EQ(fromMemory.materials.size(), 1u);
-    ASSERT_EQ(fromDisk.materials.size(), 1u);
-    EXPECT_NE(fromMemory.materials[0].diffuse.color.r, 1.0f);
-    EXPECT_EQ(fromDisk.materials[0].diffuse.color.g, 0.0f);
+    ASSERT_TRUE(ox::readModelFromMemory("side.obj", obj, {}, alone, stats));
+    std::vector<std::string> asked;
+    ASSERT_TRUE(ox::readModelFromMemory("side.obj", obj, {}, withReader, stats,
+                                        [&](const std::string &name, std::string &bytes) {
+                                            asked.push_back(name);
+                                            bytes = "newmtl red\nKd 0 1 0\n";
+                                            return true;
+                                        }));
+    const auto diffuse = [](const ox::ImportedModel &m) {
+        EXPECT_EQ(m.materials.size(), 1u);
+        return m.materials.empty() ? ox::Color() : m.materials[0].diffuse.color;
+    };
+    EXPECT_EQ(diffuse(fromDisk).r, 1.0f);
+    EXPECT_NE(diffuse(alone).r, 1.0f);
+    EXPECT_EQ(diffuse(withReader).g, 1.0f);
+    EXPECT_FALSE(asked.empty());
 }
 
 // The memory limit: sizes in MiB or with a suffix; too small or malformed is a usage error; a
