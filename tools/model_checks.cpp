@@ -169,7 +169,8 @@ bool checkGlb(std::string_view bytes, std::string &why) {
 }  // namespace
 
 bool checkDeclaredSizes(const std::string &extension, std::string_view bytes, std::string &why) {
-    if (extension == ".ply" || bytes.substr(0, 4) == "ply\n" || bytes.substr(0, 5) == "ply\r\n")
+    // A file that does not start as a PLY file is left to the library to refuse.
+    if (bytes.substr(0, 4) == "ply\n" || bytes.substr(0, 5) == "ply\r\n")
         return checkPly(bytes, why);
     if (extension == ".glb" || bytes.substr(0, 4) == "glTF") return checkGlb(bytes, why);
     return true;

@@ -50,8 +50,10 @@ TEST(ModelChecks, DeclaredSizesAgainstTheFile) {
          "the header holds a line that is no header line"},
         {"format.ply", plyHeader("binary_middle_endian", ""), "the header names an unknown format"},
         {"open.ply", "ply\nformat ascii 1.0\nelement vertex 1\n", "the header has no end"},
-        // A file named .ply that is none is recognised by its first line only.
+        // PLY files are recognised by their first line, not by their name.
         {"text.obj", "v 0 0 0\n", ""},
+        {"other.ply", "solid stl\n", ""},
+        {"named.obj", "ply\r\nformat ascii 1.0\nelement vertex 1\n", "the header has no end"},
         {"model.glb", glb, ""},
         {"long.glb", "glTF" + u32(2) + u32(4000) + u32(28) + "JSON" + glbJson,
          "the binary header declares 4000 bytes, the file holds 47"},
