@@ -49,7 +49,8 @@ tsan: deps
 
 # The libFuzzer targets (fuzz/), built with clang under the address and undefined-behaviour
 # sanitizers in a build directory of their own.
-fuzz-build: deps
+fuzz-build:
+	@OX_WITH_FUZZ_DEPS=1 scripts/install-deps
 	CC=clang CXX=clang++ cmake -S . -B $(FUZZ_DIR) -G Ninja -DCMAKE_BUILD_TYPE=Release -DOX_FUZZ=ON
 	cmake --build $(FUZZ_DIR) -j $(JOBS) --target ox_fuzz_all
 
