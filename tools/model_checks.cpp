@@ -169,9 +169,9 @@ bool checkGlb(std::string_view bytes, std::string &why) {
 }  // namespace
 
 bool checkDeclaredSizes(const std::string &extension, std::string_view bytes, std::string &why) {
-    // A file that does not start as a PLY file is left to the library to refuse.
-    if (bytes.substr(0, 4) == "ply\n" || bytes.substr(0, 5) == "ply\r\n")
-        return checkPly(bytes, why);
+    // The library takes any file that starts with these three letters for a PLY file; one that
+    // does not is left to it to refuse.
+    if (bytes.substr(0, 3) == "ply") return checkPly(bytes, why);
     if (extension == ".glb" || bytes.substr(0, 4) == "glTF") return checkGlb(bytes, why);
     return true;
 }

@@ -356,6 +356,9 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
         // The library's reader looped without end on a header that never ends, with a
         // property of an unknown type in it.
         {data + "endless_header.ply --list", ox::kImportFailed, {"the header has no end"}},
+        // The library took it for a PLY file by its first three letters and spent minutes on
+        // a vertex count it read from "107~3741824", with an "end_header" spoilt.
+        {data + "ply_magic_only.ply --list", ox::kImportFailed, {"the header has no end"}},
     };
     for (const auto &c : cases) {
         // A hang shows as the status of timeout.

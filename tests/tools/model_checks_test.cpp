@@ -54,6 +54,8 @@ TEST(ModelChecks, DeclaredSizesAgainstTheFile) {
         {"text.obj", "v 0 0 0\n", ""},
         {"other.ply", "solid stl\n", ""},
         {"named.obj", "ply\r\nformat ascii 1.0\nelement vertex 1\n", "the header has no end"},
+        {"magic.ply", "plyAAAA\nformat ascii 1.0\nend_header\n",
+         "the header holds a line that is no header line"},
         {"model.glb", glb, ""},
         {"long.glb", "glTF" + u32(2) + u32(4000) + u32(28) + "JSON" + glbJson,
          "the binary header declares 4000 bytes, the file holds 47"},
