@@ -148,6 +148,30 @@ bool filterObjFaces(const std::string &text, std::string &filtered, uint64_t &dr
     return true;
 }
 
+// Material libraries of OBJ files: statements before the first material of the library are
+// taken out; the library's reader applies them to a material that does not exist and crashes.
+// A sound library has nothing but comments there.
+std::string mtlFromFirstMaterial(std::string text) {
+    size_t pos = 0;
+    while (pos < text.size()) {
+        const size_t end = std::min(text.find('\n', pos), text.size());
+        std::string_view line = std::string_view(text).substr(pos, end - pos);
+        const size_t a = line.find_first_not_of(" \t\r");
+        if (a != std::string_view::npos) {
+            line.remove_prefix(a);
+            if (line.substr(0, 6) == "newmtl" && line.size() > 7 &&
+                (line[6] == ' ' || line[6] == '\t') &&
+                line.find_first_not_of(" \t\r", 7) != std::string_view::npos)
+                break;
+        }
+        pos = end + 1;
+    }
+    // Line breaks stay, so that line numbers in the library's messages stay right.
+    for (size_t k = 0; k < std::min(pos, text.size()); ++k)
+        if (text[k] != '\n') text[k] = ' ';
+    return text;
+}
+
 // The model's own file layer: the model is served from memory, and every side file the library
 // asks for (materials, buffers, images) is read through readModelFile, so that pipes, devices
 // and oversized files are refused; without disk access side files come from the given reader.
@@ -179,6 +203,8 @@ public:
             message(kMsgWarning, 6, "Cannot read %s: %s", file, why.c_str());
             return nullptr;
         }
+        // The only side files the OBJ reader opens are material libraries.
+        if (lowerExtension(path_) == ".obj") data = mtlFromFirstMaterial(std::move(data));
         auto *copy = new uint8_t[std::max<size_t>(data.size(), 1)];
         std::memcpy(copy, data.data(), data.size());
         return new Assimp::MemoryIOStream(copy, data.size(), true);
