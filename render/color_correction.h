@@ -37,6 +37,8 @@ public:
     explicit GammaColorCorrection(float gamma) : inverse_(1.0f / gamma) {}
     using ColorCorrectionInterface::correct;
     void correct(const Color *input, Color *output, size_t n) const override;
+    /// One channel raised to `inverse` (1 / gamma); negative and NaN channels give 0.
+    static float gamma(float c, float inverse);
 
 private:
     float inverse_;
@@ -47,12 +49,15 @@ class SRGBColorCorrection final : public ColorCorrectionInterface {
 public:
     using ColorCorrectionInterface::correct;
     void correct(const Color *input, Color *output, size_t n) const override;
-    /// The sRGB transfer function of one channel.
+    /// The sRGB transfer function of one channel; negative and NaN channels give 0.
     static float toSRGB(float c);
 };
 
 /// The correction of the `colorCorrection` setting with its output gamma. A gamma that is not
 /// positive and finite is reported as a warning and gives the nil correction.
 std::unique_ptr<ColorCorrectionInterface> createColorCorrection(ColorCorrection kind, float gamma);
+/// The correction chosen by the frame settings' output correction.
+std::unique_ptr<ColorCorrectionInterface> createColorCorrection(
+    const OutputCorrectionBase &settings);
 
 }  // namespace ox

@@ -1,0 +1,352 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "config/settings_bake.h"
+#include "core/render_io.h"
+#include "core/types.h"
+#include "render/command.h"
+#include "render/layer.h"
+
+/// Post filters: the commands that transform a rendered or baked frame's layers before it is
+/// written (premultiply, edge dilation, shape normalization, range remap, RNM fold).
+///
+/// Using them (a bake target's command list):
+///
+///     executor.add(std::make_unique<PostFilterCommand>(
+///         std::make_unique<PremultiplyFilter>(names, 0.0f, Color::black())));
+///     auto dilation = std::make_unique<EdgeDilationFilter>(names, 5, background);
+///     dilation->setThreadCount(renderThreads);
+///     executor.add(std::move(dilation));
+///
+/// Every filter reads its source layers by name and writes its results into new layers (the
+/// source name plus a suffix, or "temp"); only when the whole frame is done are the sources
+/// deleted and the results renamed to the source names, so the next command finds the filtered
+/// layer under the old name. A failure or an abort (through the io's isAborted, checked between
+/// bands of rows, progress reported every tenth) removes the unfinished result layers and
+/// leaves the sources untouched. Results do not depend on the thread count.
+namespace ox {
+
+/// Runs a body over bands of rows of an image on a number of threads, with progress and abort.
+class RowBands {
+public:
+    /// The body: rows [y0, y1) on thread `thread` (0 .. threadCount - 1); false stops the run.
+    /// Called concurrently for disjoint bands.
+    using Body = std::function<bool(int32_t y0, int32_t y1, int thread)>;
+
+    /// height rows in bands of bandRows, on threadCount threads (the calling thread is one of
+    /// them). With io, progress (rows done / height) is reported every tenth and the run stops
+    /// between bands once io reports an abort.
+    RowBands(int32_t height, int32_t bandRows, int threadCount, RenderIOInterface *io)
+        : height_(height), bandRows_(bandRows < 1 ? 1 : bandRows),
+          threads_(threadCount < 1 ? 1 : threadCount), io_(io) {}
+
+    /// Runs the body over every band. False when a band failed (its message given by the
+    /// body), a thread could not start, or the run was aborted (then aborted() is true).
+    bool run(const Body &body);
+    /// True when the last run stopped because of an abort.
+    bool aborted() const { return aborted_; }
+
+private:
+    int32_t height_, bandRows_;
+    int threads_;
+    RenderIOInterface *io_;
+    bool aborted_ = false;
+};
+
+/// The result layers of one filter run: created under temporary names, deleted again unless
+/// placed. Placement deletes each source and renames its result to the source's name.
+class FilterResults {
+public:
+    explicit FilterResults(Frame &frame) : frame_(frame) {}
+    /// Removes every result that was not placed.
+    ~FilterResults();
+    FilterResults(const FilterResults &) = delete;
+    FilterResults &operator=(const FilterResults &) = delete;
+
+    /// Creates a tiled colour layer `name` that will replace `target` (which may be absent);
+    /// null after one error message when the name is taken or the layer cannot be made.
+    LayerT<Color> *addColor(const std::string &name, const std::string &target,
+                            const char *filterName);
+    /// Deletes every source given (may repeat or be absent), then renames each result to
+    /// its target. False after one error message when a rename fails.
+    bool place(const std::vector<std::string> &sources);
+    /// Deletes the results now.
+    void discard();
+
+private:
+    struct Entry {
+        std::string name, target;
+    };
+    Frame &frame_;
+    std::vector<Entry> entries_;
+};
+
+// ---------------------------------------------------------------------------------------------
+// Pixel filters
+
+/// A filter that computes each texel from the same texel of its sources, run by a
+/// PostFilterCommand: init, then every row (filterRows), then finish.
+class PostFilter {
+public:
+    virtual ~PostFilter() = default;
+    /// Finds the source layers and creates the result layers; false after one message.
+    virtual bool init(Frame &frame, RenderContext &context) = 0;
+    /// Filters texel (x, y). Simple filters implement this alone; it is then called row by row
+    /// on one thread.
+    virtual bool filterPixel(int32_t x, int32_t y) = 0;
+    /// Filters rows [y0, y1); on failure sets failedX and failedY. True from a filter means it
+    /// may be called concurrently for disjoint bands. The default calls filterPixel.
+    virtual bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY);
+    /// True when filterRows may run on several threads at once.
+    virtual bool concurrentRows() const { return false; }
+    /// Places the results (deletes the sources, renames the results); false after one message.
+    virtual bool finish(Frame &frame) = 0;
+    /// Removes the unfinished results after a failure or an abort; the sources stay.
+    virtual void discard(Frame &frame) = 0;
+
+protected:
+    /// The width of the frame being filtered (set by the command after init).
+    int32_t width_ = 0;
+
+private:
+    friend class PostFilterCommand;
+};
+
+/// Runs a pixel filter over the whole frame ("Post Filter").
+class PostFilterCommand final : public FrameCommand {
+public:
+    /// Runs filter (owned) on threadCount threads when the filter allows it.
+    explicit PostFilterCommand(std::unique_ptr<PostFilter> filter, int threadCount = 1)
+        : FrameCommand("Post Filter"), filter_(std::move(filter)), threads_(threadCount) {}
+    using FrameCommand::execute;
+    bool execute(Frame &frame, RenderContext &context, RenderIOInterface &io) override;
+    /// The filter run by this command.
+    PostFilter &filter() { return *filter_; }
+
+private:
+    std::unique_ptr<PostFilter> filter_;
+    int threads_;
+};
+
+/// Removes a background colour mixed into semi-transparent texels: where a > max(t, 0),
+/// rgb' = (rgb - bg (1 - a)) / a; elsewhere the texel is copied. One result layer per source,
+/// "temp" (then "temp1", "temp2", ...).
+class PremultiplyFilter final : public PostFilter {
+public:
+    PremultiplyFilter(std::vector<std::string> sources, float threshold, const Color &background)
+        : sources_(std::move(sources)), threshold_(threshold), background_(background) {}
+    bool init(Frame &frame, RenderContext &context) override;
+    bool filterPixel(int32_t x, int32_t y) override;
+    bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) override;
+    bool concurrentRows() const override { return true; }
+    bool finish(Frame &frame) override;
+    void discard(Frame &frame) override;
+
+    /// The filter of one colour.
+    static Color premultiply(const Color &c, float threshold, const Color &background) {
+        // A negative threshold would let a = 0 through to the division.
+        if (!(c.a > threshold && c.a > 0.0f)) return c;
+        const float k = 1.0f - c.a, inv = 1.0f / c.a;
+        return Color((c.r - background.r * k) * inv, (c.g - background.g * k) * inv,
+                     (c.b - background.b * k) * inv, c.a);
+    }
+
+private:
+    std::vector<std::string> sources_;
+    float threshold_;
+    Color background_;
+    std::vector<LayerT<Color> *> in_, out_;
+    std::unique_ptr<FilterResults> results_;
+};
+
+/// Maps the covered texels ("Z" >= 0; every texel when the frame has no "Z") of one colour
+/// layer linearly so that the range found in them becomes [0, 1]: rgb together when remapRGB,
+/// alpha when remapAlpha. An empty or non-finite range leaves the texels unchanged.
+class RangeRemapFilter final : public PostFilter {
+public:
+    RangeRemapFilter(std::string source, bool remapRGB, bool remapAlpha)
+        : source_(std::move(source)), remapRGB_(remapRGB), remapAlpha_(remapAlpha) {}
+    bool init(Frame &frame, RenderContext &context) override;
+    bool filterPixel(int32_t x, int32_t y) override;
+    bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) override;
+    bool concurrentRows() const override { return true; }
+    bool finish(Frame &frame) override;
+    void discard(Frame &frame) override;
+
+    /// The scale and offset found by init: v' = (v + offset) * scale.
+    float rgbScale() const { return rgbScale_; }
+    float rgbOffset() const { return rgbOffset_; }
+    float alphaScale() const { return alphaScale_; }
+    float alphaOffset() const { return alphaOffset_; }
+
+private:
+    std::string source_;
+    bool remapRGB_, remapAlpha_;
+    float rgbScale_ = 1, rgbOffset_ = 0, alphaScale_ = 1, alphaOffset_ = 0;
+    LayerT<Color> *in_ = nullptr, *out_ = nullptr;
+    LayerT<float> *z_ = nullptr;
+    std::unique_ptr<FilterResults> results_;
+};
+
+/// Folds the three basis layers of a radiosity normal map into two: the average colour
+/// normalised by its largest r, g, b, and the largest r, g, b of each basis (alpha: the
+/// average alpha). The results replace the two output layers; the three sources are removed.
+class RNMAverageMaxFilter final : public PostFilter {
+public:
+    RNMAverageMaxFilter(std::vector<std::string> sources, std::vector<std::string> outputs)
+        : sources_(std::move(sources)), outputs_(std::move(outputs)) {}
+    bool init(Frame &frame, RenderContext &context) override;
+    bool filterPixel(int32_t x, int32_t y) override;
+    bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) override;
+    bool concurrentRows() const override { return true; }
+    bool finish(Frame &frame) override;
+    void discard(Frame &frame) override;
+
+    /// The fold of one texel: out[0] the normalised average, out[1] the maxima.
+    static void fold(const Color &c0, const Color &c1, const Color &c2, Color out[2]);
+
+private:
+    std::vector<std::string> sources_, outputs_;
+    LayerT<Color> *in_[3] = {}, *out_[2] = {};
+    std::unique_ptr<FilterResults> results_;
+};
+
+// ---------------------------------------------------------------------------------------------
+// Frame filters
+
+/// Fills background texels ("Z" < 0) from the nearest covered ones: a background texel takes
+/// the brightest covered texel of the first square ring around it (radius 1 to size) that holds
+/// one, the first found on ties (ring order: left column bottom to top, right column, top row
+/// left to right, bottom row); with none within size it gets the background colour. Covered
+/// texels are copied. ("Edge Dilation Filter")
+class EdgeDilationFilter final : public FrameCommand {
+public:
+    EdgeDilationFilter(std::vector<std::string> sources, int32_t size, const Color &background)
+        : FrameCommand("Edge Dilation Filter"), sources_(std::move(sources)), size_(size),
+          background_(background) {}
+    /// Rows run on this many threads (the run's render threads).
+    void setThreadCount(int threads) { threads_ = threads; }
+    using FrameCommand::execute;
+    bool execute(Frame &frame, RenderContext &context, RenderIOInterface &io) override;
+    /// The same without a render context (the filter needs none).
+    bool run(Frame &frame, RenderIOInterface *io);
+
+private:
+    std::vector<std::string> sources_;
+    int32_t size_;
+    Color background_;
+    int threads_ = 1;
+};
+
+/// The minimum and maximum of one component (a channel, or r, g, b linked).
+struct ComponentMinMax {
+    float minVal = 3.4028235e38f;
+    float maxVal = -3.4028235e38f;
+    /// False when the texels were left unchanged (no texels, or an empty range).
+    bool remapped = false;
+};
+
+/// The ranges one instance's texels covered.
+struct ShapeMinMax {
+    std::string shape;
+    std::vector<ComponentMinMax> components;
+};
+
+/// What a shape normalization found and applied: the image-wide ranges and one entry per
+/// instance that had texels. Components are r, g, b[, a] (per channel) or rgb[, a] (linked).
+struct MinMaxData {
+    std::vector<ComponentMinMax> image;
+    std::vector<ShapeMinMax> shapes;
+};
+
+/// Writes the record as XML (root "MinMaxRoot") through a temporary name; false after one
+/// error message, an existing file then stays as it was.
+bool writeMinMaxData(const std::string &fileName, const MinMaxData &data);
+/// Reads a record written by writeMinMaxData; false after one error message.
+bool readMinMaxData(const std::string &fileName, MinMaxData &data);
+
+/// Tells which instance each texel of a light map belongs to (the bake run samples the
+/// surface at the texel centre).
+class TexelInstanceInterface {
+public:
+    virtual ~TexelInstanceInterface() = default;
+    /// Fills ids[0 .. width) with the instance index (0 .. instanceCount() - 1) of the texels of
+    /// row y, or -1 for a texel without one. Called concurrently for different rows.
+    virtual void instancesOfRow(int32_t y, int32_t width, int32_t *ids) const = 0;
+    /// The number of instances.
+    virtual int32_t instanceCount() const = 0;
+    /// The name of instance i.
+    virtual std::string instanceName(int32_t i) const = 0;
+};
+
+/// The settings of a shape normalization (the bake's "Normalize" settings).
+struct NormalizeOptions {
+    /// Max: [0, max] -> [0, 1]; MinMax: [min, max] -> [0, 1].
+    NormalizeRange range = NormalizeRange::Max;
+    /// PerChannel, or Linked: r, g and b share one range (alpha keeps its own).
+    NormalizeOutput output = NormalizeOutput::PerChannel;
+    /// Shape: one range per instance; Image: one range over the image.
+    NormalizeComponent component = NormalizeComponent::Shape;
+    /// Alpha is normalized too.
+    bool alpha = false;
+};
+
+/// Compresses the dynamic range of a colour layer: the covered texels' values are mapped so
+/// that the range found per instance (or over the image) becomes [0, 1]. Texels without an
+/// instance and background texels stay as they are. ("Shape Normalization Filter")
+class ShapeNormalizationFilter final : public FrameCommand {
+public:
+    /// instances (not owned, may be null in Image mode: every covered texel counts then).
+    ShapeNormalizationFilter(std::string source, const NormalizeOptions &options,
+                             const TexelInstanceInterface *instances)
+        : FrameCommand("Shape Normalization Filter"), source_(std::move(source)),
+          options_(options), instances_(instances) {}
+    /// Rows run on this many threads.
+    void setThreadCount(int threads) { threads_ = threads; }
+    /// Writes the record to this file after a successful run (empty: not written).
+    void setRecordFile(std::string fileName) { recordFile_ = std::move(fileName); }
+    using FrameCommand::execute;
+    bool execute(Frame &frame, RenderContext &context, RenderIOInterface &io) override;
+    /// The same without a render context.
+    bool run(Frame &frame, RenderIOInterface *io);
+    /// The record of the last run.
+    const MinMaxData &record() const { return record_; }
+
+private:
+    std::string source_;
+    NormalizeOptions options_;
+    const TexelInstanceInterface *instances_;
+    int threads_ = 1;
+    std::string recordFile_;
+    MinMaxData record_;
+};
+
+/// An output shader: changes a finished colour layer in place before it is written.
+class OutputShaderInterface {
+public:
+    virtual ~OutputShaderInterface() = default;
+    /// Shades the layer; false after one message.
+    virtual bool shade(LayerT<Color> &layer, RenderIOInterface &io) = 0;
+};
+
+/// Runs the run's output shaders, in order, over the target layer ("Output Shader").
+class OutputShaderCommand final : public FrameCommand {
+public:
+    /// shaders are not owned and must outlive the command.
+    OutputShaderCommand(std::string target, std::vector<OutputShaderInterface *> shaders)
+        : FrameCommand("Output Shader"), target_(std::move(target)),
+          shaders_(std::move(shaders)) {}
+    using FrameCommand::execute;
+    bool execute(Frame &frame, RenderContext &context, RenderIOInterface &io) override;
+
+private:
+    std::string target_;
+    std::vector<OutputShaderInterface *> shaders_;
+};
+
+}  // namespace ox

@@ -1,0 +1,193 @@
+#include <algorithm>
+#include <vector>
+
+#include "core/message.h"
+#include "render/frame.h"
+#include "render/post_filter.h"
+
+/// Edge dilation in two steps. First, for every texel, the distance along its row to the
+/// nearest covered texel (0 for a covered one), capped at size + 1. Then, row by row, the
+/// square-ring (Chebyshev) distance to the nearest covered texel, which is the minimum over the
+/// rows within size of max(row distance, row offset); it is exactly the radius of the first
+/// ring that holds a covered texel. Only that ring is scanned for the brightest candidate, in
+/// the ring order, so the result is that of scanning every ring from 1 outwards.
+namespace ox {
+
+namespace {
+
+/// The largest ring radius the 16-bit distances hold.
+constexpr int32_t kMaxDilation = 65534;
+
+/// Row distances to the nearest covered texel of rows [y0, y1), capped at cap.
+bool rowDistances(LayerT<float> &z, int32_t y0, int32_t y1, uint16_t cap, uint16_t *dist) {
+    const int32_t w = z.width();
+    std::vector<float> depth(size_t(w) * size_t(y1 - y0));
+    if (!z.read(Region(0, y0, w, y1), depth.data())) return false;
+    for (int32_t y = y0; y < y1; ++y) {
+        const float *zr = depth.data() + size_t(y - y0) * size_t(w);
+        uint16_t *d = dist + size_t(y - y0) * size_t(w);
+        int64_t last = -int64_t(cap);
+        for (int32_t x = 0; x < w; ++x) {
+            if (zr[x] >= 0.0f) last = x;
+            d[x] = uint16_t(std::min<int64_t>(cap, x - last));
+        }
+        last = int64_t(w) + cap;
+        for (int32_t x = w - 1; x >= 0; --x) {
+            if (d[x] == 0) last = x;
+            d[x] = uint16_t(std::min<int64_t>(d[x], last - x));
+        }
+    }
+    return true;
+}
+
+/// The brightest covered texel of the ring of radius r around (x, y); false when no covered
+/// candidate beat the starting luminance. rows holds image rows from rowBase on.
+inline bool brightestOnRing(const uint16_t *rowDist, const Color *rows, int32_t rowBase,
+                            int32_t w, int32_t h, int32_t x, int32_t y, int32_t r, Color &out) {
+    float best = -3.4028235e38f;
+    bool found = false;
+    auto visit = [&](int32_t cx, int32_t cy) {
+        if (rowDist[size_t(cy) * size_t(w) + size_t(cx)] != 0) return;
+        const Color &c = rows[size_t(cy - rowBase) * size_t(w) + size_t(cx)];
+        const float l = c.luminance();
+        if (l > best) {
+            best = l;
+            out = c;
+            found = true;
+        }
+    };
+    const int32_t ya = std::max(0, y - r), yb = std::min(h - 1, y + r);
+    if (x - r >= 0)
+        for (int32_t cy = ya; cy <= yb; ++cy) visit(x - r, cy);
+    if (x + r < w)
+        for (int32_t cy = ya; cy <= yb; ++cy) visit(x + r, cy);
+    const int32_t xa = std::max(0, x - r + 1), xb = std::min(w - 1, x + r - 1);
+    if (y + r < h)
+        for (int32_t cx = xa; cx <= xb; ++cx) visit(cx, y + r);
+    if (y - r >= 0)
+        for (int32_t cx = xa; cx <= xb; ++cx) visit(cx, y - r);
+    return found;
+}
+
+/// Per-thread scratch of the dilation rows.
+struct DilationScratch {
+    std::vector<uint16_t> ring;  // ring radius per texel of the band
+    std::vector<Color> rows;     // source rows of the band and its margins
+    std::vector<Color> out;      // result rows of the band
+};
+
+}  // namespace
+
+bool EdgeDilationFilter::execute(Frame &frame, RenderContext &, RenderIOInterface &io) {
+    return run(frame, &io);
+}
+
+bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
+    std::vector<LayerT<Color> *> sources;
+    for (const std::string &name : sources_) {
+        LayerT<Color> *layer = frame.getColorLayer(name);
+        if (!layer) {
+            message(kMsgError, 6, "Source layer %s not found in edge dilation filter",
+                    name.c_str());
+            return false;
+        }
+        sources.push_back(layer);
+    }
+    LayerT<float> *z = frame.getFloatLayer("Z");
+    if (!z) {
+        message(kMsgError, 6, "Source Z layer not found in edge dilation filter");
+        return false;
+    }
+    const int32_t w = frame.width(), h = frame.height();
+    // A ring wider than the image holds no texel of it.
+    const int32_t n = std::clamp(size_, 0, std::min(kMaxDilation, std::max(w, h)));
+    const uint16_t cap = uint16_t(n + 1);
+
+    FilterResults results(frame);
+    std::vector<LayerT<Color> *> outputs;
+    for (const std::string &name : sources_) {
+        LayerT<Color> *out = results.addColor(name + "_edgedilation", name, "edge dilation filter");
+        if (!out) return false;
+        outputs.push_back(out);
+    }
+
+    std::vector<uint16_t> rowDist(size_t(w) * size_t(h));
+    RowBands distBands(h, 64, threads_, nullptr);
+    if (!distBands.run([&](int32_t y0, int32_t y1, int) {
+            if (rowDistances(*z, y0, y1, cap, rowDist.data() + size_t(y0) * size_t(w)))
+                return true;
+            message(kMsgError, 6, "Edge dilation could not read the Z layer");
+            return false;
+        }))
+        return false;
+
+    const std::vector<uint16_t> farRow(size_t(w), cap);  // stands for rows outside the image
+    const int32_t bandRows = std::max(32, 2 * n);
+    std::vector<DilationScratch> scratch(size_t(std::max(threads_, 1)));
+    RowBands bands(h, bandRows, threads_, io);
+    const bool ok = bands.run([&](int32_t y0, int32_t y1, int thread) {
+        DilationScratch &s = scratch[size_t(thread)];
+        const size_t bandSize = size_t(w) * size_t(y1 - y0);
+        s.ring.resize(bandSize);
+        s.out.resize(bandSize);
+
+        // The ring radius of every texel of the band.
+        for (int32_t y = y0; y < y1; ++y) {
+            uint16_t *d = s.ring.data() + size_t(y - y0) * size_t(w);
+            const uint16_t *own = rowDist.data() + size_t(y) * size_t(w);
+            uint16_t m = 0;
+            for (int32_t x = 0; x < w; ++x) m = std::max(m, d[x] = own[x]);
+            for (int32_t dy = 1; dy <= n && m > dy; ++dy) {
+                const uint16_t *lo =
+                    y - dy >= 0 ? rowDist.data() + size_t(y - dy) * size_t(w) : farRow.data();
+                const uint16_t *hi =
+                    y + dy < h ? rowDist.data() + size_t(y + dy) * size_t(w) : farRow.data();
+                const uint16_t step = uint16_t(dy);
+                uint16_t mm = 0;
+                for (int32_t x = 0; x < w; ++x) {
+                    const uint16_t v = std::max(step, std::min(lo[x], hi[x]));
+                    d[x] = std::min(d[x], v);
+                    mm = std::max(mm, d[x]);
+                }
+                m = mm;
+            }
+        }
+
+        const int32_t rowBase = std::max(0, y0 - n), rowEnd = std::min(h, y1 + n);
+        s.rows.resize(size_t(w) * size_t(rowEnd - rowBase));
+        for (size_t l = 0; l < sources.size(); ++l) {
+            if (!sources[l]->read(Region(0, rowBase, w, rowEnd), s.rows.data())) {
+                message(kMsgError, 6, "Edge dilation could not read layer %s",
+                        sources_[l].c_str());
+                return false;
+            }
+            for (int32_t y = y0; y < y1; ++y) {
+                const uint16_t *d = s.ring.data() + size_t(y - y0) * size_t(w);
+                const Color *src = s.rows.data() + size_t(y - rowBase) * size_t(w);
+                Color *dst = s.out.data() + size_t(y - y0) * size_t(w);
+                for (int32_t x = 0; x < w; ++x) {
+                    const int32_t r = d[x];
+                    if (r == 0)
+                        dst[x] = src[x];
+                    else if (r > n ||
+                             !brightestOnRing(rowDist.data(), s.rows.data(), rowBase, w, h, x, y,
+                                              r, dst[x]))
+                        dst[x] = background_;
+                }
+            }
+            if (!outputs[l]->paste(Region(0, y0, w, y1), s.out.data())) {
+                message(kMsgError, 6, "Edge dilation could not write layer %s",
+                        outputs[l]->name().c_str());
+                return false;
+            }
+        }
+        return true;
+    });
+    if (!ok) {
+        if (bands.aborted()) message(kMsgProgress, 6, "Edge dilation aborted");
+        return false;  // the results leave the frame with `results`
+    }
+    return results.place(sources_);
+}
+
+}  // namespace ox

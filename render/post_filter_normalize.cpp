@@ -1,0 +1,221 @@
+#include <algorithm>
+#include <cmath>
+#include <vector>
+
+#include "core/message.h"
+#include "render/frame.h"
+#include "render/post_filter.h"
+
+namespace ox {
+
+namespace {
+
+/// Texels without an instance that are named in the debug log; the rest are counted.
+constexpr size_t kMaxLoggedTexels = 100;
+
+/// Running minimum and maximum of one component.
+struct Range {
+    float lo = 3.4028235e38f, hi = -3.4028235e38f;
+    void add(float v) {
+        // Infinite or NaN values would spoil the range of every other texel.
+        if (std::isfinite(v)) lo = std::min(lo, v), hi = std::max(hi, v);
+    }
+    void merge(const Range &o) { lo = std::min(lo, o.lo), hi = std::max(hi, o.hi); }
+};
+
+/// v' = (v + offset) * scale for one channel.
+struct Remap {
+    float scale = 1.0f, offset = 0.0f;
+};
+
+/// The remap of a range under the range mode; false (identity) when it cannot be applied.
+bool remapOf(const Range &r, NormalizeRange mode, Remap &out) {
+    out = Remap();
+    if (r.lo > r.hi) return false;
+    const float lo = mode == NormalizeRange::MinMax ? r.lo : 0.0f;
+    const float span = r.hi - lo;
+    if (!(span > 0.0f) || !std::isfinite(span) || !std::isfinite(1.0f / span)) return false;
+    out.scale = 1.0f / span;
+    out.offset = -lo;
+    return true;
+}
+
+}  // namespace
+
+bool ShapeNormalizationFilter::execute(Frame &frame, RenderContext &, RenderIOInterface &io) {
+    return run(frame, &io);
+}
+
+bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
+    record_ = MinMaxData();
+    LayerT<Color> *in = frame.getColorLayer(source_);
+    if (!in) {
+        message(kMsgError, 6, "Source layer %s not found in shape normalization filter",
+                source_.c_str());
+        return false;
+    }
+    const bool perShape = options_.component == NormalizeComponent::Shape;
+    if (perShape && !instances_) {
+        message(kMsgError, 6,
+                "Shape normalization of %s per shape needs the instances of the texels",
+                source_.c_str());
+        return false;
+    }
+    LayerT<float> *z = frame.getFloatLayer("Z");
+    const int32_t w = frame.width(), h = frame.height();
+
+    // Components: r, g, b[, a] per channel, or rgb[, a] linked; channel c uses component
+    // channelComp[c] (-1: left alone).
+    const bool linked = options_.output == NormalizeOutput::Linked;
+    const int32_t rgbComps = linked ? 1 : 3;
+    const int32_t comps = rgbComps + (options_.alpha ? 1 : 0);
+    const int32_t channelComp[4] = {0, linked ? 0 : 1, linked ? 0 : 2,
+                                    options_.alpha ? rgbComps : -1};
+    // Slot i < count: instance i; slot count: texels counted without a lookup.
+    const int32_t count = instances_ ? std::max(0, instances_->instanceCount()) : 0;
+    const int32_t slots = count + 1;
+
+    FilterResults results(frame);
+    LayerT<Color> *out = results.addColor("temp", source_, "shape normalization filter");
+    if (!out) return false;
+
+    // Gather: per thread ranges, the instance of every texel, texels without one per band.
+    const int32_t bandRows = 16;
+    const int32_t bandCount = (h + bandRows - 1) / bandRows;
+    std::vector<int32_t> ids(size_t(w) * size_t(h), count);
+    const int threads = std::max(threads_, 1);
+    std::vector<std::vector<Range>> ranges(size_t(threads),
+                                           std::vector<Range>(size_t(slots) * size_t(comps)));
+    std::vector<std::vector<std::pair<int32_t, int32_t>>> orphans(static_cast<size_t>(bandCount));
+    std::vector<int64_t> orphanCounts(size_t(bandCount), 0);
+    RowBands gather(h, bandRows, threads, nullptr);
+    const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
+        const Region rows(0, y0, w, y1);
+        std::vector<Color> colors(size_t(rows.area()));
+        std::vector<float> depth(z ? colors.size() : 0);
+        if (!in->read(rows, colors.data()) || (z && !z->read(rows, depth.data()))) {
+            message(kMsgError, 6, "Shape normalization could not read layer %s",
+                    source_.c_str());
+            return false;
+        }
+        std::vector<Range> &acc = ranges[size_t(thread)];
+        const int32_t band = y0 / bandRows;
+        for (int32_t y = y0; y < y1; ++y) {
+            int32_t *id = ids.data() + size_t(y) * size_t(w);
+            if (instances_) instances_->instancesOfRow(y, w, id);
+            for (int32_t x = 0; x < w; ++x) {
+                const size_t i = size_t(y - y0) * size_t(w) + size_t(x);
+                if (z && !(depth[i] >= 0.0f)) {
+                    id[x] = -1;
+                    continue;
+                }
+                if (instances_ && (id[x] < 0 || id[x] >= count)) {
+                    id[x] = -1;
+                    if (orphans[size_t(band)].size() < kMaxLoggedTexels)
+                        orphans[size_t(band)].push_back({x, y});
+                    ++orphanCounts[size_t(band)];
+                    continue;
+                }
+                Range *r = acc.data() + size_t(id[x]) * size_t(comps);
+                const Color &c = colors[i];
+                const float v[4] = {c.r, c.g, c.b, c.a};
+                for (int ch = 0; ch < 4; ++ch)
+                    if (channelComp[ch] >= 0) r[channelComp[ch]].add(v[ch]);
+            }
+        }
+        return true;
+    });
+    if (!gathered) return false;
+
+    // The texels without an instance, in row order whatever the thread count.
+    size_t logged = 0;
+    int64_t orphanTotal = 0;
+    for (int32_t b = 0; b < bandCount; ++b) {
+        orphanTotal += orphanCounts[size_t(b)];
+        for (const auto &[x, y] : orphans[size_t(b)])
+            if (logged < kMaxLoggedTexels) {
+                message(kMsgDebug, 6, "No instance found in sampled pixel %d, %d", x, y);
+                ++logged;
+            }
+    }
+    if (orphanTotal > int64_t(logged))
+        message(kMsgDebug, 6, "No instance found in %lld more sampled pixels",
+                static_cast<long long>(orphanTotal - int64_t(logged)));
+
+    // Merge the threads' ranges (minimum and maximum do not depend on the order).
+    std::vector<Range> total(size_t(slots) * size_t(comps));
+    for (const auto &acc : ranges)
+        for (size_t i = 0; i < total.size(); ++i) total[i].merge(acc[i]);
+    std::vector<Range> image(static_cast<size_t>(comps));
+    for (int32_t s = 0; s < slots; ++s)
+        for (int32_t c = 0; c < comps; ++c)
+            image[size_t(c)].merge(total[size_t(s) * size_t(comps) + size_t(c)]);
+
+    // The remap of every slot and channel, and the record.
+    std::vector<Remap> remaps(size_t(slots) * 4);
+    std::vector<Remap> imageRemap(static_cast<size_t>(comps));
+    std::vector<bool> imageApplied(static_cast<size_t>(comps));
+    for (int32_t c = 0; c < comps; ++c)
+        imageApplied[size_t(c)] = remapOf(image[size_t(c)], options_.range, imageRemap[size_t(c)]);
+    record_.image.resize(size_t(comps));
+    for (int32_t c = 0; c < comps; ++c) {
+        ComponentMinMax &e = record_.image[size_t(c)];
+        e.minVal = image[size_t(c)].lo;
+        e.maxVal = image[size_t(c)].hi;
+        e.remapped = !perShape && imageApplied[size_t(c)];
+    }
+    for (int32_t s = 0; s < slots; ++s) {
+        const Range *r = total.data() + size_t(s) * size_t(comps);
+        std::vector<Remap> own(static_cast<size_t>(comps));
+        std::vector<bool> applied(static_cast<size_t>(comps));
+        for (int32_t c = 0; c < comps; ++c)
+            applied[size_t(c)] = remapOf(r[c], options_.range, own[size_t(c)]);
+        for (int ch = 0; ch < 4; ++ch) {
+            const int32_t c = channelComp[ch];
+            if (c >= 0)
+                remaps[size_t(s) * 4 + size_t(ch)] =
+                    perShape ? own[size_t(c)] : imageRemap[size_t(c)];
+        }
+        if (s < count && r[0].lo <= r[0].hi) {
+            ShapeMinMax shape;
+            shape.shape = instances_->instanceName(s);
+            for (int32_t c = 0; c < comps; ++c)
+                shape.components.push_back(
+                    {r[c].lo, r[c].hi, perShape && bool(applied[size_t(c)])});
+            record_.shapes.push_back(std::move(shape));
+        }
+    }
+
+    // Remap the covered texels that have an instance; the rest are copied.
+    RowBands remap(h, bandRows, threads, io);
+    const bool ok = remap.run([&](int32_t y0, int32_t y1, int) {
+        const Region rows(0, y0, w, y1);
+        std::vector<Color> colors(size_t(rows.area()));
+        if (!in->read(rows, colors.data())) {
+            message(kMsgError, 6, "Shape normalization could not read layer %s",
+                    source_.c_str());
+            return false;
+        }
+        const int32_t *id = ids.data() + size_t(y0) * size_t(w);
+        for (size_t i = 0; i < colors.size(); ++i) {
+            if (id[i] < 0) continue;
+            const Remap *m = remaps.data() + size_t(id[i]) * 4;
+            Color &c = colors[i];
+            c = Color((c.r + m[0].offset) * m[0].scale, (c.g + m[1].offset) * m[1].scale,
+                      (c.b + m[2].offset) * m[2].scale, (c.a + m[3].offset) * m[3].scale);
+        }
+        if (!out->paste(rows, colors.data())) {
+            message(kMsgError, 6, "Shape normalization could not write its result");
+            return false;
+        }
+        return true;
+    });
+    if (!ok) {
+        if (remap.aborted()) message(kMsgProgress, 6, "Shape normalization aborted");
+        return false;
+    }
+    if (!recordFile_.empty() && !writeMinMaxData(recordFile_, record_)) return false;
+    return results.place({source_});
+}
+
+}  // namespace ox
