@@ -42,8 +42,10 @@ public:
     /// them). With io, progress (rows done / height) is reported every tenth and the run stops
     /// between bands once io reports an abort.
     RowBands(int32_t height, int32_t bandRows, int threadCount, RenderIOInterface *io)
-        : height_(height), bandRows_(bandRows < 1 ? 1 : bandRows),
-          threads_(threadCount < 1 ? 1 : threadCount), io_(io) {}
+        : height_(height),
+          bandRows_(bandRows < 1 ? 1 : bandRows),
+          threads_(threadCount < 1 ? 1 : threadCount),
+          io_(io) {}
 
     /// Runs the body over every band. False when a band failed (its message given by the
     /// body), a thread could not start, or the run was aborted (then aborted() is true).
@@ -227,7 +229,9 @@ private:
 class EdgeDilationFilter final : public FrameCommand {
 public:
     EdgeDilationFilter(std::vector<std::string> sources, int32_t size, const Color &background)
-        : FrameCommand("Edge Dilation Filter"), sources_(std::move(sources)), size_(size),
+        : FrameCommand("Edge Dilation Filter"),
+          sources_(std::move(sources)),
+          size_(size),
           background_(background) {}
     /// Rows run on this many threads (the run's render threads).
     void setThreadCount(int threads) { threads_ = threads; }
@@ -304,8 +308,10 @@ public:
     /// instances (not owned, may be null in Image mode: every covered texel counts then).
     ShapeNormalizationFilter(std::string source, const NormalizeOptions &options,
                              const TexelInstanceInterface *instances)
-        : FrameCommand("Shape Normalization Filter"), source_(std::move(source)),
-          options_(options), instances_(instances) {}
+        : FrameCommand("Shape Normalization Filter"),
+          source_(std::move(source)),
+          options_(options),
+          instances_(instances) {}
     /// Rows run on this many threads.
     void setThreadCount(int threads) { threads_ = threads; }
     /// Writes the record to this file after a successful run (empty: not written).
@@ -339,8 +345,7 @@ class OutputShaderCommand final : public FrameCommand {
 public:
     /// shaders are not owned and must outlive the command.
     OutputShaderCommand(std::string target, std::vector<OutputShaderInterface *> shaders)
-        : FrameCommand("Output Shader"), target_(std::move(target)),
-          shaders_(std::move(shaders)) {}
+        : FrameCommand("Output Shader"), target_(std::move(target)), shaders_(std::move(shaders)) {}
     using FrameCommand::execute;
     bool execute(Frame &frame, RenderContext &context, RenderIOInterface &io) override;
 

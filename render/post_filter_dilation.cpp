@@ -42,8 +42,8 @@ bool rowDistances(LayerT<float> &z, int32_t y0, int32_t y1, uint16_t cap, uint16
 
 /// The brightest covered texel of the ring of radius r around (x, y); false when no covered
 /// candidate beat the starting luminance. rows holds image rows from rowBase on.
-inline bool brightestOnRing(const uint16_t *rowDist, const Color *rows, int32_t rowBase,
-                            int32_t w, int32_t h, int32_t x, int32_t y, int32_t r, Color &out) {
+inline bool brightestOnRing(const uint16_t *rowDist, const Color *rows, int32_t rowBase, int32_t w,
+                            int32_t h, int32_t x, int32_t y, int32_t r, Color &out) {
     float best = -3.4028235e38f;
     bool found = false;
     auto visit = [&](int32_t cx, int32_t cy) {
@@ -114,8 +114,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
     std::vector<uint16_t> rowDist(size_t(w) * size_t(h));
     RowBands distBands(h, 64, threads_, nullptr);
     if (!distBands.run([&](int32_t y0, int32_t y1, int) {
-            if (rowDistances(*z, y0, y1, cap, rowDist.data() + size_t(y0) * size_t(w)))
-                return true;
+            if (rowDistances(*z, y0, y1, cap, rowDist.data() + size_t(y0) * size_t(w))) return true;
             message(kMsgError, 6, "Edge dilation could not read the Z layer");
             return false;
         }))
@@ -157,8 +156,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         s.rows.resize(size_t(w) * size_t(rowEnd - rowBase));
         for (size_t l = 0; l < sources.size(); ++l) {
             if (!sources[l]->read(Region(0, rowBase, w, rowEnd), s.rows.data())) {
-                message(kMsgError, 6, "Edge dilation could not read layer %s",
-                        sources_[l].c_str());
+                message(kMsgError, 6, "Edge dilation could not read layer %s", sources_[l].c_str());
                 return false;
             }
             for (int32_t y = y0; y < y1; ++y) {
@@ -169,9 +167,8 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                     const int32_t r = d[x];
                     if (r == 0)
                         dst[x] = src[x];
-                    else if (r > n ||
-                             !brightestOnRing(rowDist.data(), s.rows.data(), rowBase, w, h, x, y,
-                                              r, dst[x]))
+                    else if (r > n || !brightestOnRing(rowDist.data(), s.rows.data(), rowBase, w, h,
+                                                       x, y, r, dst[x]))
                         dst[x] = background_;
                 }
             }

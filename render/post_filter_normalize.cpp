@@ -94,8 +94,7 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         std::vector<Color> colors(size_t(rows.area()));
         std::vector<float> depth(z ? colors.size() : 0);
         if (!in->read(rows, colors.data()) || (z && !z->read(rows, depth.data()))) {
-            message(kMsgError, 6, "Shape normalization could not read layer %s",
-                    source_.c_str());
+            message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
         }
         std::vector<Range> &acc = ranges[size_t(thread)];
@@ -192,8 +191,7 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         const Region rows(0, y0, w, y1);
         std::vector<Color> colors(size_t(rows.area()));
         if (!in->read(rows, colors.data())) {
-            message(kMsgError, 6, "Shape normalization could not read layer %s",
-                    source_.c_str());
+            message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
         }
         const int32_t *id = ids.data() + size_t(y0) * size_t(w);

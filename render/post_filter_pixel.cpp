@@ -216,8 +216,7 @@ bool RNMAverageMaxFilter::init(Frame &frame, RenderContext &) {
     return true;
 }
 
-bool RNMAverageMaxFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX,
-                                     int32_t &failedY) {
+bool RNMAverageMaxFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) {
     const Region rows = rowsOf(in_[0]->width(), y0, y1);
     const size_t n = size_t(rows.area());
     std::vector<Color> c(n * 3), o(n * 2);
