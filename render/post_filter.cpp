@@ -131,7 +131,8 @@ void FilterResults::discard() {
 
 // ---------------------------------------------------------------------------------------------
 
-bool PostFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) {
+bool PostFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                            int32_t &failedY) {
     for (int32_t y = y0; y < y1; ++y) {
         for (int32_t x = 0; x < width_; ++x) {
             if (!filterPixel(x, y)) {
@@ -160,12 +161,14 @@ bool PostFilterCommand::execute(Frame &frame, RenderContext &context, RenderIOIn
     io.setProgressTitle("Post Filtering");
     io.setProgress(0.0f);
     const bool concurrent = filter_->concurrentRows();
-    RowBands bands(frame.height(), concurrent ? 16 : 1, concurrent ? threads_ : 1, &io);
+    RowBands bands(frame.height(), concurrent ? kFilterBandRows : 1, concurrent ? threads_ : 1,
+                   &io);
     std::mutex failMutex;
     int32_t failX = -1, failY = -1;
-    const bool ok = bands.run([&](int32_t y0, int32_t y1, int) {
+    std::vector<BandScratch> scratch(size_t(std::max(threads_, 1)));
+    const bool ok = bands.run([&](int32_t y0, int32_t y1, int thread) {
         int32_t fx = -1, fy = -1;
-        if (filter_->filterRows(y0, y1, fx, fy)) return true;
+        if (filter_->filterRows(y0, y1, scratch[size_t(thread)], fx, fy)) return true;
         std::lock_guard<std::mutex> lock(failMutex);
         // The lowest failing pixel is reported, whatever the thread count.
         if (failY < 0 || fy < failY || (fy == failY && fx < failX)) failX = fx, failY = fy;

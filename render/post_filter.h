@@ -31,6 +31,28 @@
 /// leaves the sources untouched. Results do not depend on the thread count.
 namespace ox {
 
+/// The rows of a band of filter work: one tile row of the frame's tiled layers, so that every
+/// tile is loaded once per band.
+constexpr int32_t kFilterBandRows = kLayerTileSize;
+
+/// Buffers of one thread's band work, kept from band to band so that large bands do not
+/// fault in fresh pages each time.
+struct BandScratch {
+    std::vector<Color> colors;
+    std::vector<float> floats;
+
+    /// colors sized to at least n, returned.
+    Color *colorBuffer(size_t n) {
+        if (colors.size() < n) colors.resize(n);
+        return colors.data();
+    }
+    /// floats sized to at least n, returned.
+    float *floatBuffer(size_t n) {
+        if (floats.size() < n) floats.resize(n);
+        return floats.data();
+    }
+};
+
 /// Runs a body over bands of rows of an image on a number of threads, with progress and abort.
 class RowBands {
 public:
@@ -101,9 +123,10 @@ public:
     /// Filters texel (x, y). Simple filters implement this alone; it is then called row by row
     /// on one thread.
     virtual bool filterPixel(int32_t x, int32_t y) = 0;
-    /// Filters rows [y0, y1); on failure sets failedX and failedY. True from a filter means it
-    /// may be called concurrently for disjoint bands. The default calls filterPixel.
-    virtual bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY);
+    /// Filters rows [y0, y1) with the calling thread's scratch buffers; on failure sets failedX
+    /// and failedY. The default calls filterPixel.
+    virtual bool filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                            int32_t &failedY);
     /// True when filterRows may run on several threads at once.
     virtual bool concurrentRows() const { return false; }
     /// Places the results (deletes the sources, renames the results); false after one message.
@@ -144,7 +167,8 @@ public:
         : sources_(std::move(sources)), threshold_(threshold), background_(background) {}
     bool init(Frame &frame, RenderContext &context) override;
     bool filterPixel(int32_t x, int32_t y) override;
-    bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) override;
+    bool filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                    int32_t &failedY) override;
     bool concurrentRows() const override { return true; }
     bool finish(Frame &frame) override;
     void discard(Frame &frame) override;
@@ -175,7 +199,8 @@ public:
         : source_(std::move(source)), remapRGB_(remapRGB), remapAlpha_(remapAlpha) {}
     bool init(Frame &frame, RenderContext &context) override;
     bool filterPixel(int32_t x, int32_t y) override;
-    bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) override;
+    bool filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                    int32_t &failedY) override;
     bool concurrentRows() const override { return true; }
     bool finish(Frame &frame) override;
     void discard(Frame &frame) override;
@@ -204,7 +229,8 @@ public:
         : sources_(std::move(sources)), outputs_(std::move(outputs)) {}
     bool init(Frame &frame, RenderContext &context) override;
     bool filterPixel(int32_t x, int32_t y) override;
-    bool filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) override;
+    bool filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                    int32_t &failedY) override;
     bool concurrentRows() const override { return true; }
     bool finish(Frame &frame) override;
     void discard(Frame &frame) override;

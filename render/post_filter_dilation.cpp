@@ -112,7 +112,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
     }
 
     std::vector<uint16_t> rowDist(size_t(w) * size_t(h));
-    RowBands distBands(h, 64, threads_, nullptr);
+    RowBands distBands(h, kFilterBandRows, threads_, nullptr);
     if (!distBands.run([&](int32_t y0, int32_t y1, int) {
             if (rowDistances(*z, y0, y1, cap, rowDist.data() + size_t(y0) * size_t(w))) return true;
             message(kMsgError, 6, "Edge dilation could not read the Z layer");
@@ -121,7 +121,9 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         return false;
 
     const std::vector<uint16_t> farRow(size_t(w), cap);  // stands for rows outside the image
-    const int32_t bandRows = std::max(32, 2 * n);
+    // Each band also reads n rows above and below it: tall bands keep that margin small.
+    const int32_t bandRows = (std::max(4 * kFilterBandRows, 2 * n) + kFilterBandRows - 1) /
+                             kFilterBandRows * kFilterBandRows;
     std::vector<DilationScratch> scratch(size_t(std::max(threads_, 1)));
     RowBands bands(h, bandRows, threads_, io);
     const bool ok = bands.run([&](int32_t y0, int32_t y1, int thread) {

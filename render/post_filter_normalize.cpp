@@ -80,7 +80,7 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     if (!out) return false;
 
     // Gather: per thread ranges, the instance of every texel, texels without one per band.
-    const int32_t bandRows = 16;
+    const int32_t bandRows = kFilterBandRows;
     const int32_t bandCount = (h + bandRows - 1) / bandRows;
     std::vector<int32_t> ids(size_t(w) * size_t(h), count);
     const int threads = std::max(threads_, 1);
@@ -88,12 +88,13 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
                                            std::vector<Range>(size_t(slots) * size_t(comps)));
     std::vector<std::vector<std::pair<int32_t, int32_t>>> orphans(static_cast<size_t>(bandCount));
     std::vector<int64_t> orphanCounts(size_t(bandCount), 0);
+    std::vector<BandScratch> scratch(static_cast<size_t>(threads));
     RowBands gather(h, bandRows, threads, nullptr);
     const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
         const Region rows(0, y0, w, y1);
-        std::vector<Color> colors(size_t(rows.area()));
-        std::vector<float> depth(z ? colors.size() : 0);
-        if (!in->read(rows, colors.data()) || (z && !z->read(rows, depth.data()))) {
+        Color *colors = scratch[size_t(thread)].colorBuffer(size_t(rows.area()));
+        float *depth = z ? scratch[size_t(thread)].floatBuffer(size_t(rows.area())) : nullptr;
+        if (!in->read(rows, colors) || (z && !z->read(rows, depth))) {
             message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
         }
@@ -187,22 +188,23 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
 
     // Remap the covered texels that have an instance; the rest are copied.
     RowBands remap(h, bandRows, threads, io);
-    const bool ok = remap.run([&](int32_t y0, int32_t y1, int) {
+    const bool ok = remap.run([&](int32_t y0, int32_t y1, int thread) {
         const Region rows(0, y0, w, y1);
-        std::vector<Color> colors(size_t(rows.area()));
-        if (!in->read(rows, colors.data())) {
+        const size_t n = size_t(rows.area());
+        Color *colors = scratch[size_t(thread)].colorBuffer(n);
+        if (!in->read(rows, colors)) {
             message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
         }
         const int32_t *id = ids.data() + size_t(y0) * size_t(w);
-        for (size_t i = 0; i < colors.size(); ++i) {
+        for (size_t i = 0; i < n; ++i) {
             if (id[i] < 0) continue;
             const Remap *m = remaps.data() + size_t(id[i]) * 4;
             Color &c = colors[i];
             c = Color((c.r + m[0].offset) * m[0].scale, (c.g + m[1].offset) * m[1].scale,
                       (c.b + m[2].offset) * m[2].scale, (c.a + m[3].offset) * m[3].scale);
         }
-        if (!out->paste(rows, colors.data())) {
+        if (!out->paste(rows, colors)) {
             message(kMsgError, 6, "Shape normalization could not write its result");
             return false;
         }

@@ -40,17 +40,19 @@ bool PremultiplyFilter::init(Frame &frame, RenderContext &) {
     return true;
 }
 
-bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) {
+bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                                   int32_t &failedY) {
     if (in_.empty()) return true;
     const Region rows = rowsOf(in_[0]->width(), y0, y1);
-    std::vector<Color> buffer(size_t(rows.area()));
+    const size_t n = size_t(rows.area());
+    Color *buffer = scratch.colorBuffer(n);
     for (size_t l = 0; l < in_.size(); ++l) {
-        if (!in_[l]->read(rows, buffer.data())) {
+        if (!in_[l]->read(rows, buffer)) {
             failedX = 0, failedY = y0;
             return false;
         }
-        for (Color &c : buffer) c = premultiply(c, threshold_, background_);
-        if (!out_[l]->paste(rows, buffer.data())) {
+        for (size_t i = 0; i < n; ++i) buffer[i] = premultiply(buffer[i], threshold_, background_);
+        if (!out_[l]->paste(rows, buffer)) {
             failedX = 0, failedY = y0;
             return false;
         }
@@ -111,7 +113,7 @@ bool RangeRemapFilter::init(Frame &frame, RenderContext &) {
     float rgbMin = 3.4028235e38f, rgbMax = -3.4028235e38f;
     float aMin = 3.4028235e38f, aMax = -3.4028235e38f;
     const int32_t w = in_->width(), h = in_->height();
-    const int32_t band = 16;
+    const int32_t band = kFilterBandRows;
     std::vector<Color> colors(size_t(w) * band);
     std::vector<float> z(z_ ? size_t(w) * band : 0);
     for (int32_t y0 = 0; y0 < h; y0 += band) {
@@ -142,21 +144,23 @@ bool RangeRemapFilter::init(Frame &frame, RenderContext &) {
     return out_ != nullptr;
 }
 
-bool RangeRemapFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) {
+bool RangeRemapFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                                  int32_t &failedY) {
     const Region rows = rowsOf(in_->width(), y0, y1);
-    std::vector<Color> buffer(size_t(rows.area()));
-    std::vector<float> z(z_ ? buffer.size() : 0);
-    if (!in_->read(rows, buffer.data()) || (z_ && !z_->read(rows, z.data()))) {
+    const size_t n = size_t(rows.area());
+    Color *buffer = scratch.colorBuffer(n);
+    float *z = z_ ? scratch.floatBuffer(n) : nullptr;
+    if (!in_->read(rows, buffer) || (z_ && !z_->read(rows, z))) {
         failedX = 0, failedY = y0;
         return false;
     }
-    for (size_t i = 0; i < buffer.size(); ++i) {
+    for (size_t i = 0; i < n; ++i) {
         if (z_ && !(z[i] >= 0.0f)) continue;
         Color &c = buffer[i];
         c = Color((c.r + rgbOffset_) * rgbScale_, (c.g + rgbOffset_) * rgbScale_,
                   (c.b + rgbOffset_) * rgbScale_, (c.a + alphaOffset_) * alphaScale_);
     }
-    if (!out_->paste(rows, buffer.data())) {
+    if (!out_->paste(rows, buffer)) {
         failedX = 0, failedY = y0;
         return false;
     }
@@ -164,8 +168,9 @@ bool RangeRemapFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, int3
 }
 
 bool RangeRemapFilter::filterPixel(int32_t x, int32_t y) {
+    BandScratch scratch;
     int32_t fx, fy;
-    return filterRows(y, y + 1, fx, fy);  // one texel costs as much as its row here
+    return filterRows(y, y + 1, scratch, fx, fy);  // one texel costs as much as its row here
 }
 
 bool RangeRemapFilter::finish(Frame &) {
@@ -216,12 +221,13 @@ bool RNMAverageMaxFilter::init(Frame &frame, RenderContext &) {
     return true;
 }
 
-bool RNMAverageMaxFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, int32_t &failedY) {
+bool RNMAverageMaxFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
+                                     int32_t &failedY) {
     const Region rows = rowsOf(in_[0]->width(), y0, y1);
     const size_t n = size_t(rows.area());
-    std::vector<Color> c(n * 3), o(n * 2);
+    Color *c = scratch.colorBuffer(n * 5), *o = c + n * 3;
     for (int i = 0; i < 3; ++i)
-        if (!in_[i]->read(rows, c.data() + n * size_t(i))) {
+        if (!in_[i]->read(rows, c + n * size_t(i))) {
             failedX = 0, failedY = y0;
             return false;
         }
@@ -231,7 +237,7 @@ bool RNMAverageMaxFilter::filterRows(int32_t y0, int32_t y1, int32_t &failedX, i
         o[t] = out[0];
         o[n + t] = out[1];
     }
-    if (!out_[0]->paste(rows, o.data()) || !out_[1]->paste(rows, o.data() + n)) {
+    if (!out_[0]->paste(rows, o) || !out_[1]->paste(rows, o + n)) {
         failedX = 0, failedY = y0;
         return false;
     }
