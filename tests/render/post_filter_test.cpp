@@ -602,6 +602,29 @@ TEST_F(ShapeNormalizationTest, RecordRoundTripAndZeroRanges) {
           "<ComponentMinMaxVec", "<ComponentMinMax", "<minVal", "<maxVal"})
         EXPECT_TRUE(has(text, element)) << element;
 
+    // Damaged or hostile record files are refused with one message and leave the record as it
+    // was.
+    const char *bad[] = {
+        "",
+        "<MinMaxRoot><imgMinMaxVec><ComponentMinMax><minVal>1",
+        "<Other/>",
+        "<MinMaxRoot><imgMinMaxVec><ShapeMinMax/></imgMinMaxVec></MinMaxRoot>",
+        "<MinMaxRoot><imgMinMaxVec><ComponentMinMax><minVal>x</minVal></ComponentMinMax>"
+        "</imgMinMaxVec></MinMaxRoot>",
+        "<MinMaxRoot><imgMinMaxVec><ComponentMinMax><minVal>1e99</minVal></ComponentMinMax>"
+        "</imgMinMaxVec></MinMaxRoot>",
+        "<!DOCTYPE r [<!ENTITY e SYSTEM \"/etc/passwd\">]><MinMaxRoot><minMaxVec><ShapeMinMax>"
+        "<shape>&e;</shape></ShapeMinMax></minMaxVec></MinMaxRoot>",
+    };
+    for (const char *text : bad) {
+        std::ofstream("bad.xml") << text;
+        ox::MinMaxData kept = back;
+        const std::string why =
+            captured([&] { EXPECT_FALSE(ox::readMinMaxData("bad.xml", kept)) << text; });
+        EXPECT_TRUE(has(why, "MinMaxData file bad.xml")) << text << ": " << why;
+        EXPECT_EQ(kept.shapes.size(), back.shapes.size());
+    }
+
     // A record that cannot be written fails the filter and leaves the layer as it was.
     auto g = makeFrame(2, 2, z, {{"beauty", in}});
     filter.setRecordFile("no/such/dir/beauty_minmax.xml");
@@ -609,7 +632,9 @@ TEST_F(ShapeNormalizationTest, RecordRoundTripAndZeroRanges) {
     EXPECT_FALSE(log.empty());
     EXPECT_EQ(g->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
     EXPECT_EQ(readColors(*g, "beauty"), in);
-    EXPECT_FALSE(ox::readMinMaxData("no/such/dir/beauty_minmax.xml", back));
+    EXPECT_TRUE(has(
+        captured([&] { EXPECT_FALSE(ox::readMinMaxData("no/such/dir/beauty_minmax.xml", back)); }),
+        "Could not open MinMaxData file"));
 }
 
 TEST_F(ShapeNormalizationTest, TexelsWithoutInstanceAreLoggedAndMissingInputsFail) {
