@@ -111,6 +111,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         outputs.push_back(out);
     }
 
+    if (w == 0 || h == 0) return results.place(sources_);
     std::vector<uint16_t> rowDist(size_t(w) * size_t(h));
     RowBands distBands(h, kFilterBandRows, threads_, nullptr);
     if (!distBands.run([&](int32_t y0, int32_t y1, int) {
