@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <limits>
 #include <vector>
 
 #include "core/message.h"
@@ -40,39 +41,40 @@ bool rowDistances(LayerT<float> &z, int32_t y0, int32_t y1, uint16_t cap, uint16
     return true;
 }
 
-/// The brightest covered texel of the ring of radius r around (x, y); false when no covered
-/// candidate beat the starting luminance. rows holds image rows from rowBase on.
-inline bool brightestOnRing(const uint16_t *rowDist, const Color *rows, int32_t rowBase, int32_t w,
-                            int32_t h, int32_t x, int32_t y, int32_t r, Color &out) {
+/// The index (into the band's window, whose first row is image row rowBase) of the brightest
+/// texel of the ring of radius r around (x, y), or -1 when none beat the starting luminance.
+/// lum holds the luminance of covered texels and -infinity for background ones (and for
+/// covered ones that could never win), so background texels never win.
+inline int64_t brightestOnRing(const float *lum, int32_t rowBase, int32_t w, int32_t h, int32_t x,
+                               int32_t y, int32_t r) {
     float best = -3.4028235e38f;
-    bool found = false;
-    auto visit = [&](int32_t cx, int32_t cy) {
-        if (rowDist[size_t(cy) * size_t(w) + size_t(cx)] != 0) return;
-        const Color &c = rows[size_t(cy - rowBase) * size_t(w) + size_t(cx)];
-        const float l = c.luminance();
-        if (l > best) {
-            best = l;
-            out = c;
-            found = true;
-        }
+    int64_t winner = -1;
+    auto visit = [&](int64_t i) {
+        if (lum[i] > best) best = lum[i], winner = i;
     };
+    const int64_t stride = w;
     const int32_t ya = std::max(0, y - r), yb = std::min(h - 1, y + r);
     if (x - r >= 0)
-        for (int32_t cy = ya; cy <= yb; ++cy) visit(x - r, cy);
+        for (int64_t i = (ya - rowBase) * stride + (x - r), e = (yb - rowBase) * stride + (x - r);
+             i <= e; i += stride)
+            visit(i);
     if (x + r < w)
-        for (int32_t cy = ya; cy <= yb; ++cy) visit(x + r, cy);
+        for (int64_t i = (ya - rowBase) * stride + (x + r), e = (yb - rowBase) * stride + (x + r);
+             i <= e; i += stride)
+            visit(i);
     const int32_t xa = std::max(0, x - r + 1), xb = std::min(w - 1, x + r - 1);
     if (y + r < h)
-        for (int32_t cx = xa; cx <= xb; ++cx) visit(cx, y + r);
+        for (int64_t i = (y + r - rowBase) * stride + xa, e = i + (xb - xa); i <= e; ++i) visit(i);
     if (y - r >= 0)
-        for (int32_t cx = xa; cx <= xb; ++cx) visit(cx, y - r);
-    return found;
+        for (int64_t i = (y - r - rowBase) * stride + xa, e = i + (xb - xa); i <= e; ++i) visit(i);
+    return winner;
 }
 
 /// Per-thread scratch of the dilation rows.
 struct DilationScratch {
     std::vector<uint16_t> ring;  // ring radius per texel of the band
     std::vector<Color> rows;     // source rows of the band and its margins
+    std::vector<float> lum;      // their luminance, -infinity for background texels
     std::vector<Color> out;      // result rows of the band
 };
 
@@ -156,11 +158,21 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         }
 
         const int32_t rowBase = std::max(0, y0 - n), rowEnd = std::min(h, y1 + n);
-        s.rows.resize(size_t(w) * size_t(rowEnd - rowBase));
+        const size_t window = size_t(w) * size_t(rowEnd - rowBase);
+        s.rows.resize(window);
+        s.lum.resize(window);
+        // Only covered texels can win; the ring's radius is known, so no other test is needed.
+        const float never = -std::numeric_limits<float>::infinity();
+        const uint16_t *windowDist = rowDist.data() + size_t(rowBase) * size_t(w);
         for (size_t l = 0; l < sources.size(); ++l) {
             if (!sources[l]->read(Region(0, rowBase, w, rowEnd), s.rows.data())) {
                 message(kMsgError, 6, "Edge dilation could not read layer %s", sources_[l].c_str());
                 return false;
+            }
+            for (size_t i = 0; i < window; ++i) {
+                const float v = s.rows[i].luminance();
+                // A NaN or lowest luminance never beats the starting value either.
+                s.lum[i] = windowDist[i] == 0 && v > -3.4028235e38f ? v : never;
             }
             for (int32_t y = y0; y < y1; ++y) {
                 const uint16_t *d = s.ring.data() + size_t(y - y0) * size_t(w);
@@ -168,11 +180,13 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                 Color *dst = s.out.data() + size_t(y - y0) * size_t(w);
                 for (int32_t x = 0; x < w; ++x) {
                     const int32_t r = d[x];
-                    if (r == 0)
+                    if (r == 0) {
                         dst[x] = src[x];
-                    else if (r > n || !brightestOnRing(rowDist.data(), s.rows.data(), rowBase, w, h,
-                                                       x, y, r, dst[x]))
-                        dst[x] = background_;
+                        continue;
+                    }
+                    const int64_t win =
+                        r > n ? -1 : brightestOnRing(s.lum.data(), rowBase, w, h, x, y, r);
+                    dst[x] = win < 0 ? background_ : s.rows[size_t(win)];
                 }
             }
             if (!outputs[l]->paste(Region(0, y0, w, y1), s.out.data())) {

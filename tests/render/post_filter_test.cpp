@@ -162,8 +162,10 @@ TEST(EdgeDilationTest, MatchesThePlainRingSearchOnRandomMasks) {
                 z[i] = p < coverage ? p : (p < 0.97f ? kBg : std::nanf(""));
                 // Few grey levels, so that ties are common; alpha tells the texels apart.
                 const float level = float(int(u(rng) * 3.0f)) * 0.25f;
-                c[i] = u(rng) < 0.8f ? Color(level, level, level, float(i))
-                                     : Color(u(rng), u(rng), u(rng), float(i));
+                const float pick = u(rng);
+                c[i] = pick < 0.8f    ? Color(level, level, level, float(i))
+                       : pick < 0.98f ? Color(u(rng), u(rng), u(rng), float(i))
+                                      : Color(std::nanf(""), -INFINITY, 1.0f, float(i));
             }
             for (int n : {0, 1, 2, 3, 5, 9, 40}) {
                 std::vector<Color> expected(count);
