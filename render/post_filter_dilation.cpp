@@ -70,11 +70,96 @@ inline int64_t brightestOnRing(const float *lum, int32_t rowBase, int32_t w, int
     return winner;
 }
 
+/// Rings up to this size are scanned texel by texel; larger ones use RunMaxima.
+constexpr int32_t kDirectScanMax = 6;
+
+/// floor(log2(v)) for v >= 1.
+inline int log2Floor(uint32_t v) { return 31 - __builtin_clz(v); }
+
+/// Sparse tables over a band's window: row[k] holds, for every texel, the index of the first
+/// brightest texel of the 2^k texels from it to the right, col[k] the same upwards (level 0,
+/// the texel itself, is not stored). Any run along a row or a column is then answered from two
+/// overlapping table entries.
+struct RunMaxima {
+    std::vector<std::vector<int32_t>> row, col;
+
+    void build(const float *lum, int32_t w, int32_t rows, int rowLevels, int colLevels) {
+        const size_t n = size_t(w) * size_t(rows);
+        row.resize(size_t(rowLevels) + 1);
+        col.resize(size_t(colLevels) + 1);
+        for (int k = 1; k <= rowLevels; ++k) {
+            std::vector<int32_t> &t = row[size_t(k)];
+            t.resize(n);
+            const int32_t half = 1 << (k - 1);
+            for (int32_t y = 0; y < rows; ++y) {
+                const int32_t base = y * w;
+                for (int32_t x = 0; x + 2 * half <= w; ++x) {
+                    const int32_t a = k == 1 ? base + x : row[size_t(k - 1)][size_t(base + x)];
+                    const int32_t b =
+                        k == 1 ? base + x + half : row[size_t(k - 1)][size_t(base + x + half)];
+                    t[size_t(base + x)] = lum[b] > lum[a] ? b : a;
+                }
+            }
+        }
+        for (int k = 1; k <= colLevels; ++k) {
+            std::vector<int32_t> &t = col[size_t(k)];
+            t.resize(n);
+            const int32_t half = 1 << (k - 1);
+            for (int32_t y = 0; y + 2 * half <= rows; ++y)
+                for (int32_t x = 0; x < w; ++x) {
+                    const int32_t i = y * w + x, j = i + half * w;
+                    const int32_t a = k == 1 ? i : col[size_t(k - 1)][size_t(i)];
+                    const int32_t b = k == 1 ? j : col[size_t(k - 1)][size_t(j)];
+                    t[size_t(i)] = lum[b] > lum[a] ? b : a;
+                }
+        }
+    }
+
+    /// The first brightest texel of window row wy from xa to xb (inclusive).
+    int32_t alongRow(const float *lum, int32_t w, int32_t wy, int32_t xa, int32_t xb) const {
+        const int k = log2Floor(uint32_t(xb - xa + 1));
+        const int32_t i = wy * w + xa, j = wy * w + xb - (1 << k) + 1;
+        if (k == 0) return i;
+        const int32_t a = row[size_t(k)][size_t(i)], b = row[size_t(k)][size_t(j)];
+        return lum[b] > lum[a] ? b : a;
+    }
+
+    /// The first brightest texel of window column x from row ya to yb (inclusive).
+    int32_t alongColumn(const float *lum, int32_t w, int32_t x, int32_t ya, int32_t yb) const {
+        const int k = log2Floor(uint32_t(yb - ya + 1));
+        const int32_t i = ya * w + x, j = (yb - (1 << k) + 1) * w + x;
+        if (k == 0) return i;
+        const int32_t a = col[size_t(k)][size_t(i)], b = col[size_t(k)][size_t(j)];
+        return lum[b] > lum[a] ? b : a;
+    }
+};
+
+/// brightestOnRing answered from the run maxima: the first brightest texel of each of the four
+/// sides, compared in ring order.
+inline int64_t brightestOnRingFast(const RunMaxima &t, const float *lum, int32_t rowBase, int32_t w,
+                                   int32_t h, int32_t x, int32_t y, int32_t r) {
+    float best = -3.4028235e38f;
+    int64_t winner = -1;
+    auto visit = [&](int32_t i) {
+        if (lum[i] > best) best = lum[i], winner = i;
+    };
+    const int32_t ya = std::max(0, y - r) - rowBase, yb = std::min(h - 1, y + r) - rowBase;
+    if (x - r >= 0) visit(t.alongColumn(lum, w, x - r, ya, yb));
+    if (x + r < w) visit(t.alongColumn(lum, w, x + r, ya, yb));
+    const int32_t xa = std::max(0, x - r + 1), xb = std::min(w - 1, x + r - 1);
+    if (xa <= xb) {
+        if (y + r < h) visit(t.alongRow(lum, w, y + r - rowBase, xa, xb));
+        if (y - r >= 0) visit(t.alongRow(lum, w, y - r - rowBase, xa, xb));
+    }
+    return winner;
+}
+
 /// Per-thread scratch of the dilation rows.
 struct DilationScratch {
     std::vector<uint16_t> ring;  // ring radius per texel of the band
     std::vector<Color> rows;     // source rows of the band and its margins
     std::vector<float> lum;      // their luminance, -infinity for background texels
+    RunMaxima runs;              // over lum, for large rings
     std::vector<Color> out;      // result rows of the band
 };
 
@@ -174,6 +259,10 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                 // A NaN or lowest luminance never beats the starting value either.
                 s.lum[i] = windowDist[i] == 0 && v > -3.4028235e38f ? v : never;
             }
+            const bool fast = n > kDirectScanMax;
+            if (fast)
+                s.runs.build(s.lum.data(), w, rowEnd - rowBase, log2Floor(uint32_t(2 * n - 1)),
+                             log2Floor(uint32_t(2 * n + 1)));
             for (int32_t y = y0; y < y1; ++y) {
                 const uint16_t *d = s.ring.data() + size_t(y - y0) * size_t(w);
                 const Color *src = s.rows.data() + size_t(y - rowBase) * size_t(w);
@@ -185,7 +274,9 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                         continue;
                     }
                     const int64_t win =
-                        r > n ? -1 : brightestOnRing(s.lum.data(), rowBase, w, h, x, y, r);
+                        r > n  ? -1
+                        : fast ? brightestOnRingFast(s.runs, s.lum.data(), rowBase, w, h, x, y, r)
+                               : brightestOnRing(s.lum.data(), rowBase, w, h, x, y, r);
                     dst[x] = win < 0 ? background_ : s.rows[size_t(win)];
                 }
             }
