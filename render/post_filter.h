@@ -17,11 +17,19 @@
 ///
 /// Using them (a bake target's command list):
 ///
-///     executor.add(std::make_unique<PostFilterCommand>(
-///         std::make_unique<PremultiplyFilter>(names, 0.0f, Color::black())));
-///     auto dilation = std::make_unique<EdgeDilationFilter>(names, 5, background);
-///     dilation->setThreadCount(renderThreads);
+///     executor.add(std::make_unique<PostFilterCommand>(         // pixel filters
+///         std::make_unique<PremultiplyFilter>(passNames, 0.0f, Color::black()), threads));
+///     auto dilation = std::make_unique<EdgeDilationFilter>(passNames, edgeDilation, bg);
+///     dilation->setThreadCount(threads);                          // frame filters
 ///     executor.add(std::move(dilation));
+///     auto normalize = std::make_unique<ShapeNormalizationFilter>(pass, options, &instances);
+///     normalize->setRecordFile(outputDirectory + "..._minmax.xml");  // optional
+///     executor.add(std::move(normalize));
+///     executor.add(std::make_unique<PostFilterCommand>(std::make_unique<RNMAverageMaxFilter>(
+///         {pass, pass + "_1", pass + "_2"}, {pass, pass + "_max"}), threads));
+///
+/// The executor runs them in order on the target's frame (execute(frame, context, io)); the
+/// frame filters also have run(frame, io) for callers without a render context.
 ///
 /// Every filter reads its source layers by name and writes its results into new layers (the
 /// source name plus a suffix, or "temp"); only when the whole frame is done are the sources
