@@ -191,12 +191,12 @@ TEST(EdgeDilationTest, SeveralLayersMissingLayersAndAbort) {
     const std::vector<Color> a = {Color(1, 0, 0, 1), {}, {}, {}},
                              b = {Color(0, 1, 0, 1), {}, {}, {}};
     {
-        auto f = makeFrame(2, 2, z, {{"beauty", a}, {"spec", b}});
-        ox::EdgeDilationFilter filter({"beauty", "spec"}, 1, Color::black());
+        auto f = makeFrame(2, 2, z, {{"beauty", a}, {"specular", b}});
+        ox::EdgeDilationFilter filter({"beauty", "specular"}, 1, Color::black());
         ASSERT_TRUE(filter.run(*f, nullptr));
-        EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty", "spec"}));
+        EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty", "specular"}));
         EXPECT_EQ(readColors(*f, "beauty"), std::vector<Color>(4, a[0]));
-        EXPECT_EQ(readColors(*f, "spec"), std::vector<Color>(4, b[0]));
+        EXPECT_EQ(readColors(*f, "specular"), std::vector<Color>(4, b[0]));
     }
     struct Case {
         const char *what;
@@ -206,17 +206,17 @@ TEST(EdgeDilationTest, SeveralLayersMissingLayersAndAbort) {
     } cases[] = {
         {"missing source",
          {"beauty"},
-         {"beauty", "spec"},
+         {"beauty", "specular"},
          true,
          false,
-         "Source layer spec not found in edge dilation filter"},
+         "Source layer specular not found in edge dilation filter"},
         {"missing Z",
          {"beauty"},
          {"beauty"},
          false,
          false,
          "Source Z layer not found in edge dilation filter"},
-        {"abort", {"beauty", "spec"}, {"beauty", "spec"}, true, true, "Edge dilation aborted"},
+        {"abort", {"beauty", "specular"}, {"beauty", "specular"}, true, true, "Edge dilation aborted"},
     };
     for (const Case &k : cases) {
         Frame f(2, 2);
