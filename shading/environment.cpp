@@ -4,6 +4,7 @@
 #include <cstdio>
 
 #include "platform/file_system.h"
+#include "shading/shading_context.h"
 
 namespace ox {
 namespace {
@@ -49,6 +50,30 @@ IBLEnvironmentShader::IBLEnvironmentShader(std::string name, std::string imageFi
       rotation_(turnDomeDegrees * 0.017453292519943295f),
       swapYZ_(swapYZ),
       giBlur_(giBlur) {}
+
+Vec2 probeUV(const Vec3 &direction, float rotation, bool swapYZ) {
+    constexpr float kPi = 3.14159265358979f;
+    Vec3 d = direction.normalized();
+    if (swapYZ) std::swap(d.y, d.z);
+    const float y = d.y > 1.0f ? 1.0f : (d.y < -1.0f ? -1.0f : d.y);
+    float u = (std::atan2(d.x, -d.z) + rotation) * (0.5f / kPi) + 0.5f;
+    u -= std::floor(u);
+    if (!(u >= 0.0f && u < 1.0f)) u = 0.0f;  // NaN directions and rounding up to 1
+    const float v = 0.5f + std::asin(y) / kPi;
+    return {u, std::isfinite(v) ? v : 0.5f};
+}
+
+Color IBLEnvironmentShader::evaluateDirection(const Vec3 &direction) const {
+    if (!probe_) return Color(0, 0, 0, 1);
+    return probe_->lookup(probeUV(direction, rotation_, swapYZ_), Vec2(), Vec2());
+}
+
+Color IBLEnvironmentShader::evaluate(const ShadingContext &ctx) const {
+    if (!probe_) return Color(0, 0, 0, 1) * ctx.colorWeight;
+    const Vec2 uv = probeUV(ctx.rayDirection, rotation_, swapYZ_);
+    const float blur = ctx.isGIRay() && giBlur_ > 0.0f ? giBlur_ : 0.0f;
+    return probe_->lookup(uv, Vec2(blur, 0.0f), Vec2(0.0f, blur)) * ctx.colorWeight;
+}
 
 const EnvironmentShaderInterface *Environment::find(const std::string &name) const {
     std::lock_guard lock(mutex_);

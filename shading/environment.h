@@ -36,13 +36,25 @@ private:
     Color upper_, lower_;
 };
 
+/// Where a unit direction meets a latitude-longitude light probe: u runs once around the up
+/// axis (y, or z with swapYZ) starting at -z and turned by rotation (radians), v from 0
+/// straight down to 1 straight up (row 0 of an image is its bottom row).
+Vec2 probeUV(const Vec3 &direction, float rotation, bool swapYZ);
+
 /// A light probe image around the scene: the image, a rotation about the up axis, whether Z is
-/// up, and the blur used by GI rays. The probe lookup comes with the texture code.
+/// up, and the blur used by GI rays.
 class IBLEnvironmentShader : public EnvironmentShaderInterface {
 public:
     IBLEnvironmentShader(std::string name, std::string imageFile, float turnDomeDegrees,
                          bool swapYZ, float giBlur);
-    Color evaluateDirection(const Vec3 &) const override { return Color(0, 0, 0, 1); }
+    /// The probe at the direction (opaque black without a probe image).
+    Color evaluateDirection(const Vec3 &direction) const override;
+    /// The probe along the context's ray times its weight; GI rays read it blurred over a
+    /// footprint of giBlur in u and v.
+    Color evaluate(const ShadingContext &ctx) const override;
+    /// Sets the probe image (loaded by the texture manager).
+    void setProbe(std::shared_ptr<const ChannelTexture> probe) { probe_ = std::move(probe); }
+    const ChannelTexture *probe() const { return probe_.get(); }
     const std::string &imageFile() const { return imageFile_; }
     /// The rotation in radians.
     float rotation() const { return rotation_; }
@@ -54,6 +66,7 @@ private:
     float rotation_;
     bool swapYZ_;
     float giBlur_;
+    std::shared_ptr<const ChannelTexture> probe_;
 };
 
 /// The environment types of the environment settings ("None" 0, "Camera" 1, "SkyLight" 2,

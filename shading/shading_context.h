@@ -1,0 +1,214 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+
+#include "core/types.h"
+#include "raytrace/ray.h"
+
+/// The state one shading call works on: the surface point, the ray that found it and the
+/// per-thread tools, plus the read-only scene every thread shares.
+///
+/// How a caller shades a sample (camera render, texture bake, GI gather):
+///   1. Once per run: fill a ShadingScene (acceleration structure, lights, light links,
+///      environments, the optional indirect-light integrator and hit resolver, settings).
+///   2. Once per thread: a ShadingContext with scene, random and rays set; the rest is
+///      rewritten per sample.
+///   3. Per sample: beginSample() with the ray (or the bake's view direction), then the surface
+///      fields (position, normals, tangent frame, UV sets, vertex colour, instance, side), and
+///      ask a pass for its colour: pass.shade(ctx, material) (shading/pass.h). A ray that hits
+///      nothing gets environmentColor(ctx) (shading/trace.h).
+/// No shading call allocates or locks; the only virtual calls per sample are the pass's and
+/// the material's `shade`.
+namespace ox {
+
+class ADSInterface;
+class EnvironmentShaderInterface;
+class LightSource;
+class Random;
+class SurfaceShaderInterface;
+struct ShadingContext;
+
+/// The shading components: bits of a shading context's component mask and of a render pass's
+/// mask. Lights carry the same bits as their flags (which components they feed).
+enum ShadingComponent : uint32_t {
+    kShadeNone = 0x0,
+    kShadeDiffuse = 0x1,
+    kShadeSpecular = 0x2,
+    kShadeAmbient = 0x4,
+    kShadeReflections = 0x8,
+    kShadeRefractions = 0x10,
+    kShadeSubSurface = 0x20,
+    kShadeShadows = 0x40,
+    kShadeIncandescence = 0x80,
+    kShadeIndirect = 0x100,
+    kShadeAll = 0xFFFFFFFFu,
+};
+
+/// UV sets a shading context carries; a material asking for a set beyond those uses set 0.
+constexpr int kMaxShadingUvSets = 8;
+
+/// Indirect light of the global-illumination integrators, as shading asks for it.
+class IndirectLightInterface {
+public:
+    virtual ~IndirectLightInterface() = default;
+    /// Irradiance arriving at the context's point from all other surfaces, cosine-weighted
+    /// like the direct light of Phong's diffuse sum (the sum the diffuse colour multiplies).
+    virtual Color irradiance(ShadingContext &ctx) const = 0;
+};
+
+/// Turns a hit of a secondary ray into a surface point: fills the surface fields of ctx (the
+/// ray fields are already set) and names the surface shader there. Implemented where
+/// instances and their materials are known.
+class HitResolverInterface {
+public:
+    virtual ~HitResolverInterface() = default;
+    /// The surface shader at the hit (null: nothing to shade, the hit counts as black).
+    virtual const SurfaceShaderInterface *resolve(const Ray &ray, const Hit &hit,
+                                                  ShadingContext &ctx) const = 0;
+};
+
+/// The render settings shading obeys.
+struct ShadingSettings {
+    uint32_t maxRayDepth = 6;
+    uint32_t reflectionDepth = 2;
+    uint32_t refractionDepth = 4;
+    uint32_t transparencyDepth = 50;
+    uint32_t giTransparencyDepth = 2;
+    uint32_t shadowDepth = 2;
+    /// Offset of secondary ray origins from the surface.
+    float bias = 0.005f;
+    uint32_t minShadowRays = 0;
+    uint32_t maxShadowRays = 0xFFFFFFFFu;
+    /// Reflections and refractions weaker than this (luminance of the weight) are not traced.
+    float reflectionThreshold = 0.001f;
+    float refractionThreshold = 0.001f;
+    bool ignoreLightLinks = false;
+};
+
+/// The read-only scene shading works in, shared by all render threads. Plain pointers into
+/// objects the caller owns for the whole run.
+struct ShadingScene {
+    /// Acceleration structure for secondary and shadow rays (null: nothing is traced).
+    const ADSInterface *ads = nullptr;
+    /// The lights, in scene order (light linking indexes this order).
+    const LightSource *const *lights = nullptr;
+    uint32_t lightCount = 0;
+    /// Light links: one bit row of lightLinkWords words per instance, bit j for light j
+    /// (LightLinkTable::row). Null: every light reaches every instance.
+    const uint64_t *lightLinks = nullptr;
+    size_t lightLinkWords = 0;
+    uint32_t lightLinkInstances = 0;
+    /// Environments of rays that leave the scene: ray-traced rays and GI rays (null: black).
+    const EnvironmentShaderInterface *rtEnvironment = nullptr;
+    const EnvironmentShaderInterface *giEnvironment = nullptr;
+    /// Indirect light of the GI integrators (null: no GI).
+    const IndirectLightInterface *indirect = nullptr;
+    /// Surface points of secondary-ray hits (null: secondary rays are not traced).
+    const HitResolverInterface *resolver = nullptr;
+    ShadingSettings settings;
+
+    /// True when light l reaches instance i (instances outside the table see every light).
+    bool reaches(uint32_t instance, uint32_t light) const {
+        if (!lightLinks || settings.ignoreLightLinks || instance >= lightLinkInstances ||
+            light / 64 >= lightLinkWords)
+            return true;
+        return (lightLinks[size_t(instance) * lightLinkWords + light / 64] >> (light % 64)) & 1u;
+    }
+};
+
+/// One shading call's state. A plain value: filled by the caller, copied for secondary rays.
+struct ShadingContext {
+    // --- The surface point (world space) ---
+    Vec3 position;
+    /// Unit geometric normal of the triangle, on the front side as the mesh winds it.
+    Vec3 geometricNormal{0, 0, 1};
+    /// Unit shading normal (interpolated), on the same side as geometricNormal.
+    Vec3 normal{0, 0, 1};
+    /// Unit tangent and bitangent of the normal-map UV set (their handedness is the mesh's:
+    /// the bitangent may be cross(normal, tangent) or its negation).
+    Vec3 tangent{1, 0, 0};
+    Vec3 bitangent{0, 1, 0};
+    /// UV sets and their change per image x and y (zero for bakes without differentials).
+    Vec2 uv[kMaxShadingUvSets];
+    Vec2 dUVdx[kMaxShadingUvSets];
+    Vec2 dUVdy[kMaxShadingUvSets];
+    uint32_t uvSetCount = 0;
+    /// Vertex colour at the point (meaningful when hasVertexColor).
+    Color vertexColor = Color::white();
+    bool hasVertexColor = false;
+    /// Scene instance hit (light linking) and its RenderStats flag word.
+    uint32_t instance = kNoInstance;
+    uint32_t instanceFlags = 0;
+    /// True when the ray arrived on the back of the surface (against geometricNormal).
+    bool backSide = false;
+
+    // --- The ray ---
+    Vec3 rayOrigin;
+    /// Unit direction of travel of the ray that reached the point (bakes: -normal).
+    Vec3 rayDirection{0, 0, -1};
+    /// Distance from rayOrigin to the point (-1 when unknown).
+    float rayDistance = -1.0f;
+    /// Ray type (kRayPrimary for camera and bake samples, kRayFinalGather for GI gathers).
+    uint8_t rayType = kRayPrimary;
+    /// Ray depth (all bounces) and the depths per kind of secondary ray.
+    uint8_t rayDepth = 0;
+    uint8_t reflectionDepth = 0;
+    uint8_t refractionDepth = 0;
+    uint8_t transparencyDepth = 0;
+    /// Weight of this ray's colour in the sample (multiplies R, G, B; alpha is its alpha).
+    Color colorWeight = Color::white();
+    /// Shading components to compute (ShadingComponent bits; kShadeAll: everything).
+    uint32_t componentMask = kShadeAll;
+    /// How much the sample matters (0..1): shadow samplers shrink their counts with it.
+    float importance = 1.0f;
+    /// Shadow samplers trace one ray only.
+    bool singleShadowRay = false;
+
+    // --- Lights (the scene's unless a pass replaces them) ---
+    const LightSource *const *lights = nullptr;
+    uint32_t lightCount = 0;
+
+    // --- Per thread ---
+    Random *random = nullptr;
+    RayCounter *rays = nullptr;
+
+    // --- Shared ---
+    const ShadingScene *scene = nullptr;
+
+    /// True when the mask holds any of these component bits.
+    bool allows(uint32_t components) const { return (componentMask & components) != 0; }
+    /// True for rays of the GI integrators.
+    bool isGIRay() const { return rayType == kRayFinalGather; }
+
+    /// Starts a new sample of a camera or bake ray: ray fields set, depths, weight, mask,
+    /// importance and lights reset to the scene's. The surface fields are the caller's to set.
+    void beginSample(const Vec3 &origin, const Vec3 &direction, uint8_t type = kRayPrimary) {
+        rayOrigin = origin;
+        rayDirection = direction;
+        rayDistance = -1.0f;
+        rayType = type;
+        rayDepth = reflectionDepth = refractionDepth = transparencyDepth = 0;
+        colorWeight = Color::white();
+        componentMask = kShadeAll;
+        importance = 1.0f;
+        singleShadowRay = false;
+        useSceneLights();
+        hasVertexColor = false;
+        backSide = false;
+    }
+    /// Points the light list at the scene's lights.
+    void useSceneLights() {
+        lights = scene ? scene->lights : nullptr;
+        lightCount = scene ? scene->lightCount : 0;
+    }
+    /// True when light index l of the current list reaches the instance hit (light links
+    /// apply to the scene's own list only).
+    bool lightReaches(uint32_t l) const {
+        return !scene || lights != scene->lights || scene->reaches(instance, l);
+    }
+    /// The secondary-ray offset.
+    float bias() const { return scene ? scene->settings.bias : 0.005f; }
+};
+
+}  // namespace ox
