@@ -1,0 +1,100 @@
+#pragma once
+
+#include <memory>
+#include <vector>
+
+#include "core/random.h"
+#include "shading/light.h"
+#include "shading/phong.h"
+#include "shading/shading_context.h"
+
+/// A small shading world for the tests: lights made from scene parameters, a scene and a
+/// context on the plane z = 0 (normal +z, tangent +x) seen from straight above.
+namespace oxtest {
+
+/// A channel texture of one colour everywhere, counting its lookups.
+class ConstantTexture : public ox::ChannelTexture {
+public:
+    explicit ConstantTexture(const ox::Color &c) : color_(c) {}
+    ox::Color lookup(const ox::Vec2 &uv, const ox::Vec2 &, const ox::Vec2 &) const override {
+        lastUv = uv;
+        return color_;
+    }
+    mutable ox::Vec2 lastUv;
+
+private:
+    ox::Color color_;
+};
+
+/// A white point light at p with (1 / d)^2 falloff and no shadows.
+inline std::unique_ptr<ox::LightSource> pointLight(const ox::Vec3 &p,
+                                                   const ox::Color &c = ox::Color::white()) {
+    ox::LightParameters lp;
+    lp.name = "point";
+    lp.type = 0;
+    lp.color = c;
+    lp.falloffExponent = 2.0f;
+    lp.decayClampToOne = false;
+    lp.castShadows = false;
+    lp.objectToWorld = ox::Mtx4::translation(p);
+    bool shadows = false;
+    return ox::createLight(lp, shadows);
+}
+
+/// A white directional light shining from the unit direction towards (towards the light).
+inline std::unique_ptr<ox::LightSource> directionalLight(const ox::Vec3 &towards,
+                                                         const ox::Color &c = ox::Color::white()) {
+    ox::LightParameters lp;
+    lp.name = "sun";
+    lp.type = 1;
+    lp.color = c;
+    lp.castShadows = false;
+    // The light shines along its local -y: map local y onto the wanted direction.
+    const ox::Vec3 y = towards.normalized();
+    const ox::Vec3 a = std::fabs(y.x) < 0.9f ? ox::Vec3(1, 0, 0) : ox::Vec3(0, 1, 0);
+    const ox::Vec3 x = ox::cross(a, y).normalized();
+    const ox::Vec3 z = ox::cross(x, y);
+    ox::Mtx4 m;
+    for (int i = 0; i < 3; ++i) m.m[0][i] = x[i], m.m[1][i] = y[i], m.m[2][i] = z[i];
+    lp.objectToWorld = m;
+    bool shadows = false;
+    return ox::createLight(lp, shadows);
+}
+
+/// Lights, scene and one context over them.
+struct World {
+    std::vector<std::unique_ptr<ox::LightSource>> owned;
+    std::vector<const ox::LightSource *> lights;
+    ox::ShadingScene scene;
+    ox::Random random{1};
+    ox::ShadingContext ctx;
+
+    void add(std::unique_ptr<ox::LightSource> l) {
+        lights.push_back(l.get());
+        owned.push_back(std::move(l));
+        scene.lights = lights.data();
+        scene.lightCount = uint32_t(lights.size());
+    }
+    /// A camera sample at p on the plane z = 0 seen along direction (default straight down).
+    ox::ShadingContext &at(const ox::Vec3 &p, const ox::Vec3 &dir = ox::Vec3(0, 0, -1)) {
+        ctx.scene = &scene;
+        ctx.random = &random;
+        ctx.beginSample(p - dir, dir.normalized());
+        ctx.position = p;
+        ctx.geometricNormal = ctx.normal = ox::Vec3(0, 0, 1);
+        ctx.tangent = ox::Vec3(1, 0, 0);
+        ctx.bitangent = ox::Vec3(0, 1, 0);
+        ctx.uvSetCount = 1;
+        ctx.uv[0] = ox::Vec2(p.x, p.y);
+        return ctx;
+    }
+};
+
+/// Parameters of a material of diffuse colour d and nothing else.
+inline ox::PhongParameters diffuseMaterial(const ox::Color &d) {
+    ox::PhongParameters p;
+    p.channels[ox::kPhongDiffuse].color = d;
+    return p;
+}
+
+}  // namespace oxtest
