@@ -1,15 +1,15 @@
 #pragma once
 
+#include <cmath>
 #include <cstdint>
 
 #include "core/types.h"
+#include "shading/light.h"
 #include "shading/shading_context.h"
 
 /// The shading code's one way of asking a light for its light at a point, and the loop over
 /// the lights that reach a point (light links applied).
 namespace ox {
-
-class LightSource;
 
 /// One light's light at a point.
 struct LightSample {
@@ -21,17 +21,38 @@ struct LightSample {
     float cosine = 0.0f;
 };
 
+/// The light operations' view of a shading context: its thread's generator and ray counter,
+/// ray type and depth, and the scene's shadow tracer; shadows only when asked.
+inline LightContext lightContext(const ShadingContext &ctx, bool withShadow) {
+    LightContext lc;
+    lc.tracer = ctx.scene ? &ctx.scene->shadowTracer : nullptr;
+    lc.random = ctx.random;
+    lc.counter = ctx.rays;
+    lc.rayType = ctx.rayType;
+    lc.rayDepth = ctx.rayDepth;
+    lc.allowShadows = withShadow;
+    lc.singleShadowRay = ctx.singleShadowRay;
+    lc.time = ctx.time;
+    return lc;
+}
+
 /// The light of l at point p with normal n for the context's ray; withShadow multiplies by
 /// the light's shadow transmission.
-void sampleLight(const LightSource &l, ShadingContext &ctx, const Vec3 &p, const Vec3 &n,
-                 bool withShadow, LightSample &out);
+inline void sampleLight(const LightSource &l, ShadingContext &ctx, const Vec3 &p, const Vec3 &n,
+                        bool withShadow, LightSample &out) {
+    LightContext lc = lightContext(ctx, withShadow);
+    out.color = l.illuminate(p, n, lc, withShadow);
+    out.direction = l.directionToLight(p);
+    out.cosine = l.cosineFactor(p, n);
+}
+
 /// The shadowed and the unshadowed light of l at p, and its cosine factor for n.
-void sampleLightBoth(const LightSource &l, ShadingContext &ctx, const Vec3 &p, const Vec3 &n,
-                     Color &shadowed, Color &unshadowed, float &cosine);
-/// True where l can contribute at p.
-bool lightAffects(const LightSource &l, const Vec3 &p);
-/// The light's flag bits.
-uint32_t lightFlags(const LightSource &l);
+inline void sampleLightBoth(const LightSource &l, ShadingContext &ctx, const Vec3 &p,
+                            const Vec3 &n, Color &shadowed, Color &unshadowed, float &cosine) {
+    LightContext lc = lightContext(ctx, true);
+    l.illuminateBoth(shadowed, unshadowed, p, n, lc);
+    cosine = l.cosineFactor(p, n);
+}
 
 /// Calls f(light, index) for every light of the context's list that reaches its instance and
 /// can contribute at p.
@@ -39,10 +60,13 @@ template <typename F>
 void forEachLight(const ShadingContext &ctx, const Vec3 &p, F &&f) {
     for (uint32_t i = 0; i < ctx.lightCount; ++i) {
         const LightSource *l = ctx.lights[i];
-        if (!l || !ctx.lightReaches(i) || !lightAffects(*l, p)) continue;
+        if (!l || !ctx.lightReaches(i) || !l->affectsPoint(p)) continue;
         f(*l, i);
     }
 }
+
+/// The light's flag bits.
+inline uint32_t lightFlags(const LightSource &l) { return l.flags(); }
 
 /// The cosine weight a light gets in the diffuse sum under mask: max(0, cosine) for lights
 /// that feed diffuse, 1 for lights that feed only ambient; negative when the light adds

@@ -5,6 +5,7 @@
 
 #include "core/types.h"
 #include "raytrace/ray.h"
+#include "shading/light_context.h"
 
 /// The state one shading call works on: the surface point, the ray that found it and the
 /// per-thread tools, plus the read-only scene every thread shares.
@@ -76,10 +77,6 @@ struct ShadingSettings {
     uint32_t transparencyDepth = 50;
     uint32_t giTransparencyDepth = 2;
     uint32_t shadowDepth = 2;
-    /// Offset of secondary ray origins from the surface.
-    float bias = 0.005f;
-    uint32_t minShadowRays = 0;
-    uint32_t maxShadowRays = 0xFFFFFFFFu;
     /// Reflections and refractions weaker than this (luminance of the weight) are not traced.
     float reflectionThreshold = 0.001f;
     float refractionThreshold = 0.001f;
@@ -89,8 +86,11 @@ struct ShadingSettings {
 /// The read-only scene shading works in, shared by all render threads. Plain pointers into
 /// objects the caller owns for the whole run.
 struct ShadingScene {
-    /// Acceleration structure for secondary and shadow rays (null: nothing is traced).
+    /// Acceleration structure for secondary rays (null: nothing is traced).
     const ADSInterface *ads = nullptr;
+    /// What the lights' shadow samplers trace against: the acceleration structure, the ray
+    /// bias (also the offset of secondary rays) and the render settings' shadow-ray bounds.
+    ShadowTracer shadowTracer;
     /// The lights, in scene order (light linking indexes this order).
     const LightSource *const *lights = nullptr;
     uint32_t lightCount = 0;
@@ -109,6 +109,16 @@ struct ShadingScene {
     ShadingSettings settings;
 
     /// True when light l reaches instance i (instances outside the table see every light).
+    /// Sets the acceleration structure and the ray bias of secondary and shadow rays, and the
+    /// shadow-ray bounds of the render settings.
+    void setRayTracing(const ADSInterface *structure, float bias, uint32_t minShadowRays = 0,
+                       uint32_t maxShadowRays = 0xFFFFFFFFu) {
+        ads = shadowTracer.ads = structure;
+        shadowTracer.bias = bias;
+        shadowTracer.minShadowRays = minShadowRays;
+        shadowTracer.maxShadowRays = maxShadowRays;
+    }
+
     bool reaches(uint32_t instance, uint32_t light) const {
         if (!lightLinks || settings.ignoreLightLinks || instance >= lightLinkInstances ||
             light / 64 >= lightLinkWords)
@@ -164,6 +174,8 @@ struct ShadingContext {
     float importance = 1.0f;
     /// Shadow samplers trace one ray only.
     bool singleShadowRay = false;
+    /// Shutter time of the ray in [0, 1] (motion blur).
+    float time = 0.0f;
 
     // --- Lights (the scene's unless a pass replaces them) ---
     const LightSource *const *lights = nullptr;
@@ -207,8 +219,10 @@ struct ShadingContext {
     bool lightReaches(uint32_t l) const {
         return !scene || lights != scene->lights || scene->reaches(instance, l);
     }
-    /// The secondary-ray offset.
-    float bias() const { return scene ? scene->settings.bias : 0.005f; }
+    /// The secondary-ray offset (the scene's ray bias).
+    float bias() const {
+        return scene && scene->shadowTracer.bias > 0.0f ? scene->shadowTracer.bias : 0.0f;
+    }
 };
 
 }  // namespace ox

@@ -2,6 +2,7 @@
 
 #include <cmath>
 
+#include "raytrace/complete_grid.h"
 #include "shading/environment.h"
 #include "shading/pass.h"
 #include "shading/trace.h"
@@ -112,6 +113,37 @@ TEST(Passes, ShadowRatioWithoutLightIsOne) {
     PhongParameters p = oxtest::diffuseMaterial(Color(1, 1, 1, 1));
     p.twosided = false;
     EXPECT_EQ(ShadowPassOverride().shade(w.at({0, 0, 0}), PhongShader("one", p)), Color::white());
+}
+
+// Blocks every shadow ray that runs towards +x.
+class BlocksPlusX final : public ADSInterface {
+public:
+    bool intersect(const Ray &, Hit &, float, RayCounter *) const override { return false; }
+    bool intersectSecond(const Ray &, Hit &, float, RayCounter *) const override { return false; }
+    BBox bounds() const override { return {}; }
+    bool occluded(const Ray &r, float, RayCounter *) const override {
+        return r.direction.x > 0.0f;
+    }
+};
+
+TEST(Passes, ShadowRatioAndShadowedMasks) {
+    // Two equal lights at the same distance, the one towards +x blocked: half the light.
+    World w;
+    BlocksPlusX ads;
+    w.scene.setRayTracing(&ads, 0.001f);
+    w.add(oxtest::pointLight({1, 0, 1}, Color::white(), true));
+    w.add(oxtest::pointLight({-1, 0, 1}, Color::white(), true));
+    PhongShader m("m", oxtest::diffuseMaterial(Color(1, 1, 1, 1)));
+    RenderPassSet passes;
+    const Color s = passes.find("shadow")->shade(w.at({0, 0, 0}), m);
+    EXPECT_NEAR(s.r, 0.5f, 1e-6f);
+    EXPECT_EQ(s.a, 1.0f);
+    // "tpDiffuse" is shadowed, "diffuse" and "color" are not.
+    const float e = 1.0f / std::pow(2.0f, 1.5f);
+    EXPECT_NEAR(passes.find("tpDiffuse")->shade(w.at({0, 0, 0}), m).r, e, 1e-5f);
+    EXPECT_NEAR(passes.find("diffuse")->shade(w.at({0, 0, 0}), m).r, 2 * e, 1e-5f);
+    EXPECT_NEAR(passes.find("color")->shade(w.at({0, 0, 0}), m).r, 2 * e, 1e-5f);
+    EXPECT_NEAR(passes.find("beauty")->shade(w.at({0, 0, 0}), m).r, e, 1e-5f);
 }
 
 TEST(Passes, IlluminationModes) {

@@ -26,16 +26,17 @@ private:
     ox::Color color_;
 };
 
-/// A white point light at p with (1 / d)^2 falloff and no shadows.
+/// A point light at p with (1 / d)^2 falloff, without shadows unless asked.
 inline std::unique_ptr<ox::LightSource> pointLight(const ox::Vec3 &p,
-                                                   const ox::Color &c = ox::Color::white()) {
+                                                   const ox::Color &c = ox::Color::white(),
+                                                   bool castShadows = false) {
     ox::LightParameters lp;
     lp.name = "point";
-    lp.type = 0;
+    lp.type = ox::LightType::kPoint;
     lp.color = c;
     lp.falloffExponent = 2.0f;
     lp.decayClampToOne = false;
-    lp.castShadows = false;
+    lp.castShadows = castShadows;
     lp.objectToWorld = ox::Mtx4::translation(p);
     bool shadows = false;
     return ox::createLight(lp, shadows);
@@ -46,7 +47,7 @@ inline std::unique_ptr<ox::LightSource> directionalLight(const ox::Vec3 &towards
                                                          const ox::Color &c = ox::Color::white()) {
     ox::LightParameters lp;
     lp.name = "sun";
-    lp.type = 1;
+    lp.type = ox::LightType::kDirectional;
     lp.color = c;
     lp.castShadows = false;
     // The light shines along its local -y: map local y onto the wanted direction.
