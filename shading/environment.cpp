@@ -65,14 +65,15 @@ Vec2 probeUV(const Vec3 &direction, float rotation, bool swapYZ) {
 
 Color IBLEnvironmentShader::evaluateDirection(const Vec3 &direction) const {
     if (!probe_) return Color(0, 0, 0, 1);
-    return probe_->lookup(probeUV(direction, rotation_, swapYZ_), Vec2(), Vec2());
+    const Vec2 uv = probeUV(direction, rotation_, swapYZ_);
+    return probe_->lookup(TextureLookup{uv.x, uv.y, 0, 0, 0, 0});
 }
 
 Color IBLEnvironmentShader::evaluate(const ShadingContext &ctx) const {
     if (!probe_) return Color(0, 0, 0, 1) * ctx.colorWeight;
     const Vec2 uv = probeUV(ctx.rayDirection, rotation_, swapYZ_);
     const float blur = ctx.isGIRay() && giBlur_ > 0.0f ? giBlur_ : 0.0f;
-    return probe_->lookup(uv, Vec2(blur, 0.0f), Vec2(0.0f, blur)) * ctx.colorWeight;
+    return probe_->lookup(TextureLookup{uv.x, uv.y, blur, 0.0f, 0.0f, blur}) * ctx.colorWeight;
 }
 
 const EnvironmentShaderInterface *Environment::find(const std::string &name) const {
@@ -95,7 +96,8 @@ size_t Environment::size() const {
 }
 
 const EnvironmentShaderInterface *Environment::select(int32_t kind, const EnvironmentValues &values,
-                                                      std::string &error) {
+                                                      std::string &error,
+                                                      TextureFactory *textures) {
     switch (static_cast<EnvironmentKind>(kind)) {
         case EnvironmentKind::kSkyLight: {
             std::string name = "ConstantEnvShader(" + colorText(values.skyLightColor) + ")";
@@ -109,9 +111,19 @@ const EnvironmentShaderInterface *Environment::select(int32_t kind, const Enviro
                 error = "Cannot read the IBL image " + values.iblImageFile;
                 return nullptr;
             }
-            return add(std::make_unique<IBLEnvironmentShader>(name, values.iblImageFile,
-                                                              values.iblTurnDome, values.iblSwapYZ,
-                                                              values.iblGIEnvBlur));
+            auto shader = std::make_unique<IBLEnvironmentShader>(
+                name, values.iblImageFile, values.iblTurnDome, values.iblSwapYZ,
+                values.iblGIEnvBlur);
+            if (textures) {
+                std::unique_ptr<OXTexture> probe =
+                    textures->getTexture(values.iblImageFile, kFilterMipMap);
+                if (!probe) {
+                    error = "Cannot read the IBL image " + values.iblImageFile;
+                    return nullptr;
+                }
+                shader->setProbe(std::move(probe));
+            }
+            return add(std::move(shader));
         }
         default:
             // "None", "Camera" and unknown values: rays leaving the scene see black.
@@ -119,11 +131,12 @@ const EnvironmentShaderInterface *Environment::select(int32_t kind, const Enviro
     }
 }
 
-bool Environment::create(const EnvironmentValues &values, std::string &error) {
+bool Environment::create(const EnvironmentValues &values, std::string &error,
+                         TextureFactory *textures) {
     error.clear();
-    rt_ = select(values.rtEnvironment, values, error);
+    rt_ = select(values.rtEnvironment, values, error, textures);
     if (!error.empty()) return false;
-    gi_ = select(values.giEnvironment, values, error);
+    gi_ = select(values.giEnvironment, values, error, textures);
     return error.empty();
 }
 

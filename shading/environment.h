@@ -7,6 +7,7 @@
 #include <unordered_map>
 
 #include "shading/shader.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 
@@ -53,8 +54,8 @@ public:
     /// footprint of giBlur in u and v.
     Color evaluate(const ShadingContext &ctx) const override;
     /// Sets the probe image (loaded by the texture manager).
-    void setProbe(std::shared_ptr<const ChannelTexture> probe) { probe_ = std::move(probe); }
-    const ChannelTexture *probe() const { return probe_.get(); }
+    void setProbe(std::shared_ptr<const OXTexture> probe) { probe_ = std::move(probe); }
+    const OXTexture *probe() const { return probe_.get(); }
     const std::string &imageFile() const { return imageFile_; }
     /// The rotation in radians.
     float rotation() const { return rotation_; }
@@ -66,7 +67,7 @@ private:
     float rotation_;
     bool swapYZ_;
     float giBlur_;
-    std::shared_ptr<const ChannelTexture> probe_;
+    std::shared_ptr<const OXTexture> probe_;
 };
 
 /// The environment types of the environment settings ("None" 0, "Camera" 1, "SkyLight" 2,
@@ -104,9 +105,11 @@ struct EnvironmentValues {
 /// by name ("ConstantEnvShader(<colour>)", "IBLEnv_<image>").
 class Environment {
 public:
-    /// Makes the shaders the settings select. False (with the reason) when an image-based
-    /// environment names an image that cannot be read.
-    bool create(const EnvironmentValues &values, std::string &error);
+    /// Makes the shaders the settings select; an image-based environment loads its probe
+    /// through textures (when given). False (with the reason) when the probe image cannot be
+    /// read.
+    bool create(const EnvironmentValues &values, std::string &error,
+                TextureFactory *textures = nullptr);
 
     const EnvironmentShaderInterface *rtShader() const { return rt_; }
     const EnvironmentShaderInterface *giShader() const { return gi_; }
@@ -119,7 +122,7 @@ public:
 
 private:
     const EnvironmentShaderInterface *select(int32_t kind, const EnvironmentValues &values,
-                                             std::string &error);
+                                             std::string &error, TextureFactory *textures);
 
     mutable std::mutex mutex_;
     std::unordered_map<std::string, std::unique_ptr<EnvironmentShaderInterface>> shaders_;

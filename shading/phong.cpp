@@ -70,6 +70,23 @@ PhongShadingSample::PhongShadingSample(const PhongParameters &p, const ShadingCo
     }
 }
 
+void loadChannelTextures(const std::string &material, PhongParameters &p,
+                         TextureFactory &textures) {
+    for (int c = 0; c < kPhongChannelCount; ++c) {
+        MaterialChannel &ch = p.channels[c];
+        if (ch.textureFile.empty() || ch.texture) continue;
+        std::unique_ptr<OXTexture> t = textures.getTexture(ch.textureFile, kFilterEWA);
+        if (!t) {
+            message(kMsgWarning, 3,
+                    "Failed to create texture %s for the %s channel of material %s, it will be "
+                    "rendered as black",
+                    ch.textureFile.c_str(), kChannelNames[c], material.c_str());
+            continue;
+        }
+        ch.texture = std::move(t);
+    }
+}
+
 void validatePhongParameters(const std::string &name, PhongParameters &p) {
     auto finite = [&](float &v, float fallback, const char *what) {
         if (std::isfinite(v)) return;

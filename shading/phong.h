@@ -8,6 +8,7 @@
 
 #include "shading/shader.h"
 #include "shading/shading_context.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 
@@ -25,7 +26,7 @@ struct MaterialChannel {
     std::string textureFile;
     /// The loaded texture (null with a file name: the texture failed to load and the channel
     /// answers opaque black).
-    std::shared_ptr<const ChannelTexture> texture;
+    std::shared_ptr<const OXTexture> texture;
     /// Name of the UV set the texture uses instead of the shape's default (empty: none).
     std::string uvLayerOverride;
     /// The UV set of the texture lookup on one shape (-1: the texture's default set).
@@ -98,7 +99,8 @@ inline Color evaluateChannel(const MaterialChannel &ch, const ShadingContext &ct
     } else {
         int set = ch.uvSet;
         if (set < 0 || uint32_t(set) >= ctx.uvSetCount || set >= kMaxShadingUvSets) set = 0;
-        c = ch.texture->lookup(ctx.uv[set], ctx.dUVdx[set], ctx.dUVdy[set]);
+        const Vec2 &uv = ctx.uv[set], &dx = ctx.dUVdx[set], &dy = ctx.dUVdy[set];
+        c = ch.texture->lookup(TextureLookup{uv.x, uv.y, dx.x, dx.y, dy.x, dy.y});
     }
     c.r *= ch.scale, c.g *= ch.scale, c.b *= ch.scale;
     if (ch.clamp) {
@@ -178,6 +180,12 @@ public:
 private:
     PhongParameters parameters_;
 };
+
+/// Loads the texture of every channel that names a file (filter mode EWA). A texture that
+/// cannot be made is reported ("Failed to create texture ..., it will be rendered as black")
+/// and its channel answers opaque black.
+void loadChannelTextures(const std::string &material, PhongParameters &p,
+                         TextureFactory &textures);
 
 /// Checks a material's values once, when it is made: non-finite numbers, swizzle bytes above
 /// 3, negative shininess. Each fault is reported as one warning naming the material and

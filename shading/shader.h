@@ -4,19 +4,11 @@
 
 #include "core/types.h"
 #include "raytrace/camera.h"
+#include "texture/texture.h"
 
 namespace ox {
 
 struct ShadingContext;
-
-/// The image behind a material channel or an environment, looked up at a UV point with the
-/// footprint of the UV derivatives. Shared, read-only while rendering.
-class ChannelTexture {
-public:
-    virtual ~ChannelTexture() = default;
-    /// The colour at uv; dUVdx and dUVdy span the footprint (zero: a point lookup).
-    virtual Color lookup(const Vec2 &uv, const Vec2 &dUVdx, const Vec2 &dUVdy) const = 0;
-};
 
 /// Base of every shader: surface, photon and environment shaders carry a name.
 class ShaderInterfaceBase {

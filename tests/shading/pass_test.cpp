@@ -302,10 +302,13 @@ TEST(Environment, ProbeLookupAndGIBlur) {
     EXPECT_TRUE(bad.x >= 0.0f && bad.x < 1.0f && bad.y >= 0.0f && bad.y <= 1.0f);
 
     // GI rays read the probe with the blur footprint, other rays with none.
-    struct Footprint final : ChannelTexture {
-        Color lookup(const Vec2 &, const Vec2 &dx, const Vec2 &dy) const override {
-            return Color(dx.x, dy.y, 1, 1);
+    struct Footprint final : OXTexture {
+        Color lookup(const TextureLookup &at) const override {
+            return Color(at.dudx, at.dvdy, 1, 1);
         }
+        bool readPixels(const Region &, Color *) const override { return false; }
+        Vec2i resolution() const override { return {1, 1}; }
+        bool isHDR() const override { return false; }
     };
     IBLEnvironmentShader ibl("IBLEnv_p", "p.hdr", 0.0f, false, 0.05f);
     ShadingContext ctx;

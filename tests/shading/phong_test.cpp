@@ -1,6 +1,9 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstdio>
+#include <string>
+#include <vector>
 
 #include "raytrace/complete_grid.h"
 #include "shading/environment.h"
@@ -357,6 +360,58 @@ TEST(PhongShading, DummyAndMissingMaterialAreOpaqueBlack) {
     EXPECT_EQ(d.name(), "dummySurfaceShader");
     EXPECT_EQ(d.shade(w.at({0, 0, 0})), Color(0, 0, 0, 1));
     EXPECT_EQ(d.albedo(w.at({0, 0, 0})), Color(0, 0, 0, 1));
+}
+
+}  // namespace
+}  // namespace ox
+
+namespace ox {
+namespace {
+
+// Writes an uncompressed 24-bit TGA of w x h texels, bottom row first (rgb bytes per texel).
+void writeTga(const std::string &path, int w, int h, const std::vector<uint8_t> &rgb) {
+    std::vector<uint8_t> f(18, 0);
+    f[2] = 2;
+    f[12] = uint8_t(w), f[13] = uint8_t(w >> 8), f[14] = uint8_t(h), f[15] = uint8_t(h >> 8);
+    f[16] = 24;
+    for (size_t i = 0; i + 2 < rgb.size(); i += 3) f.insert(f.end(), {rgb[i + 2], rgb[i + 1], rgb[i]});
+    FILE *out = std::fopen(path.c_str(), "wb");
+    ASSERT_TRUE(out);
+    std::fwrite(f.data(), 1, f.size(), out);
+    std::fclose(out);
+}
+
+TEST(PhongTextures, ChannelsLoadThroughTheTextureManager) {
+    const std::string dir = testing::TempDir();
+    const std::string file = dir + "/phong_texture_test.tga";
+    // Left texel red, right texel blue (one row).
+    writeTga(file, 2, 1, {255, 0, 0, 0, 0, 255});
+    TextureFactory textures;
+    PhongParameters p;
+    p.channels[kPhongDiffuse].textureFile = file;
+    p.channels[kPhongEmissive].textureFile = dir + "/no_such_texture.tga";
+    testing::internal::CaptureStdout();
+    loadChannelTextures("wall", p, textures);
+    const std::string out = testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("Failed to create texture " + dir +
+                       "/no_such_texture.tga for the Emissive channel of material wall, it will "
+                       "be rendered as black"),
+              std::string::npos);
+    ASSERT_TRUE(p.channels[kPhongDiffuse].texture);
+    EXPECT_FALSE(p.channels[kPhongEmissive].texture);
+
+    PhongShader m("wall", p);
+    World w;
+    const Color left = m.albedo(w.at({0.25f, 0.5f, 0}));
+    const Color right = m.albedo(w.at({0.75f, 0.5f, 0}));
+    EXPECT_NEAR(left.r, 1.0f, 1e-3f);
+    EXPECT_NEAR(left.b, 0.0f, 1e-3f);
+    EXPECT_NEAR(right.r, 0.0f, 1e-3f);
+    EXPECT_NEAR(right.b, 1.0f, 1e-3f);
+    // The failed channel shades as opaque black (no light, no emission).
+    MaskPass incandescence("tpIncandescence", kShadeIncandescence | kShadeShadows);
+    EXPECT_EQ(incandescence.shade(w.at({0.25f, 0.5f, 0}), m), Color(0, 0, 0, 1));
+    std::remove(file.c_str());
 }
 
 }  // namespace

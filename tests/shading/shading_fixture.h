@@ -12,14 +12,17 @@
 /// context on the plane z = 0 (normal +z, tangent +x) seen from straight above.
 namespace oxtest {
 
-/// A channel texture of one colour everywhere, counting its lookups.
-class ConstantTexture : public ox::ChannelTexture {
+/// A texture of one colour everywhere that remembers where it was last looked up.
+class ConstantTexture : public ox::OXTexture {
 public:
     explicit ConstantTexture(const ox::Color &c) : color_(c) {}
-    ox::Color lookup(const ox::Vec2 &uv, const ox::Vec2 &, const ox::Vec2 &) const override {
-        lastUv = uv;
+    ox::Color lookup(const ox::TextureLookup &at) const override {
+        lastUv = ox::Vec2(at.u, at.v);
         return color_;
     }
+    bool readPixels(const ox::Region &, ox::Color *) const override { return false; }
+    ox::Vec2i resolution() const override { return {1, 1}; }
+    bool isHDR() const override { return false; }
     mutable ox::Vec2 lastUv;
 
 private:
