@@ -56,7 +56,7 @@ Vec2 probeUV(const Vec3 &direction, float rotation, bool swapYZ) {
     Vec3 d = direction.normalized();
     if (swapYZ) std::swap(d.y, d.z);
     const float y = d.y > 1.0f ? 1.0f : (d.y < -1.0f ? -1.0f : d.y);
-    float u = (std::atan2(d.x, -d.z) + rotation) * (0.5f / kPi) + 0.5f;
+    float u = (std::atan2(d.z, d.x) - rotation) * (0.5f / kPi);
     u -= std::floor(u);
     if (!(u >= 0.0f && u < 1.0f)) u = 0.0f;  // NaN directions and rounding up to 1
     const float v = 0.5f + std::asin(y) / kPi;

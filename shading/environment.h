@@ -37,8 +37,9 @@ private:
     Color upper_, lower_;
 };
 
-/// Where a unit direction meets a latitude-longitude light probe: u runs once around the up
-/// axis (y, or z with swapYZ) starting at -z and turned by rotation (radians), v from 0
+/// Where a unit direction meets a latitude-longitude light probe, the inverse of the image-based
+/// light's layout (probeDirection turned by rotation about y, then y and z swapped with
+/// swapYZ): u turns about the up axis from +x (u = 0) over +z (u = 0.25), v runs from 0
 /// straight down to 1 straight up (row 0 of an image is its bottom row).
 Vec2 probeUV(const Vec3 &direction, float rotation, bool swapYZ);
 

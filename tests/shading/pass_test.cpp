@@ -4,6 +4,7 @@
 
 #include "raytrace/complete_grid.h"
 #include "shading/environment.h"
+#include "shading/light.h"
 #include "shading/pass.h"
 #include "shading/trace.h"
 #include "tests/shading/shading_fixture.h"
@@ -291,15 +292,29 @@ TEST(Environment, RaysLeavingTheSceneSeeTheirEnvironment) {
 }
 
 TEST(Environment, ProbeLookupAndGIBlur) {
-    // The probe's UV for the axes: up is v = 1, down v = 0, -z is u = 0.5 turned by the rotation.
+    // The probe's UV for the axes: up is v = 1, down v = 0, +x u = 0, +z u = 0.25.
     EXPECT_NEAR(probeUV({0, 1, 0}, 0, false).y, 1.0f, 1e-6f);
     EXPECT_NEAR(probeUV({0, -1, 0}, 0, false).y, 0.0f, 1e-6f);
     EXPECT_NEAR(probeUV({0, 0, 1}, 0, true).y, 1.0f, 1e-6f);
-    EXPECT_NEAR(probeUV({0, 0, -1}, 0, false).x, 0.5f, 1e-6f);
-    EXPECT_NEAR(probeUV({1, 0, 0}, 0, false).x, 0.75f, 1e-6f);
-    EXPECT_NEAR(probeUV({0, 0, -1}, 3.14159265f / 2, false).x, 0.75f, 1e-6f);
+    EXPECT_NEAR(probeUV({1, 0, 0}, 0, false).x, 0.0f, 1e-6f);
+    EXPECT_NEAR(probeUV({0, 0, 1}, 0, false).x, 0.25f, 1e-6f);
+    EXPECT_NEAR(probeUV({0, 0, -1}, 3.14159265f / 2, false).x, 0.5f, 1e-6f);
     const Vec2 bad = probeUV({NAN, 0, 0}, 0, false);
     EXPECT_TRUE(bad.x >= 0.0f && bad.x < 1.0f && bad.y >= 0.0f && bad.y <= 1.0f);
+    // The environment sees the probe where the image-based light put it: the inverse of the
+    // light's layout, turned and swapped as the light does.
+    for (float turn : {0.0f, 0.7f})
+        for (bool swap : {false, true})
+            for (float u : {0.1f, 0.3f, 0.6f, 0.95f})
+                for (float v : {0.2f, 0.5f, 0.8f}) {
+                    Vec3 d = probeDirection(u, v);
+                    d = Vec3(d.x * std::cos(turn) - d.z * std::sin(turn), d.y,
+                             d.x * std::sin(turn) + d.z * std::cos(turn));
+                    if (swap) std::swap(d.y, d.z);
+                    const Vec2 uv = probeUV(d, turn, swap);
+                    EXPECT_NEAR(uv.x, u, 1e-5f) << turn << swap << u << v;
+                    EXPECT_NEAR(uv.y, v, 1e-5f) << turn << swap << u << v;
+                }
 
     // GI rays read the probe with the blur footprint, other rays with none.
     struct Footprint final : OXTexture {
