@@ -145,14 +145,15 @@ void BM_Shade(benchmark::State &state) {
         for (int k = 0; k < 256; ++k) {
             const Vec3 &p = points[size_t(n + k) & (kPoints - 1)];
             ctx.beginSample(eye, (p - eye).normalized());
-            ctx.position = p;
-            ctx.geometricNormal = ctx.normal = Vec3(0, 1, 0);
-            ctx.tangent = Vec3(1, 0, 0);
-            ctx.bitangent = Vec3(0, 0, -1);
-            ctx.uvSetCount = 1;
-            ctx.uv[0] = Vec2(p.x * 0.25f, p.z * 0.25f);
-            ctx.dUVdx[0] = Vec2(0.002f, 0);
-            ctx.dUVdy[0] = Vec2(0, 0.002f);
+            SurfacePoint &sp = ctx.surface;
+            sp.position = p;
+            sp.geometricNormal = sp.normal = Vec3(0, 1, 0);
+            sp.tangent = Vec3(1, 0, 0);
+            sp.bitangent = Vec3(0, 0, -1);
+            sp.uvSetCount = 1;
+            sp.uvs[0].uv = Vec2(p.x * 0.25f, p.z * 0.25f);
+            sp.uvs[0].dUVdx = Vec2(0.002f, 0);
+            sp.uvs[0].dUVdy = Vec2(0, 0.002f);
             sum += f.beauty.shade(ctx, *f.material).r;
         }
         cpu += threadSeconds() - t0;

@@ -8,7 +8,9 @@ namespace ox {
 namespace {
 
 // The shading normal on the side the ray arrived from.
-Vec3 facingNormal(const ShadingContext &ctx) { return ctx.backSide ? -ctx.normal : ctx.normal; }
+Vec3 facingNormal(const ShadingContext &ctx) {
+    return ctx.surface.backSide ? -ctx.surface.normal : ctx.surface.normal;
+}
 
 Color blackWithWeight(const ShadingContext &ctx) { return Color(0, 0, 0, ctx.colorWeight.a); }
 
@@ -44,11 +46,11 @@ namespace {
 Color directIllumination(ShadingContext &ctx, const Vec3 &n, bool withShadows) {
     Color sum;
     const uint32_t mask = kShadeDiffuse | kShadeAmbient;
-    forEachLight(ctx, ctx.position, [&](const LightSource &light, uint32_t) {
+    forEachLight(ctx, ctx.surface.position, [&](const LightSource &light, uint32_t) {
         const uint32_t f = lightFlags(light);
         if (diffuseWeight(f, mask, 1.0f) < 0.0f) return;
         LightSample ls;
-        sampleLight(light, ctx, ctx.position, n, withShadows, ls);
+        sampleLight(light, ctx, ctx.surface.position, n, withShadows, ls);
         if (!(ls.color.luminance() > 0.0001f)) return;
         const float c = diffuseWeight(f, mask, ls.cosine);
         if (c > 0.0f) sum += ls.color * c;
@@ -128,14 +130,14 @@ void RnmPass::shadeAll(ShadingContext &ctx, const SurfaceShaderInterface &shader
     }
     // An orthonormal tangent frame of the shading normal, keeping the mesh's handedness.
     const Vec3 nrm = facingNormal(ctx);
-    Vec3 t = ctx.tangent - nrm * dot(nrm, ctx.tangent);
+    Vec3 t = ctx.surface.tangent - nrm * dot(nrm, ctx.surface.tangent);
     if (!(t.lengthSquared() > 1e-12f)) {
         t = std::fabs(nrm.x) < 0.6f ? Vec3(1, 0, 0) : Vec3(0, 1, 0);
         t = t - nrm * dot(nrm, t);
     }
     t.normalize();
     Vec3 b = cross(nrm, t);
-    if (dot(b, ctx.bitangent) < 0.0f) b = -b;
+    if (dot(b, ctx.surface.bitangent) < 0.0f) b = -b;
 
     Color sum[4];
     const RnmSettings &s = settings_;
@@ -155,12 +157,12 @@ void RnmPass::shadeAll(ShadingContext &ctx, const SurfaceShaderInterface &shader
     const float alongNormal[4] = {basis_[0].z, basis_[1].z, basis_[2].z, 1.0f};
 
     if (s.components != RnmSettings::kIndirectLight) {
-        forEachLight(ctx, ctx.position, [&](const LightSource &light, uint32_t) {
+        forEachLight(ctx, ctx.surface.position, [&](const LightSource &light, uint32_t) {
             const uint32_t f = lightFlags(light);
             const uint32_t mask = kShadeDiffuse | kShadeAmbient;
             if (diffuseWeight(f, mask, 1.0f) < 0.0f) return;
             LightSample ls;
-            sampleLight(light, ctx, ctx.position, nrm, true, ls);
+            sampleLight(light, ctx, ctx.surface.position, nrm, true, ls);
             if (!(ls.color.luminance() > 0.0001f)) return;
             if (!(f & kShadeDiffuse)) {
                 add(ls.color, alongNormal);
@@ -206,7 +208,7 @@ void DepthPass::setReference(const Vec3 &position, const Vec3 &normal, float off
 
 Color DepthPass::shade(ShadingContext &ctx, const SurfaceShaderInterface &) const {
     if (!hasReference_) return Color::black();
-    const Vec3 d = ctx.position - position_;
+    const Vec3 d = ctx.surface.position - position_;
     float dist = d.length();
     if (dot(d, normal_) < 0.0f) dist = -dist;
     const float v = (dist + offset_) * scale_;

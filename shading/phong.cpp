@@ -57,14 +57,22 @@ PhongShadingSample::PhongShadingSample(const PhongParameters &p, const ShadingCo
     }
     transparency_ = t;
 
-    normal_ = ctx.normal;
+    const SurfacePoint &sp = ctx.surface;
+    normal_ = sp.normal;
     const MaterialChannel &nc = p.channels[kPhongNormal];
     // A normal channel whose texture failed to load leaves the normal as it is.
-    if (!nc.isConstant() && (nc.useVertexColor || nc.texture))
-        normal_ = applyNormalColor(evaluateChannel(nc, ctx), ctx.normal, ctx.tangent,
-                                   ctx.bitangent);
-    geometricNormal_ = ctx.geometricNormal;
-    if (ctx.backSide && p.twosided) {
+    if (!nc.isConstant() && (nc.useVertexColor || nc.texture)) {
+        // The tangent frame of the channel's UV set (the point's shading frame for set 0 or a
+        // set without tangents).
+        const SurfaceUv &set = sp.uvs[channelUvSet(nc, sp)];
+        const bool own = channelUvSet(nc, sp) != 0 && set.tangent.lengthSquared() > 0.0f &&
+                         set.bitangent.lengthSquared() > 0.0f;
+        normal_ = applyNormalColor(evaluateChannel(nc, ctx), sp.normal,
+                                   own ? set.tangent : sp.tangent,
+                                   own ? set.bitangent : sp.bitangent);
+    }
+    geometricNormal_ = sp.geometricNormal;
+    if (sp.backSide && p.twosided) {
         normal_ = -normal_;
         geometricNormal_ = -geometricNormal_;
     }
@@ -143,7 +151,7 @@ Color PhongShader::shade(ox::ShadingContext &ctx) const {
     if (mask == kShadeNone) return weighted(Color::black(), ctx.colorWeight);
     const PhongShadingSample s(parameters_, ctx);
     const PhongParameters &p = parameters_;
-    const Vec3 &pos = ctx.position;
+    const Vec3 &pos = ctx.surface.position;
     const Vec3 &n = s.normal();
     const bool gi = ctx.isGIRay();
 
@@ -231,12 +239,13 @@ Color PhongShader::shadow(ox::ShadingContext &ctx) const {
     using namespace ox;
     const PhongShadingSample s(parameters_, ctx);
     Color shadowed, unshadowed;
-    forEachLight(ctx, ctx.position, [&](const LightSource &light, uint32_t) {
+    const Vec3 &pos = ctx.surface.position;
+    forEachLight(ctx, pos, [&](const LightSource &light, uint32_t) {
         const float c0 = diffuseWeight(lightFlags(light), kShadeAll, 1.0f);
         if (c0 < 0.0f) return;
         Color sh, un;
         float cosine = 0.0f;
-        sampleLightBoth(light, ctx, ctx.position, s.normal(), sh, un, cosine);
+        sampleLightBoth(light, ctx, pos, s.normal(), sh, un, cosine);
         const float c = diffuseWeight(lightFlags(light), kShadeAll, cosine);
         shadowed += sh * c;
         unshadowed += un * c;

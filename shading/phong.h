@@ -86,21 +86,29 @@ public:
     virtual bool isNormalConstant() const { return true; }
 };
 
+/// The UV set a channel reads at a point: its own set when the point has it, else set 0.
+inline int channelUvSet(const MaterialChannel &ch, const SurfacePoint &sp) {
+    return ch.uvSet > 0 && uint32_t(ch.uvSet) < sp.uvSetCount &&
+                   ch.uvSet < SurfacePoint::kMaxUvSets
+               ? ch.uvSet
+               : 0;
+}
+
 /// Colour of one channel at the context's point: source (vertex colour, texture or constant),
 /// then scale (R, G, B), clamp, invert and swizzle.
 inline Color evaluateChannel(const MaterialChannel &ch, const ShadingContext &ctx) {
     Color c;
+    const SurfacePoint &sp = ctx.surface;
     if (ch.useVertexColor) {
-        c = ctx.hasVertexColor ? ctx.vertexColor : ch.color;
+        c = sp.color;
     } else if (ch.textureFile.empty()) {
         c = ch.color;
     } else if (!ch.texture) {
         c = Color(0, 0, 0, 1);
     } else {
-        int set = ch.uvSet;
-        if (set < 0 || uint32_t(set) >= ctx.uvSetCount || set >= kMaxShadingUvSets) set = 0;
-        const Vec2 &uv = ctx.uv[set], &dx = ctx.dUVdx[set], &dy = ctx.dUVdy[set];
-        c = ch.texture->lookup(TextureLookup{uv.x, uv.y, dx.x, dx.y, dy.x, dy.y});
+        const SurfaceUv &s = sp.uvs[channelUvSet(ch, sp)];
+        c = ch.texture->lookup(
+            TextureLookup{s.uv.x, s.uv.y, s.dUVdx.x, s.dUVdx.y, s.dUVdy.x, s.dUVdy.y});
     }
     c.r *= ch.scale, c.g *= ch.scale, c.b *= ch.scale;
     if (ch.clamp) {

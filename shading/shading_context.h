@@ -5,6 +5,7 @@
 
 #include "core/types.h"
 #include "raytrace/ray.h"
+#include "raytrace/surface_point.h"
 #include "shading/light_context.h"
 
 /// The state one shading call works on: the surface point, the ray that found it and the
@@ -15,15 +16,19 @@
 ///      environments, the optional indirect-light integrator and hit resolver, settings).
 ///   2. Once per thread: a ShadingContext with scene, random and rays set; the rest is
 ///      rewritten per sample.
-///   3. Per sample: beginSample() with the ray (or the bake's view direction), then the surface
-///      fields (position, normals, tangent frame, UV sets, vertex colour, instance, side), and
-///      ask a pass for its colour: pass.shade(ctx, material) (shading/pass.h). A ray that hits
-///      nothing gets environmentColor(ctx) (shading/trace.h).
+///   3. Per sample: beginSample() with the ray (a bake: from above the texel's point along
+///      -normal), then the surface: surfacePoint(ray, hit, instance, ctx.surface) for a hit, or
+///      the texel's position, normals, tangent frame and UV sets for a bake; then ask a pass for
+///      its colour: pass.shade(ctx, material) (shading/pass.h), material =
+///      materialOf(ctx.surface.material)->surface(). A ray that hits nothing gets
+///      environmentColor(ctx) (shading/trace.h).
 /// No shading call allocates or locks; the only virtual calls per sample are the pass's and
 /// the material's `shade`.
 namespace ox {
 
 class ADSInterface;
+class CompleteGrid;
+class Instance;
 class EnvironmentShaderInterface;
 class LightSource;
 class Random;
@@ -45,9 +50,6 @@ enum ShadingComponent : uint32_t {
     kShadeIndirect = 0x100,
     kShadeAll = 0xFFFFFFFFu,
 };
-
-/// UV sets a shading context carries; a material asking for a set beyond those uses set 0.
-constexpr int kMaxShadingUvSets = 8;
 
 /// Indirect light of the global-illumination integrators, as shading asks for it.
 class IndirectLightInterface {
@@ -104,7 +106,13 @@ struct ShadingScene {
     const EnvironmentShaderInterface *giEnvironment = nullptr;
     /// Indirect light of the GI integrators (null: no GI).
     const IndirectLightInterface *indirect = nullptr;
-    /// Surface points of secondary-ray hits (null: secondary rays are not traced).
+    /// The scene's instances by index (the hit's instance index), for the surface points of
+    /// secondary-ray hits; grid is the structure behind ads (moving hits read their corners
+    /// from it). Without instances or a resolver secondary rays see only the environment.
+    const Instance *const *instances = nullptr;
+    uint32_t instanceCount = 0;
+    const CompleteGrid *grid = nullptr;
+    /// Overrides the instances: turns secondary-ray hits into surface points (tests, tools).
     const HitResolverInterface *resolver = nullptr;
     ShadingSettings settings;
 
@@ -129,29 +137,11 @@ struct ShadingScene {
 
 /// One shading call's state. A plain value: filled by the caller, copied for secondary rays.
 struct ShadingContext {
-    // --- The surface point (world space) ---
-    Vec3 position;
-    /// Unit geometric normal of the triangle, on the front side as the mesh winds it.
-    Vec3 geometricNormal{0, 0, 1};
-    /// Unit shading normal (interpolated), on the same side as geometricNormal.
-    Vec3 normal{0, 0, 1};
-    /// Unit tangent and bitangent of the normal-map UV set (their handedness is the mesh's:
-    /// the bitangent may be cross(normal, tangent) or its negation).
-    Vec3 tangent{1, 0, 0};
-    Vec3 bitangent{0, 1, 0};
-    /// UV sets and their change per image x and y (zero for bakes without differentials).
-    Vec2 uv[kMaxShadingUvSets];
-    Vec2 dUVdx[kMaxShadingUvSets];
-    Vec2 dUVdy[kMaxShadingUvSets];
-    uint32_t uvSetCount = 0;
-    /// Vertex colour at the point (meaningful when hasVertexColor).
-    Color vertexColor = Color::white();
-    bool hasVertexColor = false;
-    /// Scene instance hit (light linking) and its RenderStats flag word.
-    uint32_t instance = kNoInstance;
-    uint32_t instanceFlags = 0;
-    /// True when the ray arrived on the back of the surface (against geometricNormal).
-    bool backSide = false;
+    /// The surface point: position, normals (facing the front of the surface), tangent frame,
+    /// UV sets with their derivatives and tangent frames, vertex colour, material, instance,
+    /// its flags and the side the ray came from. surfacePoint() fills it for a ray hit; a bake
+    /// fills it for a texel.
+    SurfacePoint surface;
 
     // --- The ray ---
     Vec3 rayOrigin;
@@ -206,8 +196,6 @@ struct ShadingContext {
         importance = 1.0f;
         singleShadowRay = false;
         useSceneLights();
-        hasVertexColor = false;
-        backSide = false;
     }
     /// Points the light list at the scene's lights.
     void useSceneLights() {
@@ -217,7 +205,7 @@ struct ShadingContext {
     /// True when light index l of the current list reaches the instance hit (light links
     /// apply to the scene's own list only).
     bool lightReaches(uint32_t l) const {
-        return !scene || lights != scene->lights || scene->reaches(instance, l);
+        return !scene || lights != scene->lights || scene->reaches(surface.instanceIndex, l);
     }
     /// The secondary-ray offset (the scene's ray bias).
     float bias() const {

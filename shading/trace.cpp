@@ -1,6 +1,8 @@
 #include "shading/trace.h"
 
 #include "raytrace/complete_grid.h"
+#include "raytrace/surface_point.h"
+#include "shading/material.h"
 #include "shading/shader.h"
 
 namespace ox {
@@ -17,7 +19,8 @@ Color traceSecondary(ShadingContext &child, const Vec3 &origin, const Vec3 &dire
     child.rayDirection = direction;
     child.rayDistance = -1.0f;
     const ShadingScene *scene = child.scene;
-    if (!scene || !scene->ads || !scene->resolver) return environmentColor(child);
+    if (!scene || !scene->ads || (!scene->resolver && !scene->instances))
+        return environmentColor(child);
     Ray ray;
     ray.origin = origin;
     ray.direction = direction;
@@ -25,11 +28,19 @@ Color traceSecondary(ShadingContext &child, const Vec3 &origin, const Vec3 &dire
     Hit hit;
     if (!scene->ads->intersect(ray, hit, child.rays)) return environmentColor(child);
     child.rayDistance = hit.t;
-    child.position = origin + direction * hit.t;
-    child.hasVertexColor = false;
-    child.backSide = false;
     child.useSceneLights();
-    const SurfaceShaderInterface *shader = scene->resolver->resolve(ray, hit, child);
+    const SurfaceShaderInterface *shader = nullptr;
+    if (scene->resolver) {
+        child.surface = SurfacePoint();
+        child.surface.position = origin + direction * hit.t;
+        child.surface.instanceIndex = hit.instance;
+        shader = scene->resolver->resolve(ray, hit, child);
+    } else if (hit.instance < scene->instanceCount && scene->instances[hit.instance] &&
+               surfacePoint(ray, hit, *scene->instances[hit.instance], child.surface,
+                            scene->grid)) {
+        const Material *m = materialOf(child.surface.material);
+        shader = m ? &m->surface() : nullptr;
+    }
     if (!shader) return Color::black();
     return shader->shade(child);
 }

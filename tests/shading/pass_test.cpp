@@ -221,7 +221,7 @@ TEST(Rnm, LightAlongNormalAndSideways) {
         cs.allowNegative = c.negative;
         RnmPass p(cs);
         ShadingContext &ctx = side.at({0, 0, 0});
-        ctx.bitangent = Vec3(0, c.hand, 0);
+        ctx.surface.bitangent = Vec3(0, c.hand, 0);
         p.shadeAll(ctx, rec, out);
         for (int i = 0; i < 3; ++i) EXPECT_NEAR(out[i].g, c.want[i], 1e-5f) << i;
     }

@@ -133,28 +133,26 @@ TEST(PhongChannels, EvaluationSteps) {
         EXPECT_FLOAT_EQ(got.a, c.want.a);
     }
 
-    // Vertex colour (the constant without one), a texture at the chosen UV set (set 0 for a
-    // set the point does not have), a texture that failed to load.
+    // Vertex colour, a texture at the chosen UV set (set 0 for a set the point does not
+    // have), a texture that failed to load.
     MaterialChannel vc;
     vc.useVertexColor = true;
     vc.color = Color(0.1f, 0.1f, 0.1f, 1);
-    EXPECT_EQ(evaluateChannel(vc, ctx), vc.color);
-    ctx.hasVertexColor = true;
-    ctx.vertexColor = Color(0.3f, 0.2f, 0.1f, 1);
-    EXPECT_EQ(evaluateChannel(vc, ctx), ctx.vertexColor);
+    ctx.surface.color = Color(0.3f, 0.2f, 0.1f, 1);
+    EXPECT_EQ(evaluateChannel(vc, ctx), ctx.surface.color);
 
     auto tex = std::make_shared<ConstantTexture>(Color(0.2f, 0.4f, 0.6f, 1));
     MaterialChannel tc;
     tc.textureFile = "t.tga";
     tc.texture = tex;
     tc.uvSet = 1;
-    ctx.uvSetCount = 2;
-    ctx.uv[1] = Vec2(0.25f, 0.75f);
+    ctx.surface.uvSetCount = 2;
+    ctx.surface.uvs[1].uv = Vec2(0.25f, 0.75f);
     EXPECT_EQ(evaluateChannel(tc, ctx), Color(0.2f, 0.4f, 0.6f, 1));
     EXPECT_EQ(tex->lastUv, Vec2(0.25f, 0.75f));
     tc.uvSet = 5;
     evaluateChannel(tc, ctx);
-    EXPECT_EQ(tex->lastUv, ctx.uv[0]);
+    EXPECT_EQ(tex->lastUv, ctx.surface.uvs[0].uv);
     tc.texture.reset();
     EXPECT_EQ(evaluateChannel(tc, ctx), Color(0, 0, 0, 1));
 }
@@ -210,7 +208,7 @@ TEST(PhongNormalMap, FlatAndTiltedInBothHandednesses) {
         World wy;
         wy.add(oxtest::directionalLight({0, hand * std::sin(beta), std::cos(beta)}));
         ShadingContext &ctx = wy.at({0, 0, 0});
-        ctx.bitangent = Vec3(0, hand, 0);
+        ctx.surface.bitangent = Vec3(0, hand, 0);
         EXPECT_NEAR(diffuse.shade(ctx, towardsB).r, std::cos(beta - tilt), 1e-5f);
         const PhongShadingSample s(towardsB.parameters(), ctx);
         EXPECT_NEAR(dot(s.normal(), Vec3(0, 0, 1)), std::cos(tilt), 1e-5f);
@@ -223,7 +221,6 @@ TEST(PhongShading, TwoSidedAndLightLinks) {
     w.add(oxtest::directionalLight({0, 0, -1}));  // lights the back of the plane
     PhongParameters p = oxtest::diffuseMaterial(Color(1, 1, 1, 1));
     ShadingContext &ctx = w.at({0, 0, 0}, {0, 0, 1});
-    ctx.backSide = true;
     EXPECT_NEAR(PhongShader("two", p).shade(ctx).r, 1.0f, 1e-6f);
     p.twosided = false;
     EXPECT_EQ(PhongShader("one", p).shade(ctx).r, 0.0f);
@@ -237,14 +234,12 @@ TEST(PhongShading, TwoSidedAndLightLinks) {
     PhongShader m("m", p);
     for (uint32_t instance : {0u, 1u, 7u}) {
         ShadingContext &c = w.at({0, 0, 0}, {0, 0, 1});
-        c.backSide = true;
-        c.instance = instance;
+        c.surface.instanceIndex = instance;
         EXPECT_EQ(m.shade(c).r, instance == 0 ? 0.0f : 1.0f) << instance;
     }
     w.scene.settings.ignoreLightLinks = true;
     ShadingContext &c = w.at({0, 0, 0}, {0, 0, 1});
-    c.backSide = true;
-    c.instance = 0;
+    c.surface.instanceIndex = 0;
     EXPECT_EQ(m.shade(c).r, 1.0f);
 }
 
@@ -256,7 +251,7 @@ TEST(PhongShading, AmbientLightFeedsAmbientOnly) {
     MaskPass ambient("tpAmbient", kShadeAmbient | kShadeShadows);
     // Cosine 1 whatever the normal; nothing in the diffuse pass.
     ShadingContext &ctx = w.at({0, 0, 0});
-    ctx.normal = Vec3(1, 0, 0);
+    ctx.surface.normal = Vec3(1, 0, 0);
     EXPECT_FLOAT_EQ(ambient.shade(ctx, m).r, 0.25f);
     EXPECT_EQ(diffuse.shade(w.at({0, 0, 0}), m).r, 0.0f);
     EXPECT_FLOAT_EQ(m.shade(w.at({0, 0, 0})).r, 0.25f);
@@ -282,8 +277,8 @@ public:
     explicit SameMaterial(const SurfaceShaderInterface &m) : m_(m) {}
     const SurfaceShaderInterface *resolve(const Ray &ray, const Hit &, ShadingContext &ctx) const override {
         ++count;
-        ctx.geometricNormal = ctx.normal = Vec3(0, 0, 1);
-        ctx.backSide = dot(ray.direction, ctx.geometricNormal) > 0.0f;
+        ctx.surface.geometricNormal = ctx.surface.normal = Vec3(0, 0, 1);
+        ctx.surface.backSide = dot(ray.direction, ctx.surface.geometricNormal) > 0.0f;
         return &m_;
     }
     mutable int count = 0;
@@ -412,6 +407,58 @@ TEST(PhongTextures, ChannelsLoadThroughTheTextureManager) {
     MaskPass incandescence("tpIncandescence", kShadeIncandescence | kShadeShadows);
     EXPECT_EQ(incandescence.shade(w.at({0.25f, 0.5f, 0}), m), Color(0, 0, 0, 1));
     std::remove(file.c_str());
+}
+
+}  // namespace
+}  // namespace ox
+
+#include "raytrace/instance.h"
+#include "raytrace/render_stats.h"
+#include "shading/material.h"
+
+namespace ox {
+namespace {
+
+TEST(PhongSecondary, ReflectionsMeetSceneInstances) {
+    // A glowing quad at z = 1 facing down, seen in a half-reflecting mirror at z = 0: the
+    // mirror shows half of the quad's incandescence; beside the quad, the environment.
+    PhongParameters glow;
+    glow.channels[kPhongEmissive].color = Color(0.5f, 0.25f, 1.0f, 1);
+    MaterialTable table;
+    const Material *m = table.insert(
+        std::make_unique<Material>(std::make_unique<PhongShader>("glow", glow), nullptr));
+    Shape quad("quad");
+    quad.vertices().resize(4, 0, false);
+    const Vec3 corners[4] = {{-1, -1, 1}, {1, -1, 1}, {1, 1, 1}, {-1, 1, 1}};
+    for (uint32_t i = 0; i < 4; ++i) {
+        quad.vertices().setPosition(i, corners[i]);
+        quad.vertices().normal(i) = Vec3(0, 0, -1);
+    }
+    quad.triangles() = {Triangle{{0, 2, 1}, 0}, Triangle{{0, 3, 2}, 0}};
+    quad.materials() = {m};
+    quad.computeBounds();
+    auto instance = Instance::create("quad", Mtx4(), &quad, nullptr, RenderStats::kDefault);
+    ASSERT_TRUE(instance);
+    CompleteGrid grid;
+    ASSERT_TRUE(grid.build({instanceInput(*instance, 0)}, ADSParameters()));
+    const Instance *instances[1] = {instance.get()};
+
+    World w;
+    ConstantEnvironmentShader env("env", Color(0.2f, 0.2f, 0.2f, 1));
+    w.scene.rtEnvironment = &env;
+    w.scene.setRayTracing(&grid, 0.001f);
+    w.scene.grid = &grid;
+    w.scene.instances = instances;
+    w.scene.instanceCount = 1;
+    PhongParameters p;
+    p.channels[kPhongReflection].color = Color(0.5f, 0.5f, 0.5f, 1);
+    PhongShader mirror("mirror", p);
+    const Color c = mirror.shade(w.at({0.2f, 0.1f, 0}, Vec3(0.1f, 0, -1)));
+    EXPECT_NEAR(c.r, 0.25f, 1e-6f);
+    EXPECT_NEAR(c.g, 0.125f, 1e-6f);
+    EXPECT_NEAR(c.b, 0.5f, 1e-6f);
+    const Color out = mirror.shade(w.at({3, 0, 0}, Vec3(1, 0, -1)));
+    EXPECT_NEAR(out.r, 0.1f, 1e-6f);
 }
 
 }  // namespace

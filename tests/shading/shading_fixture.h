@@ -84,12 +84,14 @@ struct World {
         ctx.scene = &scene;
         ctx.random = &random;
         ctx.beginSample(p - dir, dir.normalized());
-        ctx.position = p;
-        ctx.geometricNormal = ctx.normal = ox::Vec3(0, 0, 1);
-        ctx.tangent = ox::Vec3(1, 0, 0);
-        ctx.bitangent = ox::Vec3(0, 1, 0);
-        ctx.uvSetCount = 1;
-        ctx.uv[0] = ox::Vec2(p.x, p.y);
+        ctx.surface = ox::SurfacePoint();
+        ctx.surface.position = p;
+        ctx.surface.geometricNormal = ctx.surface.normal = ox::Vec3(0, 0, 1);
+        ctx.surface.tangent = ox::Vec3(1, 0, 0);
+        ctx.surface.bitangent = ox::Vec3(0, 1, 0);
+        ctx.surface.uvSetCount = 1;
+        ctx.surface.uvs[0].uv = ox::Vec2(p.x, p.y);
+        ctx.surface.backSide = dir.z > 0.0f;
         return ctx;
     }
 };
