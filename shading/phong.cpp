@@ -1,5 +1,6 @@
 #include "shading/phong.h"
 
+#include <algorithm>
 #include <cmath>
 
 #include "core/message.h"
@@ -207,7 +208,7 @@ Color PhongShader::shade(ox::ShadingContext &ctx) const {
         const Color w = s.reflection() * ctx.colorWeight;
         const uint32_t limit = set.reflectionDepth < 10u ? set.reflectionDepth : 10u;
         if (w.luminance() > set.reflectionThreshold && ctx.reflectionDepth < limit &&
-            ctx.rayDepth < set.maxRayDepth) {
+            ctx.rayDepth < std::min(set.maxRayDepth, kMaxSecondaryDepth)) {
             ShadingContext child = ctx;
             child.rayType = gi ? kRayFinalGather : kRayReflection;
             ++child.reflectionDepth;
@@ -221,7 +222,8 @@ Color PhongShader::shade(ox::ShadingContext &ctx) const {
     }
     if ((mask & kShadeRefractions) && t.luminance() > 0.005f) {
         const Color w = t * ctx.colorWeight;
-        const uint32_t limit = gi ? set.giTransparencyDepth : set.transparencyDepth;
+        const uint32_t limit =
+            std::min(gi ? set.giTransparencyDepth : set.transparencyDepth, kMaxSecondaryDepth);
         if (w.luminance() > set.refractionThreshold && ctx.transparencyDepth < limit) {
             ShadingContext child = ctx;
             if (!gi) child.rayType = kRayRefraction;

@@ -51,6 +51,10 @@ enum ShadingComponent : uint32_t {
     kShadeAll = 0xFFFFFFFFu,
 };
 
+/// Deepest secondary ray of any kind, whatever the settings ask: the per-kind depths of a
+/// context are bytes, and every level holds a context on the stack.
+constexpr uint32_t kMaxSecondaryDepth = 255;
+
 /// Indirect light of the global-illumination integrators, as shading asks for it.
 class IndirectLightInterface {
 public:

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <string>
@@ -319,6 +320,15 @@ TEST(PhongSecondary, TransparencyConservesEnergyAndStopsAtTheDepthLimit) {
         EXPECT_NEAR(c.r, 1.0f - std::pow(0.5f, float(limit + 1)), 1e-5f);
         EXPECT_EQ(c.a, 1.0f);
     }
+    // A depth beyond what a context can count stops at 255 layers.
+    p.channels[kPhongTransparency].color = Color(0.99f, 0.99f, 0.99f, 1);
+    PhongShader clear("clear", p);
+    SameMaterial clearResolver(clear);
+    w.scene.resolver = &clearResolver;
+    w.scene.settings.transparencyDepth = 100000;
+    const Color c = clear.shade(w.at({0, 0, 0}));
+    EXPECT_EQ(clearResolver.count, 255);
+    EXPECT_NEAR(c.r, 1.0f - std::pow(0.99f, 256.0f), 1e-4f);
 }
 
 TEST(PhongSecondary, ReflectionsSeeTheEnvironmentUpToTheDepth) {
