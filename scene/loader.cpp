@@ -205,12 +205,12 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
     boxTimer.stop();
     bench("Scene bounding box time: %s", boxTimer);
 
-    auto converter = std::make_unique<ZPXMaterialConverter>(sceneBox);
+    auto converter = std::make_unique<ZPXMaterialConverter>(sceneBox, &scene.textures());
     const ZPXMaterialConverter &materialConverter = *converter;
     scene.setMaterialConverter(std::move(converter));
     {
         std::string why;
-        if (!scene.environment().create(settings.environment, why)) {
+        if (!scene.environment().create(settings.environment, why, &scene.textures())) {
             messageText(kMsgError, 6, "Unable to create environment: " + why);
             return fail("Unable to create environment");
         }

@@ -33,7 +33,9 @@ std::unique_ptr<Material> makePhongMaterial(std::unique_ptr<PhongShader> shader)
 }
 
 std::unique_ptr<Material> ZPXMaterialConverter::convert(const XMLMaterialCompact &record) const {
-    return makePhongMaterial(std::make_unique<PhongShader>(record.name, parameters(record)));
+    PhongParameters p = parameters(record);
+    if (textures_) loadChannelTextures(record.name, p, *textures_);
+    return makePhongMaterial(std::make_unique<PhongShader>(record.name, p));
 }
 
 const Material *SceneMaterialResolver::resolve(const std::string &name,

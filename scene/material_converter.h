@@ -17,8 +17,10 @@ namespace ox {
 /// UV sets named by the material (UVLayerOverride).
 class ZPXMaterialConverter {
 public:
-    /// A converter for a scene of this box.
-    explicit ZPXMaterialConverter(const BBox &sceneBox) : sceneBox_(sceneBox) {}
+    /// A converter for a scene of this box; channel textures load through textures (none are
+    /// loaded without it).
+    explicit ZPXMaterialConverter(const BBox &sceneBox, TextureFactory *textures = nullptr)
+        : sceneBox_(sceneBox), textures_(textures) {}
 
     /// The Phong parameters of a material record.
     static PhongParameters parameters(const XMLMaterialCompact &record);
@@ -29,6 +31,7 @@ public:
 
 private:
     BBox sceneBox_;
+    TextureFactory *textures_;
 };
 
 /// Registers a material made of a surface shader and its photon twin (name + "_photon").

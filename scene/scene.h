@@ -13,6 +13,7 @@
 #include "shading/environment.h"
 #include "shading/light.h"
 #include "shading/material.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 
@@ -80,6 +81,10 @@ public:
     Environment &environment() { return environment_; }
     const Environment &environment() const { return environment_; }
 
+    /// The texture manager of the run: material channels and the environment's probe load
+    /// through it.
+    TextureFactory &textures() { return textures_; }
+
     /// The material converter the loader made (may be null).
     void setMaterialConverter(std::unique_ptr<ZPXMaterialConverter> converter);
     const ZPXMaterialConverter *materialConverter() const { return converter_.get(); }
@@ -108,6 +113,7 @@ private:
     std::vector<uint32_t> shadowedEnv_;
     LightLinkTable links_;
     Environment environment_;
+    TextureFactory textures_;
     std::unique_ptr<ZPXMaterialConverter> converter_;
     float bias_ = 0.005f;
 };
