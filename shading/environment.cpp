@@ -66,14 +66,18 @@ Vec2 probeUV(const Vec3 &direction, float rotation, bool swapYZ) {
 Color IBLEnvironmentShader::evaluateDirection(const Vec3 &direction) const {
     if (!probe_) return Color(0, 0, 0, 1);
     const Vec2 uv = probeUV(direction, rotation_, swapYZ_);
-    return probe_->lookup(TextureLookup{uv.x, uv.y, 0, 0, 0, 0});
+    const Color c = probe_->lookup(TextureLookup{uv.x, uv.y, 0, 0, 0, 0});
+    return std::isfinite(c.r + c.g + c.b + c.a) ? c : Color(0, 0, 0, 1);
 }
 
 Color IBLEnvironmentShader::evaluate(const ShadingContext &ctx) const {
     if (!probe_) return Color(0, 0, 0, 1) * ctx.colorWeight;
     const Vec2 uv = probeUV(ctx.rayDirection, rotation_, swapYZ_);
     const float blur = ctx.isGIRay() && giBlur_ > 0.0f ? giBlur_ : 0.0f;
-    return probe_->lookup(TextureLookup{uv.x, uv.y, blur, 0.0f, 0.0f, blur}) * ctx.colorWeight;
+    const Color c = probe_->lookup(TextureLookup{uv.x, uv.y, blur, 0.0f, 0.0f, blur});
+    // Float probes may hold NaN or infinite texels: they read as black.
+    if (!std::isfinite(c.r + c.g + c.b + c.a)) return Color(0, 0, 0, 1) * ctx.colorWeight;
+    return c * ctx.colorWeight;
 }
 
 const EnvironmentShaderInterface *Environment::find(const std::string &name) const {

@@ -109,6 +109,8 @@ inline Color evaluateChannel(const MaterialChannel &ch, const ShadingContext &ct
         const SurfaceUv &s = sp.uvs[channelUvSet(ch, sp)];
         c = ch.texture->lookup(
             TextureLookup{s.uv.x, s.uv.y, s.dUVdx.x, s.dUVdx.y, s.dUVdy.x, s.dUVdy.y});
+        // Float images may hold NaN or infinite texels: they read as opaque black.
+        if (!std::isfinite(c.r + c.g + c.b + c.a)) c = Color(0, 0, 0, 1);
     }
     c.r *= ch.scale, c.g *= ch.scale, c.b *= ch.scale;
     if (ch.clamp) {

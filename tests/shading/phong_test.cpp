@@ -154,6 +154,8 @@ TEST(PhongChannels, EvaluationSteps) {
     tc.uvSet = 5;
     evaluateChannel(tc, ctx);
     EXPECT_EQ(tex->lastUv, ctx.surface.uvs[0].uv);
+    tc.texture = std::make_shared<ConstantTexture>(Color(0.5f, NAN, 0.5f, 1));
+    EXPECT_EQ(evaluateChannel(tc, ctx), Color(0, 0, 0, 1));
     tc.texture.reset();
     EXPECT_EQ(evaluateChannel(tc, ctx), Color(0, 0, 0, 1));
 }
