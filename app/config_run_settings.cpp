@@ -63,6 +63,7 @@ bool writeResult(bool ok) {
 bool ConfigRunSettings::load(const std::string &file) {
     if (!loadSettings(file, config_)) return false;
     checkLoadedSettings(config_);
+    copyInto(loaded_, config_);
     return true;
 }
 

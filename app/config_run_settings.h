@@ -16,6 +16,9 @@ public:
     OXConfig &config() { return config_; }
     /// The whole configuration tree, for the drivers.
     const OXConfig &config() const { return config_; }
+    /// The configuration as loaded (defaults without a file), before the run changed anything:
+    /// configurations the run writes take the keys the run changes from here.
+    const OXConfig &loaded() const { return loaded_; }
 
     bool load(const std::string &file) override;
     bool writeDefault(const std::string &file) override;
@@ -35,6 +38,7 @@ public:
 
 private:
     OXConfig config_;
+    OXConfig loaded_;
 };
 
 /// The configuration tree behind the run's settings, or nullptr when the run has none.

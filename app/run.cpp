@@ -91,9 +91,10 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
     RioImpl progress(RioImpl::kDefaultStep);
     RunStatistics statistics("Vorn");
     const std::string baseName = options.outputFile.empty() ? "result" : options.outputFile;
+    std::unique_ptr<PreviewObserverInterface> preview;
     auto context = [&](int32_t format, int64_t threads) {
-        return RunContext{options,         *settings, progress, statistics,
-                          outputDirectory, baseName,  format,   threads};
+        return RunContext{options,  *settings, progress, statistics, outputDirectory,
+                          baseName, format,    threads,  &preview};
     };
 
     // Writing defaults and merging files must work without (or despite) a configuration.
@@ -167,6 +168,12 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
     // Statistics and timings are reported whatever the outcome, for diagnosis.
     statistics.print();
     BenchmarkRegistry::instance().report();
+    // After a successful run wait until the preview is closed (-q has aborted the progress
+    // object already, which closes it).
+    if (preview) {
+        if (status == kStatusSuccess) preview->waitUntilClosed(progress);
+        preview.reset();
+    }
     return status;
 }
 

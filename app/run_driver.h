@@ -6,6 +6,7 @@
 #include <string>
 
 #include "app/command_line.h"
+#include "app/preview.h"
 #include "app/run_settings.h"
 #include "core/render_io.h"
 #include "core/run_statistics.h"
@@ -22,6 +23,9 @@ struct RunContext {
     std::string outputBaseName;         ///< outputFile, or "result"
     int32_t format;                     ///< resolved FileFormat (never kFormatNone)
     int64_t renderThreads;              ///< resolved thread count
+    /// The run's preview slot: a driver that shows the frame puts its observer here; the run
+    /// waits for it after a successful run and destroys it (null: no slot).
+    std::unique_ptr<PreviewObserverInterface> *preview = nullptr;
 };
 
 /// One kind of run (camera/bake, vertex bake, merges, split, UV packing...). Returns the run

@@ -1,3 +1,4 @@
+#include "app/camera_bake_driver.h"
 #include "app/config_run_settings.h"
 #include "app/run.h"
 #include "config/input_list.h"
@@ -11,6 +12,7 @@ RunEnvironment defaultRunEnvironment() {
     env.makeSettings = [] { return std::make_unique<ConfigRunSettings>(); };
     env.loadInputList = loadInputList;
     env.processorCount = [] { return processorCount(); };
+    env.drivers.set(kActionSplitConfig, std::make_shared<SplitDriver>());
     return env;
 }
 
