@@ -266,14 +266,14 @@ void ImageSampler::applyEdges(Scratch &s) const {
     for (const EdgeCell &e : s.edges) s.leaves[size_t(e.leaf)].sample.color = e.mixed;
 }
 
-void ImageSampler::filterBlock(Scratch &s, const Tile &tile, int32_t x0, int32_t y0, int32_t x1,
-                               int32_t y1, Color *beauty, float *depth) const {
+void ImageSampler::filterBlock(Scratch &s, int32_t tileX, int32_t tileY, uint32_t rowLength,
+                               int32_t x0, int32_t y0, int32_t x1, int32_t y1, Color *beauty,
+                               float *depth) const {
     const float rx = 0.5f * settings_.filterSize.x, ry = 0.5f * settings_.filterSize.y;
     const float kx = 2.0f / rx, ky = 2.0f / ry;  // kernel offset per pixel
     const float inv = 1.0f / fine_;
     const bool box = filter_ == FilterKind::kBox;
     if (s.stamp.size() < s.leaves.size()) s.stamp.resize(s.leaves.size(), 0);
-    const uint32_t rowLength = tile.width();
     for (int32_t y = y0; y <= y1; ++y) {
         const float pcy = float(y) + 0.5f;
         const float fy0 = pcy - ry, fy1 = pcy + ry;
@@ -328,8 +328,7 @@ void ImageSampler::filterBlock(Scratch &s, const Tile &tile, int32_t x0, int32_t
                 c = boxSum * (1.0f / boxWeight);  // the plain mean
             else
                 c = centre.sample.color;
-            const size_t out =
-                size_t(y - int32_t(tile.yMin)) * rowLength + size_t(x - int32_t(tile.xMin));
+            const size_t out = size_t(y - tileY) * rowLength + size_t(x - tileX);
             beauty[out] = c;
             depth[out] = centre.sample.depth;
         }

@@ -7,7 +7,6 @@
 
 #include "core/types.h"
 #include "render/image_filter.h"
-#include "render/tile.h"
 
 /// The image sampler of camera renders: chooses image points for every pixel of a tile between
 /// the minimum and maximum sample rate, refines where neighbouring samples differ, traces
@@ -111,11 +110,11 @@ public:
     /// The class name ("AdaptiveLDAA", "AdaptiveEdgeSuperSampling").
     virtual const char *name() const = 0;
 
-    /// Samples, shades and filters the pixels of tile (inclusive bounds) into beauty and depth,
-    /// row-major from the tile's first row, tile.width() values per row.
+    /// Samples, shades and filters the pixels of the tile [xMin..xMax] x [yMin..yMax]
+    /// (inclusive) into beauty and depth, row-major from row yMin, xMax - xMin + 1 per row.
     template <class Shader>
-    void renderTile(const Tile &tile, Shader &shader, Scratch &scratch, Color *beauty,
-                    float *depth) const;
+    void renderTile(uint32_t xMin, uint32_t xMax, uint32_t yMin, uint32_t yMax, Shader &shader,
+                    Scratch &scratch, Color *beauty, float *depth) const;
 
     /// Reports the set-up as info messages (rates, sample counts, contrast, filter).
     void reportSetup() const;
@@ -148,8 +147,8 @@ private:
     /// Gives the edge cells their mixed colours.
     void applyEdges(Scratch &s) const;
     /// Filters the block's pixels into the tile's buffers.
-    void filterBlock(Scratch &s, const Tile &tile, int32_t x0, int32_t y0, int32_t x1, int32_t y1,
-                     Color *beauty, float *depth) const;
+    void filterBlock(Scratch &s, int32_t tileX, int32_t tileY, uint32_t rowLength, int32_t x0,
+                     int32_t y0, int32_t x1, int32_t y1, Color *beauty, float *depth) const;
     /// True when two samples differ enough to refine between them.
     bool differs(const ImageSample &a, const ImageSample &b) const;
 
@@ -230,12 +229,12 @@ void ImageSampler::shadePending(Shader &shader, Scratch &s) const {
 }
 
 template <class Shader>
-void ImageSampler::renderTile(const Tile &tile, Shader &shader, Scratch &s, Color *beauty,
-                              float *depth) const {
-    for (uint32_t by = tile.yMin; by <= tile.yMax; by += kSamplerBlock) {
-        const uint32_t by1 = std::min(tile.yMax, by + kSamplerBlock - 1);
-        for (uint32_t bx = tile.xMin; bx <= tile.xMax; bx += kSamplerBlock) {
-            const uint32_t bx1 = std::min(tile.xMax, bx + kSamplerBlock - 1);
+void ImageSampler::renderTile(uint32_t xMin, uint32_t xMax, uint32_t yMin, uint32_t yMax,
+                              Shader &shader, Scratch &s, Color *beauty, float *depth) const {
+    for (uint32_t by = yMin; by <= yMax; by += kSamplerBlock) {
+        const uint32_t by1 = std::min(yMax, by + kSamplerBlock - 1);
+        for (uint32_t bx = xMin; bx <= xMax; bx += kSamplerBlock) {
+            const uint32_t bx1 = std::min(xMax, bx + kSamplerBlock - 1);
             beginBlock(s, int32_t(bx), int32_t(by), int32_t(bx1), int32_t(by1));
             shadePending(shader, s);
             for (int32_t level = 0; level < levels_; ++level) {
@@ -271,11 +270,11 @@ void ImageSampler::renderTile(const Tile &tile, Shader &shader, Scratch &s, Colo
                 s.counters.probes += uint64_t(s.edges.size()) * kEdgeProbes;
                 applyEdges(s);
             }
-            filterBlock(s, tile, int32_t(bx), int32_t(by), int32_t(bx1), int32_t(by1), beauty,
-                        depth);
-            if (bx1 == tile.xMax) break;
+            filterBlock(s, int32_t(xMin), int32_t(yMin), xMax - xMin + 1, int32_t(bx), int32_t(by),
+                        int32_t(bx1), int32_t(by1), beauty, depth);
+            if (bx1 == xMax) break;
         }
-        if (by1 == tile.yMax) break;
+        if (by1 == yMax) break;
     }
 }
 

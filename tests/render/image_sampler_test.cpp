@@ -7,6 +7,8 @@
 #include <cmath>
 #include <vector>
 
+#include "render/tile.h"
+
 namespace {
 
 using ox::Color;
@@ -94,7 +96,8 @@ Image render(const ImageSampler &sampler, Shader &shader, int w, int h, int tile
                       uint32_t(std::min(h, ty + tileSize) - 1), true};
             std::vector<Color> b(tile.width() * tile.height());
             std::vector<float> d(b.size());
-            sampler.renderTile(tile, shader, scratch, b.data(), d.data());
+            sampler.renderTile(tile.xMin, tile.xMax, tile.yMin, tile.yMax, shader, scratch,
+                               b.data(), d.data());
             for (uint32_t y = 0; y < tile.height(); ++y)
                 for (uint32_t x = 0; x < tile.width(); ++x) {
                     const size_t to = size_t(tile.yMin + y) * size_t(w) + tile.xMin + x;
