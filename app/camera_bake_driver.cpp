@@ -9,6 +9,7 @@
 #include "config/xml.h"
 #include "core/message.h"
 #include "core/timer.h"
+#include "platform/file_system.h"
 
 namespace ox {
 namespace {
@@ -147,6 +148,16 @@ int32_t CameraBakeRun::run() {
     for (int32_t t = 0; t < run_->targetCount(); ++t) {
         targets_.push_back(run_->targetName(t));
         if (!checkFileNamePart(targets_.back(), "target name")) return kStatusFailure;
+    }
+    // Images go beside the base name, which may name a directory of its own: it must exist
+    // before anything is rendered, not after.
+    const std::string baseDirectory =
+        FileSystemUtilities::directoryOf(c_.outputDirectory + c_.outputBaseName);
+    if (!baseDirectory.empty() && !FileSystemUtilities::createDirectories(baseDirectory)) {
+        const int code = FileSystemUtilities::lastError();
+        message(kMsgError, 6, "Unable to create the output directory %s: %s", baseDirectory.c_str(),
+                code != 0 ? std::strerror(code) : "unknown error");
+        return kStatusImageWrite;
     }
     // 8. - 10.
     runTimer_.start(true);

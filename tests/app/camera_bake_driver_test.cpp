@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
+#include <fstream>
 
 #include "app/config_run_settings.h"
 #include "app/exit_status.h"
@@ -104,8 +105,8 @@ protected:
     int32_t run(int32_t action = ox::kActionTextureBake) {
         ox::RioImpl progress(ox::RioImpl::kDefaultStep);
         ox::RunStatistics statistics("Vorn");
-        ox::RunContext context{options, settings, progress, statistics, "out/",
-                               "base",  format,   2,        &preview};
+        ox::RunContext context{options,  settings, progress, statistics, "out/",
+                               baseName, format,   2,        &preview};
         ox::CameraBakeDriver driver(factory);
         CaptureStdout();
         const int32_t status = driver.run(action, context);
@@ -121,6 +122,7 @@ protected:
     std::shared_ptr<FakeFactory> factory = std::make_shared<FakeFactory>();
     std::unique_ptr<ox::PreviewObserverInterface> preview;
     int32_t format = ox::kFormatExr;
+    std::string baseName = "base";
     std::string output;
     bool aborted = false;
 };
@@ -221,6 +223,19 @@ TEST_F(DriverTest, FailuresAndAbortsEndTheRunWithTheirStatus) {
 
     factory->writes = false;
     EXPECT_EQ(run(), ox::kStatusImageWrite);
+    factory->writes = true;
+    // The directory of the base name is made before rendering; when it cannot be, nothing
+    // renders.
+    std::ofstream("out/blocked") << "a file";
+    baseName = "blocked/pic";
+    factory->journal.events.clear();
+    EXPECT_EQ(run(), ox::kStatusImageWrite);
+    EXPECT_TRUE(has("[ERROR]    Unable to create the output directory out/blocked/"));
+    EXPECT_EQ(events(), std::vector<std::string>{"prepare 2"});
+    baseName = "sub/pic";
+    EXPECT_EQ(run(), ox::kStatusSuccess);
+    EXPECT_TRUE(std::filesystem::is_directory("out/sub"));
+    baseName = "base";
     factory->writes = true;
     factory->loads = false;
     EXPECT_EQ(run(), ox::kStatusFailure);
