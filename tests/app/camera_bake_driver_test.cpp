@@ -9,8 +9,10 @@
 
 #include "app/config_run_settings.h"
 #include "app/exit_status.h"
+#include "app/frame_writer.h"
 #include "config/xml.h"
 #include "core/render_io_console.h"
+#include "render/frame.h"
 #include "tests/app/app_test_util.h"
 #include "tests/support/test_support.h"
 
@@ -263,6 +265,29 @@ TEST_F(DriverTest, RegionWithoutAreaOnEitherAxisIsRefused) {
     frame.regionTopRight = ox::Vec2i{100, 1};
     EXPECT_EQ(run(ox::kActionRender), ox::kStatusSuccess);
     EXPECT_TRUE(has("[1/3] Rendering t1 [Target 1/3] [Pass 1/1]"));
+}
+
+TEST_F(DriverTest, FramesAreWrittenPerTargetAndLayerOrAllInOneFile) {
+    ox::Frame frame(4, 2);
+    ASSERT_NE(frame.addTiledLayer<ox::Color>("beauty"), nullptr);
+    ASSERT_NE(frame.addTiledLayer<float>("Z"), nullptr);
+    std::vector<ox::Color> pixels(8, ox::Color(0.5f, 0.25f, 1.0f, 1.0f));
+    ASSERT_TRUE(frame.pasteRegion("beauty", ox::Region(0, 0, 4, 2), pixels.data()));
+    ox::FrameTargetWriter writer;
+    const ox::OXConfig config;
+    std::filesystem::create_directories("out");
+    for (int32_t format : {ox::kFormatExr, ox::kFormatJpeg, ox::kFormatTga, ox::kFormatTga24})
+        EXPECT_TRUE(writer.writeLayer(&frame, format, "out/", "pic", "cam", "beauty", config));
+    for (const char *file :
+         {"out/pic_cam_beauty.exr", "out/pic_cam_beauty.jpg", "out/pic_cam_beauty.tga"})
+        EXPECT_TRUE(std::filesystem::exists(file)) << file;
+    // A layer the frame lacks, and a run without a frame, write nothing and succeed.
+    EXPECT_TRUE(writer.writeLayer(&frame, ox::kFormatTga, "out/", "pic", "cam", "tpAO", config));
+    EXPECT_FALSE(std::filesystem::exists("out/pic_cam_tpAO.tga"));
+    EXPECT_TRUE(writer.writeLayer(nullptr, ox::kFormatTga, "out/", "pic", "cam", "beauty", config));
+    EXPECT_TRUE(writer.writeMultiLayer(&frame, "out/pic_cam.exr", config));
+    EXPECT_GT(std::filesystem::file_size("out/pic_cam.exr"), 0u);
+    EXPECT_FALSE(writer.writeMultiLayer(&frame, "missing/pic_cam.exr", config));
 }
 
 class SplitTest : public oxtest::TempDirTest {
