@@ -277,13 +277,15 @@ void ImageSampler::filterBlock(Scratch &s, int32_t tileX, int32_t tileY, uint32_
     for (int32_t y = y0; y <= y1; ++y) {
         const float pcy = float(y) + 0.5f;
         const float fy0 = pcy - ry, fy1 = pcy + ry;
-        const int32_t j0 = std::max(0, int32_t(std::floor((fy0 - s.oy) * inv)) - 1);
-        const int32_t j1 = std::min(s.gh - 1, int32_t(std::floor((fy1 - s.oy) * inv)) + 1);
+        // The cells under the footprint; a cell outside it has no box overlap, and its weight
+        // point lies outside the kernel's support.
+        const int32_t j0 = std::max(0, int32_t(std::floor((fy0 - s.oy) * inv)));
+        const int32_t j1 = std::min(s.gh - 1, int32_t(std::ceil((fy1 - s.oy) * inv)) - 1);
         for (int32_t x = x0; x <= x1; ++x) {
             const float pcx = float(x) + 0.5f;
             const float fx0 = pcx - rx, fx1 = pcx + rx;
-            const int32_t i0 = std::max(0, int32_t(std::floor((fx0 - s.ox) * inv)) - 1);
-            const int32_t i1 = std::min(s.gw - 1, int32_t(std::floor((fx1 - s.ox) * inv)) + 1);
+            const int32_t i0 = std::max(0, int32_t(std::floor((fx0 - s.ox) * inv)));
+            const int32_t i1 = std::min(s.gw - 1, int32_t(std::ceil((fx1 - s.ox) * inv)) - 1);
             if (++s.pixelStamp == 0) {
                 std::fill(s.stamp.begin(), s.stamp.end(), 0u);
                 s.pixelStamp = 1;
