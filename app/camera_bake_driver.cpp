@@ -79,7 +79,7 @@ int32_t CameraBakeRun::run() {
                 describeAction(action_).c_str());
         return kStatusUnsupported;
     }
-    // 1, 2. The working copy takes whatever the scene load changes (the automatic bias), so
+    // The working copy takes whatever the scene load changes (the automatic bias), so
     //       that nothing of it reaches the run's configuration.
     copyInto(work_, settings->config());
     std::string error;
@@ -88,7 +88,7 @@ int32_t CameraBakeRun::run() {
                 c_.options.inputFiles.empty() ? "" : c_.options.inputFiles.front().c_str());
         return kStatusFailure;
     }
-    // 3. Surface transfers pack their light-map UVs first.
+    // Surface transfers pack their light-map UVs first.
     if (action_ == kActionSurfaceTransfer) {
         bool changed = false;
         if (!factory_.packUVs(work_, changed, error)) {
@@ -104,7 +104,7 @@ int32_t CameraBakeRun::run() {
             if (status != kStatusSuccess) return status;
         }
     }
-    // 4. The preview observer. This build has no preview window, so a shown display gets the
+    // The preview observer. This build has no preview window, so a shown display gets the
     //    null observer too, with the gamma the window would use.
     if (c_.preview) {
         if (!*c_.preview) {
@@ -114,13 +114,13 @@ int32_t CameraBakeRun::run() {
         }
         preview_ = c_.preview->get();
     }
-    // 5. The render region, tested per axis.
+    // The render region, tested per axis: an inverted axis has no area either.
     if (work_.FrameSettings.regionRender() && renderRegion(work_.FrameSettings).isEmpty()) {
         message(kMsgError, 6,
                 "Specified render region has no area or lies outside resolution range.");
         return kStatusBadRegionOrImage;
     }
-    // 6. The passes and the run.
+    // The passes and the run.
     run_ = factory_.createRun(action_, work_, c_.renderThreads);
     if (!run_) return kStatusFailure;
     if (action_ == kActionRender) {
@@ -142,7 +142,7 @@ int32_t CameraBakeRun::run() {
     }
     for (const std::string &pass : passes_)
         if (!checkFileNamePart(pass, "pass name")) return kStatusFailure;
-    // 7. Prepare, then check every name that becomes part of a file name before rendering.
+    // Prepare, then check every name that becomes part of a file name before rendering.
     if (const int32_t r = run_->prepare(passes_); stepFailed(r, c_.progress))
         return stopRun(r, c_.progress);
     for (int32_t t = 0; t < run_->targetCount(); ++t) {
@@ -159,14 +159,14 @@ int32_t CameraBakeRun::run() {
                 code != 0 ? std::strerror(code) : "unknown error");
         return kStatusImageWrite;
     }
-    // 8. - 10.
+    // The GI prepasses, then the passes over the targets (unless GI asks for its prepasses
+    // only).
     runTimer_.start(true);
     stepTimer_.start(true);
     if (!skipPrepass_)
         if (const int32_t status = prepassLoop(); status != kStatusSuccess) return status;
     if (!(work_.GISettings.enableGI() && work_.GISettings.renderGIPrepassOnly()))
         if (const int32_t status = mainLoop(); status != kStatusSuccess) return status;
-    // 11.
     runTimer_.stop();
     stepTimer_.stop();
     message(kMsgProgress, 6, "Done rendering! Total render time: %s", runTimer_.format().c_str());
@@ -216,14 +216,14 @@ int32_t CameraBakeRun::mainLoop() {
         for (int32_t t = 0; t < targetCount; ++t) {
             if (io.isAborted()) return stopRun(kRunDone, io);
             const std::string &target = targets_[size_t(t)];
-            // 1. The step line with the time since the run began.
+            // The step line with the time since the run began.
             stepTimer_.stop();
             message(kMsgInfo, 6,
                     "[%d/%d] Rendering %s [Target %d/%d] [Pass %d/%d], total elapsed time: %s",
                     p * targetCount + t + 1, passCount * targetCount, target.c_str(), t + 1,
                     targetCount, p + 1, passCount, stepTimer_.format().c_str());
             stepTimer_.start();
-            // 2., 3. Size the frame, then render.
+            // Size the frame, then render.
             stats.beginTarget(target);
             int32_t r = run_->setupTarget(t);
             if (r == kRunDone) {
@@ -235,20 +235,20 @@ int32_t CameraBakeRun::mainLoop() {
             }
             stats.endTarget();
             if (stepFailed(r, io)) return stopRun(r, io);
-            // 4. The layer of the pass, one file per target and pass.
+            // The layer of the pass, one file per target and pass.
             const int32_t format = c_.format;
             if (format != kFormatExrMultiLayer && format != kFormatNone &&
                 !writer.writeLayer(run_->frame(), format, c_.outputDirectory, c_.outputBaseName,
                                    target, pass, work_))
                 return kStatusImageWrite;
-            // 5. The normalisation's minimum and maximum.
+            // The normalisation's minimum and maximum.
             const std::string minMax = c_.outputDirectory + c_.outputBaseName + "_" + target +
                                        (format == kFormatExrMultiLayer ? "" : "_" + pass) + ".xml";
             if (!writer.writeMinMaxData(run_->frame(), minMax)) return kStatusFailure;
-            // 6. The step is done.
+            // The step is done.
             if (io.isAborted()) return stopRun(kRunDone, io);
             io.clearRelease();
-            // 7. Every layer in one file.
+            // Every layer in one file.
             if (format == kFormatExrMultiLayer &&
                 !writer.writeMultiLayer(
                     run_->frame(), multiLayerFile(c_.outputDirectory, c_.outputBaseName, target),
