@@ -1,6 +1,7 @@
 #include "app/camera_bake_driver.h"
 #include "app/config_run_settings.h"
 #include "app/run.h"
+#include "app/scene_run_factory.h"
 #include "config/input_list.h"
 #include "platform/system.h"
 
@@ -13,6 +14,9 @@ RunEnvironment defaultRunEnvironment() {
     env.loadInputList = loadInputList;
     env.processorCount = [] { return processorCount(); };
     env.drivers.set(kActionSplitConfig, std::make_shared<SplitDriver>());
+    auto cameraBake = std::make_shared<CameraBakeDriver>(std::make_shared<SceneRunFactory>());
+    for (int32_t action : {kActionRender, kActionTextureBake, kActionSurfaceTransfer})
+        env.drivers.set(action, cameraBake);
     return env;
 }
 

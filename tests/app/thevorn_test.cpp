@@ -107,11 +107,11 @@ TEST_F(Thevorn, WritesDefaultsAndSchemaAsked) {
 
 TEST_F(Thevorn, LinesThatLetTheRunGoOnTheOutputTreeAndStatuses) {
     oxtest::RunResult r = run({"scene.xml", "-rt", "abc", "-p", "x", "-od", "deep/er/out", "-d"});
-    EXPECT_EQ(r.status, 4) << r.output;  // no driver for the camera render yet
+    EXPECT_EQ(r.status, 1) << r.output;  // 0x20000000: the scene cannot be read
     EXPECT_TRUE(has(r, "Syntax error, abc is not a valid input to -rt\n"));
     EXPECT_TRUE(has(r, "Syntax error, x is not a valid priority (h, l or n).\n"));
     EXPECT_FALSE(has(r, "The render thread count"));  // a bad -rt leaves the automatic count
-    EXPECT_TRUE(has(r, "[ERROR]    The camera render (-r) is not available"));
+    EXPECT_TRUE(has(r, "[ERROR]    Unable to read the scene file scene.xml: scene.xml\n"));
     EXPECT_FALSE(has(r, "[ERROR]    thevorn <scene.xml>"));
     for (const char *sub : {"", "/GI", "/GI/fgMaps", "/GI/ptMaps", "/GI/photonMaps", "/GI/occMaps"})
         EXPECT_TRUE(fs::is_directory(dir_ / ("deep/er/out" + std::string(sub)))) << sub;

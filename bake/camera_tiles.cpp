@@ -1,0 +1,142 @@
+#include "bake/camera_tiles.h"
+
+#include <algorithm>
+#include <cmath>
+#include <vector>
+
+#include "raytrace/camera.h"
+#include "raytrace/complete_grid.h"
+#include "raytrace/instance.h"
+#include "render/frame.h"
+#include "render/tile_renderer.h"
+#include "scene/scene.h"
+
+namespace ox {
+namespace {
+
+/// One render thread's sample shader: camera ray, closest hit, surface shade.
+struct CameraSampleShader {
+    const CameraTileScene *scene = nullptr;
+    float invWidth = 1.0f, invHeight = 1.0f;
+    RayCounter rays;
+
+    ImageSample shade(float x, float y, Vec2 lens, float time) {
+        Ray ray;
+        scene->camera->generateRay(Vec2{x * invWidth, y * invHeight}, lens, ray);
+        ray.time = time;
+        Hit hit;
+        ImageSample sample;
+        if (ray.type == kRayEnvironment || !scene->grid->intersect(ray, hit, &rays)) {
+            // Nothing was hit: the pixel stays transparent.
+            return sample;
+        }
+        sample.color = shadeHit(ray, hit);
+        sample.depth = hit.t * ray.direction.length();
+        sample.object = int32_t(hit.instance);
+        return sample;
+    }
+
+    /// The colour of a hit. Until the materials shade, the surface shows how squarely it faces
+    /// the camera (the cosine between its normal and the ray), in grey.
+    Color shadeHit(const Ray &ray, const Hit &hit) const {
+        const auto &instances = scene->scene->instances();
+        float facing = 1.0f;
+        if (hit.instance < instances.size() && !hit.moving) {
+            const Instance &instance = *instances[hit.instance];
+            if (hit.id < instance.shape().triangleCount()) {
+                const Vec3 n = instance.normalToWorld(instance.shape().faceNormal(hit.id));
+                const float l = n.length() * ray.direction.length();
+                if (l > 0.0f) facing = std::fabs(dot(n, ray.direction)) / l;
+            }
+        }
+        return Color(facing, facing, facing, 1.0f);
+    }
+
+    int32_t object(float x, float y) {
+        Ray ray;
+        scene->camera->generateRay(Vec2{x * invWidth, y * invHeight}, Vec2{0.5f, 0.5f}, ray);
+        Hit hit;
+        if (ray.type == kRayEnvironment || !scene->grid->intersect(ray, hit, &rays)) return -1;
+        return int32_t(hit.instance);
+    }
+};
+
+/// The tile run of one pass: per-thread shaders, scratch and tile buffers.
+class CameraTiles final : public TileRenderer {
+public:
+    CameraTiles(const CameraTileScene &scene, Frame &frame, const std::string &layer)
+        : scene_(scene), frame_(frame), layer_(layer) {}
+
+    RayCounter rays;
+    ImageSampler::Counters samples;
+
+protected:
+    bool prepare(int threadCount) override {
+        threads_.clear();
+        threads_.resize(size_t(threadCount));
+        for (Thread &t : threads_) {
+            CameraSampleShader &s = t.shader;
+            s.scene = &scene_;
+            s.invWidth = 1.0f / float(frame_.width());
+            s.invHeight = 1.0f / float(frame_.height());
+        }
+        return true;
+    }
+
+    bool renderTile(int threadIndex, const Tile &tile) override {
+        Thread &t = threads_[size_t(threadIndex)];
+        const size_t n = size_t(tile.width()) * tile.height();
+        t.beauty.resize(n);
+        t.depth.resize(n);
+        scene_.sampler->renderTile(tile.xMin, tile.xMax, tile.yMin, tile.yMax, t.shader, t.scratch,
+                                   t.beauty.data(), t.depth.data());
+        const Region region(int32_t(tile.xMin), int32_t(tile.yMin), int32_t(tile.xMax) + 1,
+                            int32_t(tile.yMax) + 1);
+        return frame_.pasteRegion(layer_, region, t.beauty.data()) &&
+               frame_.pasteRegion("Z", region, t.depth.data());
+    }
+
+    void threadFinished(int threadIndex) override {
+        Thread &t = threads_[size_t(threadIndex)];
+        rays.merge(t.shader.rays);
+        samples.merge(t.scratch.counters);
+    }
+
+    void release() override { threads_.clear(); }
+
+private:
+    struct Thread {
+        CameraSampleShader shader;
+        ImageSampler::Scratch scratch;
+        std::vector<Color> beauty;
+        std::vector<float> depth;
+    };
+
+    const CameraTileScene &scene_;
+    Frame &frame_;
+    const std::string &layer_;
+    std::vector<Thread> threads_;
+};
+
+}  // namespace
+
+bool renderCameraTiles(const CameraTileRun &run, const CameraTileScene &scene, Frame &frame,
+                       const std::string &layer, RenderIOInterface &io, RayCounter &rays,
+                       ImageSampler::Counters &samples) {
+    TileRunSettings settings;
+    settings.xMin = run.xMin;
+    settings.xMax = run.xMax;
+    settings.yMin = run.yMin;
+    settings.yMax = run.yMax;
+    settings.tileWidth = run.tileWidth;
+    settings.tileHeight = run.tileHeight;
+    settings.scheme = run.scheme;
+    settings.threadCount = run.threadCount;
+    CameraTiles tiles(scene, frame, layer);
+    const bool ok = tiles.run(settings, io);
+    rays.merge(tiles.rays);
+    samples.merge(tiles.samples);
+    return ok;
+}
+
+}  // namespace ox
