@@ -10,6 +10,7 @@
 #include "raytrace/complete_grid.h"
 #include "render/frame.h"
 #include "scene/scene.h"
+#include "scene/shading_setup.h"
 
 namespace ox {
 
@@ -53,18 +54,36 @@ int32_t CameraRender::prepare(const std::vector<std::string> &passes) {
         message(kMsgWarning, 6, "Camera '%s' not found in the scene, rendering with camera '%s'.",
                 wanted.c_str(), camera_->name().c_str());
     }
-    // The passes: the surfaces shade one way until the materials' passes arrive.
-    for (const std::string &name : passes)
-        if (name != "beauty") {
+    // The passes.
+    passNames_ = passes;
+    passes_.clear();
+    for (const std::string &name : passes) {
+        RenderPass *pass = passSet_.find(name);
+        if (!pass) {
             message(kMsgError, 6, "The pass '%s' cannot be rendered by a camera render.",
                     name.c_str());
             return kRunHardError;
         }
-    passNames_ = passes;
+        passes_.push_back(pass);
+    }
     if (config_.GISettings.enableGI())
         message(kMsgWarning, 6,
                 "Global illumination is not available in this build: rendering direct light "
                 "only.");
+    // What shading reads, shared by every thread.
+    const RenderSettingsBase &render = config_.RenderSettings;
+    ShadingSettings settings;
+    settings.maxRayDepth = render.maxRayDepth();
+    settings.reflectionDepth = render.reflectionDepth();
+    settings.refractionDepth = render.refractionDepth();
+    settings.transparencyDepth = render.transparencyDepth();
+    settings.giTransparencyDepth = render.giTransparencyDepth();
+    settings.shadowDepth = render.shadowDepth();
+    settings.reflectionThreshold = render.reflectionThreshold();
+    settings.refractionThreshold = render.refractionThreshold();
+    settings.ignoreLightLinks = render.ignoreLightLinks();
+    shading_ = std::make_unique<SceneShading>(scene_, &grid_, settings, render.minShadowRays(),
+                                              render.maxShadowRays());
     // The image sampler.
     sampler_ = createImageSampler(imageSamplerSettings(
         config_, camera_->lensSwitch() != 0 ? config_.AASettings.dofSamples() : 0u));
@@ -94,7 +113,7 @@ int32_t CameraRender::setupTarget(int32_t) {
 }
 
 int32_t CameraRender::renderTarget(int32_t pass, RenderIOInterface &io) {
-    if (!frame_ || pass < 0 || size_t(pass) >= passNames_.size()) return kRunHardError;
+    if (!frame_ || pass < 0 || size_t(pass) >= passes_.size()) return kRunHardError;
     const std::string &layer = passNames_[size_t(pass)];
     if (!frame_->getColorLayer(layer) && !frame_->addTiledLayer<Color>(layer)) return kRunHardError;
     if (region_.isEmpty()) return kRunDone;
@@ -108,16 +127,17 @@ int32_t CameraRender::renderTarget(int32_t pass, RenderIOInterface &io) {
     tiles.tileHeight = f.tileSize().y;
     tiles.scheme = f.tileScheme.value();
     tiles.threadCount = int32_t(std::min<int64_t>(threads_, 1024));
-    const CameraTileScene scene{&scene_, &grid_, camera_, sampler_.get()};
+    const CameraTileScene scene{&scene_, &grid_, camera_, sampler_.get(), &shading_->scene()};
     RayCounter rays;
     ImageSampler::Counters samples;
     io.setProgressTitle("Rendering " + layer);
-    const bool ok = renderCameraTiles(tiles, scene, *frame_, layer, io, rays, samples);
+    const bool ok =
+        renderCameraTiles(tiles, scene, *passes_[size_t(pass)], *frame_, layer, io, rays, samples);
     io.finish();
     rays_.merge(rays);
     samples_.merge(samples);
     runSamples_.merge(samples);
-    if (size_t(pass) + 1 == passNames_.size() && !reportedEnd_) {
+    if (size_t(pass) + 1 == passes_.size() && !reportedEnd_) {
         sampler_->reportEnd(runSamples_);
         reportedEnd_ = true;
     }

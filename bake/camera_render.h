@@ -8,16 +8,19 @@
 #include "bake/camera_tiles.h"
 #include "bake/render_run.h"
 #include "render/image_sampler.h"
+#include "shading/pass.h"
+#include "shading/shading_context.h"
 
 /// The camera render: the image sampler over the tile renderer, primary rays from the scene's
-/// camera, into the colour layer of the pass ("beauty") and the depth layer "Z" of a frame of
-/// the configured resolution.
+/// camera, shading through the materials, lights and passes, into the layers "beauty" (named
+/// by the pass) and "Z" of a frame of the configured resolution.
 namespace ox {
 
 class Camera;
 class CompleteGrid;
 class OXConfigBase;
 class Scene;
+class SceneShading;
 
 /// The settings of the image sampler from the antialiasing and render settings; lensSamples
 /// from the camera's lens (0 without depth of field).
@@ -50,6 +53,9 @@ private:
     int64_t threads_;
     const Camera *camera_ = nullptr;
     std::unique_ptr<ImageSampler> sampler_;
+    std::unique_ptr<SceneShading> shading_;
+    RenderPassSet passSet_;
+    std::vector<RenderPass *> passes_;
     std::vector<std::string> passNames_;
     std::unique_ptr<Frame> frame_;
     Region region_;

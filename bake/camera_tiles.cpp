@@ -1,55 +1,58 @@
 #include "bake/camera_tiles.h"
 
 #include <algorithm>
-#include <cmath>
 #include <vector>
 
 #include "raytrace/camera.h"
 #include "raytrace/complete_grid.h"
 #include "raytrace/instance.h"
+#include "raytrace/surface_point.h"
 #include "render/frame.h"
 #include "render/tile_renderer.h"
 #include "scene/scene.h"
+#include "shading/material.h"
+#include "shading/pass.h"
+#include "shading/trace.h"
 
 namespace ox {
 namespace {
 
-/// One render thread's sample shader: camera ray, closest hit, surface shade.
+/// One render thread's sample shader: camera ray, closest hit, surface point, pass.
 struct CameraSampleShader {
     const CameraTileScene *scene = nullptr;
+    const RenderPass *pass = nullptr;
     float invWidth = 1.0f, invHeight = 1.0f;
+    ShadingContext ctx;
     RayCounter rays;
 
     ImageSample shade(float x, float y, Vec2 lens, float time) {
         Ray ray;
         scene->camera->generateRay(Vec2{x * invWidth, y * invHeight}, lens, ray);
         ray.time = time;
+        ctx.beginSample(ray.origin, ray.direction, kRayPrimary);
+        ctx.time = time;
         Hit hit;
         ImageSample sample;
         if (ray.type == kRayEnvironment || !scene->grid->intersect(ray, hit, &rays)) {
-            // Nothing was hit: the pixel stays transparent.
+            // The environment shows through; the pixel stays transparent.
+            sample.color = environmentColor(ctx);
+            sample.color.a = 0.0f;
             return sample;
         }
-        sample.color = shadeHit(ray, hit);
-        sample.depth = hit.t * ray.direction.length();
-        sample.object = int32_t(hit.instance);
-        return sample;
-    }
-
-    /// The colour of a hit. Until the materials shade, the surface shows how squarely it faces
-    /// the camera (the cosine between its normal and the ray), in grey.
-    Color shadeHit(const Ray &ray, const Hit &hit) const {
         const auto &instances = scene->scene->instances();
-        float facing = 1.0f;
-        if (hit.instance < instances.size() && !hit.moving) {
-            const Instance &instance = *instances[hit.instance];
-            if (hit.id < instance.shape().triangleCount()) {
-                const Vec3 n = instance.normalToWorld(instance.shape().faceNormal(hit.id));
-                const float l = n.length() * ray.direction.length();
-                if (l > 0.0f) facing = std::fabs(dot(n, ray.direction)) / l;
+        const float distance = hit.t * ray.direction.length();
+        sample.color = Color(0.0f, 0.0f, 0.0f, 1.0f);
+        if (hit.instance < instances.size() &&
+            surfacePoint(ray, hit, *instances[hit.instance], ctx.surface, scene->grid)) {
+            if (const Material *material = materialOf(ctx.surface.material)) {
+                ctx.rayDistance = distance;
+                sample.color = pass->shade(ctx, material->surface());
+                sample.color.a = 1.0f;
             }
         }
-        return Color(facing, facing, facing, 1.0f);
+        sample.depth = distance;
+        sample.object = int32_t(hit.instance);
+        return sample;
     }
 
     int32_t object(float x, float y) {
@@ -64,8 +67,9 @@ struct CameraSampleShader {
 /// The tile run of one pass: per-thread shaders, scratch and tile buffers.
 class CameraTiles final : public TileRenderer {
 public:
-    CameraTiles(const CameraTileScene &scene, Frame &frame, const std::string &layer)
-        : scene_(scene), frame_(frame), layer_(layer) {}
+    CameraTiles(const CameraTileScene &scene, const RenderPass &pass, Frame &frame,
+                const std::string &layer)
+        : scene_(scene), pass_(pass), frame_(frame), layer_(layer) {}
 
     RayCounter rays;
     ImageSampler::Counters samples;
@@ -77,14 +81,18 @@ protected:
         for (Thread &t : threads_) {
             CameraSampleShader &s = t.shader;
             s.scene = &scene_;
+            s.pass = &pass_;
             s.invWidth = 1.0f / float(frame_.width());
             s.invHeight = 1.0f / float(frame_.height());
+            s.ctx.scene = scene_.shading;
+            s.ctx.rays = &s.rays;
         }
         return true;
     }
 
     bool renderTile(int threadIndex, const Tile &tile) override {
         Thread &t = threads_[size_t(threadIndex)];
+        t.shader.ctx.random = &tileRandom(threadIndex);
         const size_t n = size_t(tile.width()) * tile.height();
         t.beauty.resize(n);
         t.depth.resize(n);
@@ -113,6 +121,7 @@ private:
     };
 
     const CameraTileScene &scene_;
+    const RenderPass &pass_;
     Frame &frame_;
     const std::string &layer_;
     std::vector<Thread> threads_;
@@ -120,9 +129,9 @@ private:
 
 }  // namespace
 
-bool renderCameraTiles(const CameraTileRun &run, const CameraTileScene &scene, Frame &frame,
-                       const std::string &layer, RenderIOInterface &io, RayCounter &rays,
-                       ImageSampler::Counters &samples) {
+bool renderCameraTiles(const CameraTileRun &run, const CameraTileScene &scene,
+                       const RenderPass &pass, Frame &frame, const std::string &layer,
+                       RenderIOInterface &io, RayCounter &rays, ImageSampler::Counters &samples) {
     TileRunSettings settings;
     settings.xMin = run.xMin;
     settings.xMax = run.xMax;
@@ -132,7 +141,7 @@ bool renderCameraTiles(const CameraTileRun &run, const CameraTileScene &scene, F
     settings.tileHeight = run.tileHeight;
     settings.scheme = run.scheme;
     settings.threadCount = run.threadCount;
-    CameraTiles tiles(scene, frame, layer);
+    CameraTiles tiles(scene, pass, frame, layer);
     const bool ok = tiles.run(settings, io);
     rays.merge(tiles.rays);
     samples.merge(tiles.samples);

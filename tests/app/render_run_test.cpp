@@ -1,5 +1,5 @@
-// Camera renders through the built program: the pixels a triangle covers and their depth, the
-// camera fall-back, and the files and statistics a render leaves.
+// Camera renders through the built program: the pixels a triangle covers, a plane lit by a
+// point light against its closed form, the camera fall-back, and the files a render leaves.
 #include <ImfChannelList.h>
 #include <ImfFrameBuffer.h>
 #include <ImfHeader.h>
@@ -150,6 +150,74 @@ TEST_F(RenderRun, TriangleCoversThePixelsItsProjectionCovers) {
         }
     EXPECT_GT(covered, 8);
     EXPECT_LT(covered, 40);
+}
+
+TEST_F(RenderRun, PlaneUnderAPointLightFollowsTheInverseSquareCosineLaw) {
+    mesh("thing.vtm", "thing",
+         {{-10, -10, 0}, {10, -10, 0}, {10, 10, 0}, {-10, -10, 0}, {10, 10, 0}, {-10, 10, 0}});
+    scene(
+        "<Camera><Name>top</Name><Type>ORTHO</Type><ImagePlaneSize><x>8</x><y>8</y>"
+        "</ImagePlaneSize><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r><c>0</c><c>1</c>"
+        "<c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>1</c><c>0</c></r><r><c>0</c><c>0</c><c>5</c>"
+        "<c>1</c></r></ObjectToWorld></Camera>\n"
+        "<LightSource><Name>bulb</Name><Type>POINT</Type><Color><r>1</r><g>1</g><b>1</b><a>1</a>"
+        "</Color><FalloffExponent>2</FalloffExponent><DecayClampToOne>false</DecayClampToOne>"
+        "<CastShadows>false</CastShadows><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r>"
+        "<r><c>0</c><c>1</c><c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>1</c><c>0</c></r>"
+        "<r><c>0</c><c>0</c><c>2</c><c>1</c></r></ObjectToWorld></LightSource>\n");
+    config("top");
+    const auto r = run({"-x", "render.xml", "-r", "-me", "-q", "-o", "plane", "-rt", "2"});
+    ASSERT_EQ(r.status, 0) << r.output;
+    Layers img;
+    ASSERT_TRUE(readLayers("plane_top.exr", img));
+    const double h = 2.0;
+    for (int y = 0; y < 8; ++y)
+        for (int x = 0; x < 8; ++x) {
+            const double px = -4.0 + x + 0.5, py = -4.0 + y + 0.5;
+            const double expected = h / std::pow(h * h + px * px + py * py, 1.5);
+            EXPECT_NEAR(img.r[img.at(x, y)], expected, 0.005 * expected) << x << "," << y;
+        }
+}
+
+TEST_F(RenderRun, SoftShadowsGiveTheSameBytesWhateverTheThreadCount) {
+    // A plane, a triangle above it and an area light: shadow rays draw random numbers.
+    mesh("thing.vtm", "thing",
+         {{-10, -10, 0},
+          {10, -10, 0},
+          {10, 10, 0},
+          {-10, -10, 0},
+          {10, 10, 0},
+          {-10, 10, 0},
+          {-1, -1, 1},
+          {1.5f, -0.5f, 1},
+          {0, 1.5f, 1}});
+    scene(
+        "<Camera><Name>top</Name><Type>ORTHO</Type><ImagePlaneSize><x>8</x><y>8</y>"
+        "</ImagePlaneSize><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r><c>0</c><c>1</c>"
+        "<c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>1</c><c>0</c></r><r><c>0</c><c>0</c><c>5</c>"
+        "<c>1</c></r></ObjectToWorld></Camera>\n"
+        "<LightSource><Name>panel</Name><Type>AREA</Type><Color><r>4</r><g>4</g><b>4</b><a>1</a>"
+        "</Color><FalloffExponent>2</FalloffExponent><CastShadows>true</CastShadows>"
+        "<ShadowSamples>8</ShadowSamples><ObjectToWorld><r><c>0.7</c><c>0</c><c>0</c><c>0</c></r>"
+        "<r><c>0</c><c>-0.7</c><c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>-1</c><c>0</c></r>"
+        "<r><c>3</c><c>0</c><c>3</c><c>1</c></r></ObjectToWorld></LightSource>\n");
+    std::ofstream("render.xml")
+        << "<?xml version=\"1.0\"?>\n<OXConfig><FrameSettings><resolution><x>24</x><y>24</y>"
+           "</resolution><tileSize><x>5</x><y>5</y></tileSize><cameraName>top</cameraName>"
+           "</FrameSettings><AASettings><minSampleRate>-1</minSampleRate>"
+           "<maxSampleRate>1</maxSampleRate></AASettings></OXConfig>\n";
+    Layers one, three;
+    for (const auto &[threads, name] : {std::pair{"1", "one"}, std::pair{"3", "three"}}) {
+        const auto r = run({"-x", "render.xml", "-r", "-me", "-q", "-o", name, "-rt", threads});
+        ASSERT_EQ(r.status, 0) << r.output;
+    }
+    ASSERT_TRUE(readLayers("one_top.exr", one));
+    ASSERT_TRUE(readLayers("three_top.exr", three));
+    EXPECT_EQ(one.r, three.r);
+    EXPECT_EQ(one.z, three.z);
+    // The shadow falls on the plane left of the triangle (x = -2, y = 0), away from the light:
+    // darker than a point farther from the light beside it (x = -2, y = -3.3).
+    EXPECT_LT(one.r[one.at(6, 12)], 0.5f * one.r[one.at(6, 2)]);
 }
 
 TEST_F(RenderRun, MissingCameraFallsBackToTheFirstAndWarnsOnce) {
