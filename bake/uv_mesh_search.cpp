@@ -153,7 +153,7 @@ UvHit UvMeshSearch::find(float x, float y) const {
         barycentrics(t, x, y, b1, b2);
         if (b1 >= -kEdgeEps && b2 >= -kEdgeEps && b1 + b2 <= 1.0f + kEdgeEps) {
             if (!hit.found() || t.preferred) {
-                hit = {t.shape, t.triangle, b1, b2};
+                hit = {t.shape, t.triangle, b1, b2, cellTris_[k]};
                 if (t.preferred) return hit;
             }
         }
@@ -215,7 +215,8 @@ UvHit UvMeshSearch::findNear(float x, float y, float reach, bool clampToTriangle
                      (d2 < bestD2 || (d2 == bestD2 && index < bestIndex)));
                 if (!better) continue;
                 bestIndex = index, bestD2 = d2, bestPreferred = t.preferred;
-                best = {t.shape, t.triangle, clampToTriangle ? n1 : b1, clampToTriangle ? n2 : b2};
+                best = {t.shape, t.triangle, clampToTriangle ? n1 : b1, clampToTriangle ? n2 : b2,
+                        index};
             }
         }
     return best;
@@ -231,15 +232,6 @@ UvCoverage UvMeshSearch::coverage() const {
             if (countContaining(px, py) > 1) ++c.overlapping;
         }
     return c;
-}
-
-void UvMeshSearch::corners(const UvHit &hit, Vec2 out[3]) const {
-    for (const Tri &t : tris_)
-        if (t.shape == hit.shape && t.triangle == hit.triangle) {
-            out[0] = t.p0, out[1] = t.p0 + t.e1, out[2] = t.p0 + t.e2;
-            return;
-        }
-    out[0] = out[1] = out[2] = Vec2{};
 }
 
 }  // namespace ox

@@ -16,6 +16,7 @@ struct UvHit {
     int32_t shape = -1;
     uint32_t triangle = 0;
     float b1 = 0.0f, b2 = 0.0f;
+    uint32_t index = 0;  ///< the triangle's place in the search (for corners)
     bool found() const { return shape >= 0; }
 };
 
@@ -50,7 +51,10 @@ public:
     UvCoverage coverage() const;
 
     /// The texel-space corners of a triangle found by a search.
-    void corners(const UvHit &hit, Vec2 out[3]) const;
+    void corners(const UvHit &hit, Vec2 out[3]) const {
+        const Tri &t = tris_[hit.index];
+        out[0] = t.p0, out[1] = t.p0 + t.e1, out[2] = t.p0 + t.e2;
+    }
     /// Number of triangles in the search and of grid cells.
     size_t triangleCount() const { return tris_.size(); }
     size_t cellCount() const { return size_t(cellsX_) * size_t(cellsY_); }

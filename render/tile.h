@@ -9,15 +9,15 @@
 /// Tiles and the four orders in which the tile renderer hands them out.
 namespace ox {
 
-/// The `tileScheme` setting; stored as these integers.
-enum TileSchemeType : int32_t {
+/// The tile orders of the `tileScheme` setting (the values of its TileSchemeType).
+enum TileOrder : int32_t {
     kTileHilbert = 0,      ///< "Hilbert"
     kTileLeftToRight = 1,  ///< "LeftToRight"
     kTileConcentric = 2,   ///< "Concentric"
     kTileRandom = 3,       ///< "Random"
 };
 
-/// The names of TileSchemeType in value order.
+/// The names of the tile orders in value order.
 inline constexpr const char *kTileSchemeNames[] = {"Hilbert", "LeftToRight", "Concentric",
                                                    "Random"};
 
