@@ -31,7 +31,7 @@ void fillBakeSurface(const ResolvedBakeShape &s, uint32_t triangle, float b1, fl
     out.geometricNormal = inst.normalToWorld(shape.faceNormal(triangle)).normalize();
     Vec3 n = (vl.normal(i0) * b0 + vl.normal(i1) * b1 + vl.normal(i2) * b2);
     n = inst.normalToWorld(n).normalize();
-    if (!inst.hasFlag(RenderStats::kSmoothShading) || n.lengthSquared() == 0.0f)
+    if (!inst.hasFlag(kFlagSmoothShading) || n.lengthSquared() == 0.0f)
         n = out.geometricNormal;
     // The shading normal lies on the side the winding names as front.
     if (dot(n, out.geometricNormal) < 0.0f) n = -n;
