@@ -13,6 +13,7 @@
 namespace ox {
 
 class Frame;
+struct MinMaxData;
 
 /// Results of the run operations: 0 done, kRunHardError a hard error (the driver's status is
 /// then a general failure), any other value a soft stop (the driver reports an abort).
@@ -59,6 +60,16 @@ public:
     /// Renders pass (an index into the prepared list) over the current target into the frame.
     /// An abort through io stops between tiles and still returns kRunDone.
     virtual int32_t renderTarget(int32_t pass, RenderIOInterface &io) = 0;
+    /// The colour layers pass (an index into the prepared list) leaves in the frame; the
+    /// driver writes each. Empty: the layer named by the pass.
+    virtual std::vector<std::string> passLayers(int32_t pass) const { return {}; }
+    /// What the shape normalization of the current target's last pass found (null when the
+    /// pass was not normalized); the driver writes it as XML beside the images.
+    virtual const MinMaxData *minMaxData() const { return nullptr; }
+    /// Asks the run to keep the layers of a target's earlier passes in its frame, so that one
+    /// file can hold every pass (the multi-layer EXR). Default: ignored.
+    virtual void keepPassLayers(bool keep) {}
+
     /// Adds what the last renderTarget counted (rays by type, samples) to the open target of
     /// statistics, and forgets it.
     virtual void statistics(RunStatistics &statistics) = 0;
