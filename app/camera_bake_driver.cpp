@@ -5,6 +5,7 @@
 
 #include "app/config_run_settings.h"
 #include "app/exit_status.h"
+#include "bake/bake_target.h"
 #include "config/settings_checks.h"
 #include "config/xml.h"
 #include "core/message.h"
@@ -142,6 +143,10 @@ int32_t CameraBakeRun::run() {
     }
     for (const std::string &pass : passes_)
         if (!checkFileNamePart(pass, "pass name")) return kStatusFailure;
+    // Every bake target's size and name, before anything is baked.
+    if (action_ == kActionTextureBake &&
+        !validateBakeTargets(work_.TextureBakeSettings, work_.FrameSettings.resolution()))
+        return kStatusZeroDimension;
     // Prepare, then check every name that becomes part of a file name before rendering.
     if (const int32_t r = run_->prepare(passes_); stepFailed(r, c_.progress))
         return stopRun(r, c_.progress);
@@ -210,6 +215,7 @@ int32_t CameraBakeRun::mainLoop() {
     TargetWriterInterface &writer = factory_.writer();
     const int32_t passCount = int32_t(passes_.size());
     const int32_t targetCount = int32_t(targets_.size());
+    run_->keepPassLayers(c_.format == kFormatExrMultiLayer);
     for (int32_t p = 0; p < passCount; ++p) {
         const std::string &pass = passes_[size_t(p)];
         stats.beginPass(pass);
@@ -235,12 +241,16 @@ int32_t CameraBakeRun::mainLoop() {
             }
             stats.endTarget();
             if (stepFailed(r, io)) return stopRun(r, io);
-            // The layer of the pass, one file per target and pass.
+            // The layers of the pass, one file per target and layer.
             const int32_t format = c_.format;
-            if (format != kFormatExrMultiLayer && format != kFormatNone &&
-                !writer.writeLayer(run_->frame(), format, c_.outputDirectory, c_.outputBaseName,
-                                   target, pass, work_))
-                return kStatusImageWrite;
+            if (format != kFormatExrMultiLayer && format != kFormatNone) {
+                std::vector<std::string> layers = run_->passLayers(p);
+                if (layers.empty()) layers.push_back(pass);
+                for (const std::string &layer : layers)
+                    if (!writer.writeLayer(run_->frame(), format, c_.outputDirectory,
+                                           c_.outputBaseName, target, layer, work_))
+                        return kStatusImageWrite;
+            }
             // The normalisation's minimum and maximum.
             const std::string minMax = c_.outputDirectory + c_.outputBaseName + "_" + target +
                                        (format == kFormatExrMultiLayer ? "" : "_" + pass) + ".xml";
@@ -248,8 +258,10 @@ int32_t CameraBakeRun::mainLoop() {
             // The step is done.
             if (io.isAborted()) return stopRun(kRunDone, io);
             io.clearRelease();
-            // Every layer in one file.
-            if (format == kFormatExrMultiLayer &&
+            // Every layer of every pass in one file, written once after the target's last pass
+            // (the run keeps the earlier passes' layers in the target's frame); writing it per
+            // pass would leave only the last pass in the file.
+            if (format == kFormatExrMultiLayer && p == passCount - 1 &&
                 !writer.writeMultiLayer(
                     run_->frame(), multiLayerFile(c_.outputDirectory, c_.outputBaseName, target),
                     work_))

@@ -4,6 +4,7 @@
 #include "render/color_correction.h"
 #include "render/frame.h"
 #include "render/image_writer.h"
+#include "render/post_filter.h"
 
 namespace ox {
 
@@ -26,10 +27,10 @@ bool FrameTargetWriter::writeMultiLayer(Frame *frame, const std::string &file,
     return !frame || writeMultiLayerEXR(file, *frame, config.FrameSettings.alphaChannel());
 }
 
-bool FrameTargetWriter::writeMinMaxData(Frame *, const std::string &) {
-    // Only normalised bakes carry minimum and maximum data, and their frames come with the
-    // texture bake; nothing else has any to write.
-    return true;
+bool FrameTargetWriter::writeMinMaxData(Frame *, const std::string &file) {
+    // Only normalised bakes have minimum and maximum data.
+    const MinMaxData *data = run_ ? run_->minMaxData() : nullptr;
+    return !data || ox::writeMinMaxData(file, *data);
 }
 
 }  // namespace ox

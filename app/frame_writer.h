@@ -18,6 +18,11 @@ public:
     bool writeMultiLayer(Frame *frame, const std::string &file,
                          const OXConfigBase &config) override;
     bool writeMinMaxData(Frame *frame, const std::string &file) override;
+    /// The run whose normalization records writeMinMaxData writes (null: none).
+    void setRun(const HLRenderInterface *run) { run_ = run; }
+
+private:
+    const HLRenderInterface *run_ = nullptr;
 };
 
 }  // namespace ox

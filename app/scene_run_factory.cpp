@@ -3,6 +3,8 @@
 #include "app/command_line.h"
 #include "app/settings_adapters.h"
 #include "bake/camera_render.h"
+#include "bake/render_world.h"
+#include "bake/texture_bake_run.h"
 #include "core/message.h"
 #include "raytrace/complete_grid.h"
 #include "raytrace/motion_blur.h"
@@ -14,11 +16,14 @@ namespace ox {
 SceneRunFactory::SceneRunFactory() = default;
 SceneRunFactory::~SceneRunFactory() = default;
 
-bool SceneRunFactory::supports(int32_t action) const { return action == kActionRender; }
+bool SceneRunFactory::supports(int32_t action) const {
+    return action == kActionRender || action == kActionTextureBake;
+}
 
 bool SceneRunFactory::loadScene(const std::vector<std::string> &inputs, OXConfig &config,
                                 int64_t threads, std::string &error) {
     scene_ = std::make_unique<Scene>();
+    world_.reset();
     grid_.reset();
     if (!ox::loadScene(inputs, config, int(std::clamp<int64_t>(threads, 1, 1024)), *scene_, error))
         return false;
@@ -44,11 +49,20 @@ bool SceneRunFactory::packUVs(OXConfig &, bool &changed, std::string &error) {
 std::unique_ptr<HLRenderInterface> SceneRunFactory::createRun(int32_t action,
                                                               const OXConfig &config,
                                                               int64_t threads) {
-    if (action != kActionRender || !scene_ || !grid_) {
+    if (!supports(action) || !scene_ || !grid_) {
         message(kMsgError, 6, "The %s is not available: this build has no driver for it.",
                 describeAction(action).c_str());
         return nullptr;
     }
+    if (action == kActionTextureBake) {
+        world_ = std::make_unique<RenderWorld>();
+        world_->build(*scene_, *grid_, config.RenderSettings);
+        auto run = std::make_unique<TextureBakeRun>(*world_, config,
+                                                    int32_t(std::clamp<int64_t>(threads, 1, 1024)));
+        writer_.setRun(run.get());
+        return run;
+    }
+    writer_.setRun(nullptr);
     return std::make_unique<CameraRender>(*scene_, *grid_, config, threads);
 }
 

@@ -12,10 +12,11 @@
 namespace ox {
 
 class CompleteGrid;
+class RenderWorld;
 class Scene;
 
-/// RenderRunFactoryInterface over the scene loader, the grid, the camera render and the image
-/// output. Texture bakes and surface transfers arrive with their own runs.
+/// RenderRunFactoryInterface over the scene loader, the grid, the camera render, the texture
+/// bake and the image output. Surface transfers arrive with their own run.
 class SceneRunFactory final : public RenderRunFactoryInterface {
 public:
     SceneRunFactory();
@@ -33,6 +34,7 @@ private:
     FrameTargetWriter writer_;
     std::unique_ptr<Scene> scene_;
     std::unique_ptr<CompleteGrid> grid_;
+    std::unique_ptr<RenderWorld> world_;
 };
 
 }  // namespace ox
