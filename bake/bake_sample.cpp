@@ -31,8 +31,7 @@ void fillBakeSurface(const ResolvedBakeShape &s, uint32_t triangle, float b1, fl
     out.geometricNormal = inst.normalToWorld(shape.faceNormal(triangle)).normalize();
     Vec3 n = (vl.normal(i0) * b0 + vl.normal(i1) * b1 + vl.normal(i2) * b2);
     n = inst.normalToWorld(n).normalize();
-    if (!inst.hasFlag(kFlagSmoothShading) || n.lengthSquared() == 0.0f)
-        n = out.geometricNormal;
+    if (!inst.hasFlag(kFlagSmoothShading) || n.lengthSquared() == 0.0f) n = out.geometricNormal;
     // The shading normal lies on the side the winding names as front.
     if (dot(n, out.geometricNormal) < 0.0f) n = -n;
     out.normal = n;
@@ -72,8 +71,8 @@ void fillBakeSurface(const ResolvedBakeShape &s, uint32_t triangle, float b1, fl
 
 void applyEdgeBias(const Vec2 c[3], float bias, float &b1, float &b2) {
     if (!(bias > 0.0f)) return;
-    const float area2 = std::fabs((c[1].x - c[0].x) * (c[2].y - c[0].y) -
-                                  (c[1].y - c[0].y) * (c[2].x - c[0].x));
+    const float area2 =
+        std::fabs((c[1].x - c[0].x) * (c[2].y - c[0].y) - (c[1].y - c[0].y) * (c[2].x - c[0].x));
     if (!(area2 > 0.0f)) return;
     // Barycentric i is the distance to the opposite edge over the altitude (area2 / edge).
     float b[3] = {1.0f - b1 - b2, b1, b2};

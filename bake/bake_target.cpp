@@ -40,7 +40,8 @@ std::vector<std::string> bakePassList(const RenderComponentsBase &c) {
 
 BakeTargetSize bakeTargetSize(const BakeTextureTargetBase &target, float resolutionScale,
                               const Vec2i &frameResolution) {
-    const Vec2i base = target.hasResolutionOverride() ? target.resolutionOverride() : frameResolution;
+    const Vec2i base =
+        target.hasResolutionOverride() ? target.resolutionOverride() : frameResolution;
     // The product is formed in double and clamped before the conversion, so that a huge
     // scale or a NaN gives a size that validation rejects instead of undefined behaviour.
     auto scaled = [&](int32_t edge) -> int64_t {

@@ -49,7 +49,9 @@ bool BilinearFilter::run(Frame &frame, RenderIOInterface *io) {
         message(kMsgError, 6, "Bilinear filter: reading the Z layer failed");
         return false;
     }
-    auto covered = [&](int32_t x, int32_t y) { return cover[size_t(y) * size_t(w) + size_t(x)] >= 0.0f; };
+    auto covered = [&](int32_t x, int32_t y) {
+        return cover[size_t(y) * size_t(w) + size_t(x)] >= 0.0f;
+    };
 
     // Background texels with a covered neighbour, resampled in row order. The search's
     // reach of 1.5 texels takes every triangle that meets the texel's 3 x 3 neighbourhood,

@@ -111,10 +111,8 @@ public:
         }
         BakeSurface s;
         const size_t shape = size_t(hit.shape);
-        fillBakeSurface(target_.shapes[shape], hit.triangle, b1, b2, target_.tangentSets[shape],
-                        s);
-        if (!applyNormalDirection(s, shared_.normalDirection, shared_.viewDependent,
-                                  shared_.eye))
+        fillBakeSurface(target_.shapes[shape], hit.triangle, b1, b2, target_.tangentSets[shape], s);
+        if (!applyNormalDirection(s, shared_.normalDirection, shared_.viewDependent, shared_.eye))
             return false;
         shade(s, out);
         return true;

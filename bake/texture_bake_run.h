@@ -27,12 +27,12 @@ class RenderWorld;
 
 /// Counts of one target and pass, for the statistics and the benchmark.
 struct TextureBakeCounts {
-    uint64_t texels = 0;        ///< texels whose centre (or square) found a surface
-    uint64_t samples = 0;       ///< shaded samples, the adaptive ones included
-    uint64_t edgeTexels = 0;    ///< texels that took adaptive samples
-    uint64_t rays = 0;          ///< rays traced by shading (shadow and secondary rays)
-    double renderSeconds = 0;   ///< time in the tile render
-    double filterSeconds = 0;   ///< time in the filter chain
+    uint64_t texels = 0;       ///< texels whose centre (or square) found a surface
+    uint64_t samples = 0;      ///< shaded samples, the adaptive ones included
+    uint64_t edgeTexels = 0;   ///< texels that took adaptive samples
+    uint64_t rays = 0;         ///< rays traced by shading (shadow and secondary rays)
+    double renderSeconds = 0;  ///< time in the tile render
+    double filterSeconds = 0;  ///< time in the filter chain
 };
 
 /// The texture-bake run of one configuration over a loaded world.

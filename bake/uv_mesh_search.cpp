@@ -104,8 +104,8 @@ bool UvMeshSearch::build(const std::vector<ResolvedBakeShape> &shapes, const UvR
         const Vec2 a = t.p0, b = t.p0 + t.e1, c = t.p0 + t.e2;
         int32_t cx0, cy0, cx1, cy1;
         cellRange(std::min({a.x, b.x, c.x}) - margin, std::min({a.y, b.y, c.y}) - margin,
-                  std::max({a.x, b.x, c.x}) + margin, std::max({a.y, b.y, c.y}) + margin, cx0,
-                  cy0, cx1, cy1);
+                  std::max({a.x, b.x, c.x}) + margin, std::max({a.y, b.y, c.y}) + margin, cx0, cy0,
+                  cx1, cy1);
         for (int32_t cy = cy0; cy <= cy1; ++cy)
             for (int32_t cx = cx0; cx <= cx1; ++cx) f(size_t(cy) * size_t(cellsX_) + size_t(cx));
     };
@@ -209,10 +209,9 @@ UvHit UvMeshSearch::findNear(float x, float y, float reach, bool clampToTriangle
                 }
                 // Preferred winding first, then the nearest, then the first in triangle order
                 // (cells repeat triangles; the index keeps the choice independent of the cell).
-                const bool better =
-                    bestIndex == UINT32_MAX || (t.preferred && !bestPreferred) ||
-                    (t.preferred == bestPreferred &&
-                     (d2 < bestD2 || (d2 == bestD2 && index < bestIndex)));
+                const bool better = bestIndex == UINT32_MAX || (t.preferred && !bestPreferred) ||
+                                    (t.preferred == bestPreferred &&
+                                     (d2 < bestD2 || (d2 == bestD2 && index < bestIndex)));
                 if (!better) continue;
                 bestIndex = index, bestD2 = d2, bestPreferred = t.preferred;
                 best = {t.shape, t.triangle, clampToTriangle ? n1 : b1, clampToTriangle ? n2 : b2,

@@ -75,8 +75,8 @@ private:
         b1 = (dx * t.e2.y - dy * t.e2.x) * t.invArea;
         b2 = (t.e1.x * dy - t.e1.y * dx) * t.invArea;
     }
-    void cellRange(float x0, float y0, float x1, float y1, int32_t &cx0, int32_t &cy0,
-                   int32_t &cx1, int32_t &cy1) const;
+    void cellRange(float x0, float y0, float x1, float y1, int32_t &cx0, int32_t &cy0, int32_t &cx1,
+                   int32_t &cy1) const;
 
     std::vector<Tri> tris_;
     std::vector<uint32_t> cellStart_;  // cellCount() + 1 offsets into cellTris_

@@ -165,9 +165,7 @@ size_t countOf(const std::string &text, const std::string &what) {
     return n;
 }
 
-void writeText(const std::string &path, const std::string &text) {
-    std::ofstream(path) << text;
-}
+void writeText(const std::string &path, const std::string &text) { std::ofstream(path) << text; }
 
 class TextureBakeTest : public oxtest::TempDirTest {
 protected:
@@ -222,7 +220,8 @@ TEST_F(TextureBakeTest, PointLightOverAPlaneFollowsTheInverseSquareCosineLaw) {
             ++covered;
             const float expected = h / std::pow(h * h + px * px + py * py, 1.5f);
             for (const char *c : {"tpIllumination.R", "tpIllumination.G", "tpIllumination.B"})
-                ASSERT_NEAR(img.at(c, x, y), expected, expected * 1e-3f) << c << " " << x << "," << y;
+                ASSERT_NEAR(img.at(c, x, y), expected, expected * 1e-3f)
+                    << c << " " << x << "," << y;
             // Beauty of a diffuse material: albedo times the light arriving.
             const float albedo[3] = {0.8f, 0.5f, 0.25f};
             const char *ch[3] = {"R", "G", "B"};
@@ -241,8 +240,9 @@ TEST_F(TextureBakeTest, DirectionalLightAtSixtyDegreesGivesOneHalf) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     const float s = std::sqrt(3.0f) / 2.0f;
     writeText("scene.xml", sceneXml(sunLight(s, 0.0f, 0.5f), instanceXml("plane")));
-    writeText("bake.xml", configXml({{"plane", {"plane"}}}, "<bilinearFilter>false</bilinearFilter>",
-                                    "<illumination>true</illumination>"));
+    writeText("bake.xml",
+              configXml({{"plane", {"plane"}}}, "<bilinearFilter>false</bilinearFilter>",
+                        "<illumination>true</illumination>"));
     const oxtest::RunResult r = bake("-e -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
     const Image img = readExr("lm_plane_tpIllumination.exr");
@@ -257,7 +257,6 @@ TEST_F(TextureBakeTest, DirectionalLightAtSixtyDegreesGivesOneHalf) {
     EXPECT_EQ(img.at("R", 8 - 7, 30), 0.0f);
 }
 
-
 /// The six faces of the cube [-1, 1]^3 as charts of a 3 x 2 atlas; face k spans
 /// [u0(k), u0(k) + size] x [v0(k), v0(k) + size].
 constexpr float kFaceSize = 0.29f;
@@ -266,9 +265,10 @@ float faceV0(int k) { return 0.1f + 0.5f * float(k / 3); }
 std::vector<Quad> cubeFaces() {
     using ox::Vec3;
     // Normal, then two axes a, b with a x b = normal.
-    const Vec3 faces[6][3] = {{{1, 0, 0}, {0, 1, 0}, {0, 0, 1}},  {{0, 1, 0}, {0, 0, 1}, {1, 0, 0}},
-                              {{0, 0, 1}, {1, 0, 0}, {0, 1, 0}},  {{-1, 0, 0}, {0, 0, 1}, {0, 1, 0}},
-                              {{0, -1, 0}, {1, 0, 0}, {0, 0, 1}}, {{0, 0, -1}, {0, 1, 0}, {1, 0, 0}}};
+    const Vec3 faces[6][3] = {
+        {{1, 0, 0}, {0, 1, 0}, {0, 0, 1}},  {{0, 1, 0}, {0, 0, 1}, {1, 0, 0}},
+        {{0, 0, 1}, {1, 0, 0}, {0, 1, 0}},  {{-1, 0, 0}, {0, 0, 1}, {0, 1, 0}},
+        {{0, -1, 0}, {1, 0, 0}, {0, 0, 1}}, {{0, 0, -1}, {0, 1, 0}, {1, 0, 0}}};
     std::vector<Quad> quads;
     for (int k = 0; k < 6; ++k) {
         const Vec3 n = faces[k][0], a = faces[k][1], b = faces[k][2];
@@ -322,8 +322,10 @@ TEST_F(TextureBakeTest, SeamsOfACubeAgreeUnderBilinearLookups) {
         const float z = -0.95f + 1.9f * float(i) / 40.0f;
         const float d = std::sqrt(8.0f + z * z);
         const float truth = 2.0f / (d * d * d);
-        const float a = bilinear(img, "R", faceU0(0) + kFaceSize, faceV0(0) + (z + 1) * 0.5f * kFaceSize);
-        const float b = bilinear(img, "R", faceU0(1) + (z + 1) * 0.5f * kFaceSize, faceV0(1) + kFaceSize);
+        const float a =
+            bilinear(img, "R", faceU0(0) + kFaceSize, faceV0(0) + (z + 1) * 0.5f * kFaceSize);
+        const float b =
+            bilinear(img, "R", faceU0(1) + (z + 1) * 0.5f * kFaceSize, faceV0(1) + kFaceSize);
         EXPECT_NEAR(a, b, 0.02f * truth) << "z " << z;
         EXPECT_NEAR(a, truth, 0.02f * truth) << "z " << z;
         EXPECT_NEAR(b, truth, 0.02f * truth) << "z " << z;
@@ -340,15 +342,23 @@ TEST_F(TextureBakeTest, BadTargetsFailBeforeAnythingIsBaked) {
         std::string text;
     };
     const Case cases[] = {
-        {{{"plane", {"plane"}, 0}}, "<illumination>true</illumination>", 8,
+        {{{"plane", {"plane"}, 0}},
+         "<illumination>true</illumination>",
+         8,
          "BakeTextureTarget 'plane' with invalid dimension 0x0."},
-        {{{"plane", {"plane"}, 70000}}, "<illumination>true</illumination>", 8,
+        {{{"plane", {"plane"}, 70000}},
+         "<illumination>true</illumination>",
+         8,
          "with invalid dimension 70000x70000."},
-        {{{"default", {"plane"}}, {"default", {"plane"}}}, "<illumination>true</illumination>", 8,
+        {{{"default", {"plane"}}, {"default", {"plane"}}},
+         "<illumination>true</illumination>",
+         8,
          "BakeTextureTarget 1 and 2 are both named 'default'"},
         {{{"plane", {"plane"}}}, "", 10, "No valid RenderComponents found in TextureBakeSettings!"},
         {{}, "<illumination>true</illumination>", 1, "No targets specified, aborting baking"},
-        {{{"plane", {"nothing"}}}, "<illumination>true</illumination>", 1,
+        {{{"plane", {"nothing"}}},
+         "<illumination>true</illumination>",
+         1,
          "No shapes to bake, aborting baking"},
     };
     for (const Case &c : cases) {
@@ -370,11 +380,10 @@ TEST_F(TextureBakeTest, PassesOuterTargetsInnerAndSkippedShapes) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     writeMesh("other.vtm", "other", {planeQuad(2, -1, 4, 1, 0.125f, 0.125f, 0.875f, 0.875f)},
               "paint");
-    writeText("scene.xml",
-              sceneXml(pointLight(1.0f), instanceXml("plane") + instanceXml("other")));
-    std::string config = configXml({{"a", {"plane"}, 16}, {"b", {"missing", "other", "plane"}, 16},
-                                    {"c", {"plane"}, 16}},
-                                   "", "<albedo>true</albedo><fullShading>true</fullShading>");
+    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane") + instanceXml("other")));
+    std::string config = configXml(
+        {{"a", {"plane"}, 16}, {"b", {"missing", "other", "plane"}, 16}, {"c", {"plane"}, 16}}, "",
+        "<albedo>true</albedo><fullShading>true</fullShading>");
     // The third shape of target b gets a zero UV scale.
     const std::string third = "<element><target>plane</target></element></targetSurfaces>";
     const size_t at = config.find(third, config.find("<textureName>b<"));
@@ -382,16 +391,14 @@ TEST_F(TextureBakeTest, PassesOuterTargetsInnerAndSkippedShapes) {
                    "<element><target>plane</target><UVScale><x>0</x><y>1</y></UVScale></element>"
                    "</targetSurfaces>");
     writeText("bake.xml", config);
-    const oxtest::RunResult r = oxtest::runProgram(OX_BINARY_DIR "/app/thevorn",
-                                                   "scene.xml plane.vtm other.vtm -x bake.xml -b -q -t -o lm");
+    const oxtest::RunResult r = oxtest::runProgram(
+        OX_BINARY_DIR "/app/thevorn", "scene.xml plane.vtm other.vtm -x bake.xml -b -q -t -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
     size_t last = 0;
-    const char *steps[] = {"[1/6] Rendering a [Target 1/3] [Pass 1/2]",
-                           "[2/6] Rendering b [Target 2/3] [Pass 1/2]",
-                           "[3/6] Rendering c [Target 3/3] [Pass 1/2]",
-                           "[4/6] Rendering a [Target 1/3] [Pass 2/2]",
-                           "[5/6] Rendering b [Target 2/3] [Pass 2/2]",
-                           "[6/6] Rendering c [Target 3/3] [Pass 2/2]"};
+    const char *steps[] = {
+        "[1/6] Rendering a [Target 1/3] [Pass 1/2]", "[2/6] Rendering b [Target 2/3] [Pass 1/2]",
+        "[3/6] Rendering c [Target 3/3] [Pass 1/2]", "[4/6] Rendering a [Target 1/3] [Pass 2/2]",
+        "[5/6] Rendering b [Target 2/3] [Pass 2/2]", "[6/6] Rendering c [Target 3/3] [Pass 2/2]"};
     for (const char *s : steps) {
         const size_t p = r.output.find(s, last);
         ASSERT_NE(p, std::string::npos) << s << "\n" << r.output;
@@ -428,9 +435,9 @@ TEST_F(TextureBakeTest, OverlappingChartsAreReportedOncePerTarget) {
 TEST_F(TextureBakeTest, CameraSideWithoutACameraUsesTheSceneCentre) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
-    writeText("bake.xml", configXml({{"plane", {"plane"}, 16}},
-                                    "<normalDirection>Camera</normalDirection>",
-                                    "<illumination>true</illumination>"));
+    writeText("bake.xml",
+              configXml({{"plane", {"plane"}, 16}}, "<normalDirection>Camera</normalDirection>",
+                        "<illumination>true</illumination>"));
     const oxtest::RunResult r = bake("-e -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
     EXPECT_NE(r.output.find("The scene has no camera persp: baking views the surfaces from the "
@@ -442,14 +449,15 @@ TEST_F(TextureBakeTest, CameraSideWithoutACameraUsesTheSceneCentre) {
 TEST_F(TextureBakeTest, UnwritableOutputFailsWithoutPartialFiles) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
-    writeText("bake.xml", configXml({{"plane", {"plane"}, 16}}, "",
-                                    "<illumination>true</illumination>"));
+    writeText("bake.xml",
+              configXml({{"plane", {"plane"}, 16}}, "", "<illumination>true</illumination>"));
     // A directory where the light map would go: the finished file cannot take its name.
     std::filesystem::create_directory("lm_plane.exr");
     oxtest::RunResult r = bake("-me -o lm");
     EXPECT_EQ(r.status, 12) << r.output;  // 0x2000000C
     for (const auto &e : std::filesystem::directory_iterator("."))
-        EXPECT_TRUE(e.is_directory() || e.path().extension() == ".xml" || e.path().extension() == ".vtm")
+        EXPECT_TRUE(e.is_directory() || e.path().extension() == ".xml" ||
+                    e.path().extension() == ".vtm")
             << e.path();
     std::filesystem::remove("lm_plane.exr");
 
@@ -463,7 +471,8 @@ TEST_F(TextureBakeTest, UnwritableOutputFailsWithoutPartialFiles) {
     const bool root = ::geteuid() == 0;
     if (root && !std::filesystem::exists("/usr/bin/setpriv")) GTEST_SKIP() << "no setpriv";
     ::chmod(".", 0755);
-    const std::string prefix = root ? "/usr/bin/setpriv --reuid=65534 --regid=65534 --clear-groups " : "";
+    const std::string prefix =
+        root ? "/usr/bin/setpriv --reuid=65534 --regid=65534 --clear-groups " : "";
     r = oxtest::runProgram(prefix + OX_BINARY_DIR "/app/thevorn",
                            "scene.xml plane.vtm -x bake.xml -b -q -e -od ro -o lm");
     ::chmod("ro", 0755);
@@ -477,12 +486,13 @@ TEST_F(TextureBakeTest, SameBytesOnAnyThreadCount) {
     // Soft shadows of an area light over a plane with a blocker: random shadow samples, the
     // adaptive edge samples and the filters all take part.
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeMesh("blocker.vtm", "blocker",
-              {Quad{{{{-0.3f, -0.3f, 0.5f}, {0.3f, -0.3f, 0.5f}, {0.3f, 0.3f, 0.5f},
-                      {-0.3f, 0.3f, 0.5f}}},
-                    {0, 0, 1},
-                    {{{0, 0}, {1, 0}, {1, 1}, {0, 1}}}}},
-              "paint");
+    writeMesh(
+        "blocker.vtm", "blocker",
+        {Quad{
+            {{{-0.3f, -0.3f, 0.5f}, {0.3f, -0.3f, 0.5f}, {0.3f, 0.3f, 0.5f}, {-0.3f, 0.3f, 0.5f}}},
+            {0, 0, 1},
+            {{{0, 0}, {1, 0}, {1, 1}, {0, 1}}}}},
+        "paint");
     const float m[4][4] = {{0.3f, 0, 0, 0}, {0, -0.3f, 0, 0}, {0, 0, -1, 0}, {0, 0, 1.5f, 1}};
     writeText("scene.xml",
               sceneXml("<LightSource><Name>panel</Name><Type>AREA</Type><Color><r>4</r><g>4</g>"
@@ -490,8 +500,9 @@ TEST_F(TextureBakeTest, SameBytesOnAnyThreadCount) {
                        "</ShadowSamples><FalloffExponent>2</FalloffExponent>" +
                            matrix(m) + "</LightSource>",
                        instanceXml("plane") + instanceXml("blocker")));
-    std::string config = configXml({{"plane", {"plane"}, 64}}, "<shadows>true</shadows>",
-                                   "<illumination>true</illumination><fullShading>true</fullShading>");
+    std::string config =
+        configXml({{"plane", {"plane"}, 64}}, "<shadows>true</shadows>",
+                  "<illumination>true</illumination><fullShading>true</fullShading>");
     config.replace(config.find("<FrameSettings>"), 15,
                    "<AASettings><maxSampleRate>2</maxSampleRate></AASettings><FrameSettings>");
     writeText("bake.xml", config);
@@ -544,7 +555,8 @@ TEST_F(TextureBakeTest, RadiosityNormalMapsWriteOneFilePerBasisLayer) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
     for (const bool mono : {false, true}) {
-        for (int k = 0; k < 4; ++k) std::filesystem::remove("lm_plane_tpRnm" + std::to_string(k) + ".exr");
+        for (int k = 0; k < 4; ++k)
+            std::filesystem::remove("lm_plane_tpRnm" + std::to_string(k) + ".exr");
         writeText("bake.xml",
                   configXml({{"plane", {"plane"}, 16}}, "",
                             std::string("<rnm>true</rnm><RNMSettings><monochrome>") +

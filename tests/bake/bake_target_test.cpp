@@ -43,9 +43,9 @@ TEST(BakeTargetValidation, RejectsBadSizesAndSharedNames) {
         bool ok;
     };
     const Case cases[] = {
-        {{512, 512}, 1.0f, true},    {{0, 512}, 1.0f, false},     {{512, -3}, 1.0f, false},
-        {{65535, 1}, 1.0f, true},    {{65536, 16}, 1.0f, false},  {{2, 2}, 0.4f, false},
-        {{64, 64}, 1e30f, false},    {{64, 64}, NAN, false},      {{100, 100}, 0.5f, true},
+        {{512, 512}, 1.0f, true}, {{0, 512}, 1.0f, false},    {{512, -3}, 1.0f, false},
+        {{65535, 1}, 1.0f, true}, {{65536, 16}, 1.0f, false}, {{2, 2}, 0.4f, false},
+        {{64, 64}, 1e30f, false}, {{64, 64}, NAN, false},     {{100, 100}, 0.5f, true},
     };
     for (const Case &c : cases) {
         OXCComplexTypeInstantiator<TextureBakeSettingsBase> s;
@@ -77,15 +77,19 @@ TEST(BakeTargetValidation, RejectsBadSizesAndSharedNames) {
 TEST(BakeShapes, ResolveUvSetsAndSkipBadShapes) {
     Scene scene;
     test::place(scene,
-                test::makeShape("two", {{{0, 0, 0}, {0, 0, 1}, {{0, 0}, {0.5f, 0.5f}}},
-                                        {{1, 0, 0}, {0, 0, 1}, {{1, 0}, {1, 0.5f}}},
-                                        {{0, 1, 0}, {0, 0, 1}, {{0, 1}, {0.5f, 1}}}},
+                test::makeShape("two",
+                                {{{0, 0, 0}, {0, 0, 1}, {{0, 0}, {0.5f, 0.5f}}},
+                                 {{1, 0, 0}, {0, 0, 1}, {{1, 0}, {1, 0.5f}}},
+                                 {{0, 1, 0}, {0, 0, 1}, {{0, 1}, {0.5f, 1}}}},
                                 {{0, 1, 2}}, {"map1", "second"}),
                 "a");
-    test::place(scene,
-                test::makeShape("three", {{{0, 0, 0}, {0, 0, 1}, {}}, {{1, 0, 0}, {0, 0, 1}, {}}, {{0, 1, 0}, {0, 0, 1}, {}}},
-                                {{0, 1, 2}}, {"uv", "LightMap", "x"}),
-                "b");
+    test::place(
+        scene,
+        test::makeShape(
+            "three",
+            {{{0, 0, 0}, {0, 0, 1}, {}}, {{1, 0, 0}, {0, 0, 1}, {}}, {{0, 1, 0}, {0, 0, 1}, {}}},
+            {{0, 1, 2}}, {"uv", "LightMap", "x"}),
+        "b");
     EXPECT_EQ(defaultLightMapUvSet(*scene.findInstance("a")), 1);
     EXPECT_EQ(defaultLightMapUvSet(*scene.findInstance("b")), 1);
 

@@ -82,24 +82,22 @@ TEST(BilinearFilter, LookupsInsideChartsReadTheContinuedSurface) {
     // right half rotated by a quarter turn in the upper right; chart edges at odd texel
     // fractions.
     Scene scene;
-    const Instance *left = test::place(
-        scene,
-        test::makeShape("l",
-                        {{{-1, -1, 0}, {0, 0, 1}, {{0.05f, 0.07f}}},
-                         {{0, -1, 0}, {0, 0, 1}, {{0.43f, 0.07f}}},
-                         {{0, 1, 0}, {0, 0, 1}, {{0.43f, 0.45f}}},
-                         {{-1, 1, 0}, {0, 0, 1}, {{0.05f, 0.45f}}}},
-                        {{0, 1, 2}, {0, 2, 3}}, {"map"}),
-        "left");
-    const Instance *right = test::place(
-        scene,
-        test::makeShape("r",
-                        {{{0, -1, 0}, {0, 0, 1}, {{0.93f, 0.55f}}},
-                         {{1, -1, 0}, {0, 0, 1}, {{0.93f, 0.93f}}},
-                         {{1, 1, 0}, {0, 0, 1}, {{0.55f, 0.93f}}},
-                         {{0, 1, 0}, {0, 0, 1}, {{0.55f, 0.55f}}}},
-                        {{0, 1, 2}, {0, 2, 3}}, {"map"}),
-        "right");
+    const Instance *left = test::place(scene,
+                                       test::makeShape("l",
+                                                       {{{-1, -1, 0}, {0, 0, 1}, {{0.05f, 0.07f}}},
+                                                        {{0, -1, 0}, {0, 0, 1}, {{0.43f, 0.07f}}},
+                                                        {{0, 1, 0}, {0, 0, 1}, {{0.43f, 0.45f}}},
+                                                        {{-1, 1, 0}, {0, 0, 1}, {{0.05f, 0.45f}}}},
+                                                       {{0, 1, 2}, {0, 2, 3}}, {"map"}),
+                                       "left");
+    const Instance *right = test::place(scene,
+                                        test::makeShape("r",
+                                                        {{{0, -1, 0}, {0, 0, 1}, {{0.93f, 0.55f}}},
+                                                         {{1, -1, 0}, {0, 0, 1}, {{0.93f, 0.93f}}},
+                                                         {{1, 1, 0}, {0, 0, 1}, {{0.55f, 0.93f}}},
+                                                         {{0, 1, 0}, {0, 0, 1}, {{0.55f, 0.55f}}}},
+                                                        {{0, 1, 2}, {0, 2, 3}}, {"map"}),
+                                        "right");
     std::vector<ResolvedBakeShape> shapes(2);
     shapes[0].instance = left;
     shapes[1].instance = right;

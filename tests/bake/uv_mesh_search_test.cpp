@@ -46,14 +46,13 @@ TEST(UvMeshSearch, FindsTheTriangleAndItsBarycentrics) {
 TEST(UvMeshSearch, OverlapsPreferTheWindingThenTheFirst) {
     // Three triangles over the same UV area: clockwise first, then two counter-clockwise.
     Scene scene;
-    const Instance *inst = test::place(
-        scene,
-        test::makeShape("s",
-                        {{{0, 0, 0}, {0, 0, 1}, {{0, 0}}},
-                         {{1, 0, 0}, {0, 0, 1}, {{1, 0}}},
-                         {{0, 1, 0}, {0, 0, 1}, {{0, 1}}}},
-                        {{0, 2, 1}, {0, 1, 2}, {1, 2, 0}}, {"map"}),
-        "s");
+    const Instance *inst = test::place(scene,
+                                       test::makeShape("s",
+                                                       {{{0, 0, 0}, {0, 0, 1}, {{0, 0}}},
+                                                        {{1, 0, 0}, {0, 0, 1}, {{1, 0}}},
+                                                        {{0, 1, 0}, {0, 0, 1}, {{0, 1}}}},
+                                                       {{0, 2, 1}, {0, 1, 2}, {1, 2, 0}}, {"map"}),
+                                       "s");
     for (int32_t winding : {0, 1}) {
         UvMeshSearch search;
         ASSERT_TRUE(search.build({shapeOf(inst)}, UvRect{}, 16, 16, winding));
@@ -71,14 +70,13 @@ TEST(UvMeshSearch, OverlapsPreferTheWindingThenTheFirst) {
 TEST(UvMeshSearch, ThinTrianglesAreFoundByTheirTexelSquare) {
     // A sliver 0.2 texels wide between two texel centres, and the UV matrix and range at work.
     Scene scene;
-    const Instance *inst = test::place(
-        scene,
-        test::makeShape("thin",
-                        {{{0, 0, 0}, {0, 0, 1}, {{0.6f, 0}}},
-                         {{1, 0, 0}, {0, 0, 1}, {{0.8f, 0}}},
-                         {{0, 1, 0}, {0, 0, 1}, {{0.7f, 10}}}},
-                        {{0, 1, 2}}, {"map"}),
-        "thin");
+    const Instance *inst = test::place(scene,
+                                       test::makeShape("thin",
+                                                       {{{0, 0, 0}, {0, 0, 1}, {{0.6f, 0}}},
+                                                        {{1, 0, 0}, {0, 0, 1}, {{0.8f, 0}}},
+                                                        {{0, 1, 0}, {0, 0, 1}, {{0.7f, 10}}}},
+                                                       {{0, 1, 2}}, {"map"}),
+                                       "thin");
     ResolvedBakeShape s = shapeOf(inst);
     s.uvScale = {0.1f, 0.1f};  // u' = 0.06 .. 0.08 (texels 0.6 .. 0.8 below)
     UvMeshSearch search;
@@ -124,11 +122,11 @@ TEST(BakeSample, NormalDirectionAndViewDependence) {
         float normalZ;
     };
     const Case cases[] = {
-        {0, false, {0, 0, 5}, true, 1},   {0, false, {0, 0, -5}, true, 1},
-        {0, true, {0, 0, -5}, false, 1},  {1, false, {0, 0, 5}, true, -1},
-        {1, true, {0, 0, 5}, false, -1},  {1, true, {0, 0, -5}, true, -1},
-        {2, false, {0, 0, 5}, true, 1},   {2, false, {0, 0, -5}, true, -1},
-        {2, true, {0, 0, -5}, true, -1},  {0, true, {100, 0, 0.0f}, true, 1},
+        {0, false, {0, 0, 5}, true, 1},  {0, false, {0, 0, -5}, true, 1},
+        {0, true, {0, 0, -5}, false, 1}, {1, false, {0, 0, 5}, true, -1},
+        {1, true, {0, 0, 5}, false, -1}, {1, true, {0, 0, -5}, true, -1},
+        {2, false, {0, 0, 5}, true, 1},  {2, false, {0, 0, -5}, true, -1},
+        {2, true, {0, 0, -5}, true, -1}, {0, true, {100, 0, 0.0f}, true, 1},
     };
     for (const Case &c : cases) {
         BakeSurface s;
@@ -150,8 +148,10 @@ TEST(BakeSample, EdgeBiasKeepsSamplesAwayFromEdges) {
         float b1, b2, bias;
         float minDistance;
     };
-    const Case cases[] = {{0.0f, 0.0f, 1.0f, 1.0f},   {0.5f, 0.5f, 0.5f, 0.5f},
-                          {0.2f, 0.3f, 0.0f, 0.0f},   {0.2f, 0.3f, 1.0f, 1.0f},
+    const Case cases[] = {{0.0f, 0.0f, 1.0f, 1.0f},
+                          {0.5f, 0.5f, 0.5f, 0.5f},
+                          {0.2f, 0.3f, 0.0f, 0.0f},
+                          {0.2f, 0.3f, 1.0f, 1.0f},
                           {0.0f, 0.0f, 100.0f, 2.35f}};  // the centroid
     for (const Case &k : cases) {
         float b1 = k.b1, b2 = k.b2;
