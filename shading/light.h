@@ -14,6 +14,8 @@
 
 namespace ox {
 
+class TextureFactory;
+
 /// The distance attenuation models of the scene ("STANDARD" 0, "UNREAL" 1).
 enum class AttenuationType : int32_t { kStandard = 0, kUnreal = 1 };
 
@@ -531,8 +533,18 @@ int64_t iblScaledPhotonEnergy(int32_t energy);
 /// castShadows receives the CastShadows flag (environment lights are added differently).
 std::unique_ptr<LightSource> createLight(const LightParameters &p, bool &castShadows);
 
-/// Makes the image-based light; null (with the error "Error reading IBL lightprobe") when the
-/// probe image cannot be read.
-std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values);
+/// Widest probe the image-based light splits: larger probes are read from the first mip level
+/// at most this wide and high (the levels keep the mean, so the energy is the same).
+constexpr int32_t kMaxLightProbeSide = 2048;
+
+/// Reads a light probe through the texture manager into plain floats (rows from the bottom);
+/// false (after the texture manager's message) when the file cannot be read.
+bool readLightProbe(TextureFactory &textures, const std::string &file, LightProbeImage &out,
+                    int32_t maxSide = kMaxLightProbeSide);
+
+/// Makes the image-based light with its sub-lights from the probe file iblImageFile; null (with
+/// the error "Error reading IBL lightprobe") when the probe cannot be read.
+std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values,
+                                                  TextureFactory &textures);
 
 }  // namespace ox

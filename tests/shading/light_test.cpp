@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <fstream>
 #include <memory>
 #include <vector>
 
@@ -12,6 +13,8 @@
 #include "core/random.h"
 #include "raytrace/complete_grid.h"
 #include "shading/shadow_sampler.h"
+#include "tests/support/tga_file.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 namespace {
@@ -479,6 +482,38 @@ TEST(ImageBasedLight, ConstantProbeLightsEveryUpwardNormalAlike) {
             light.illuminate({0, 0, 0}, n, ctx, false).r * light.cosineFactor({0, 0, 0}, n);
         EXPECT_NEAR(e, 1.0f, 0.01f) << n.x << " " << n.y << " " << n.z;
     }
+}
+
+TEST(ImageBasedLight, ProbeFileThroughTheTextureManager) {
+    // A constant probe of (0.4, 0.6, 0.8) written as a file and read by the texture manager.
+    const std::string file = testing::TempDir() + "ox_light_probe.tga", bad = file + ".bad.tga";
+    ASSERT_TRUE(oxtest::writeTGA(file, 128, 64, {128 * 64, {102, 153, 204}}));
+    TextureFactory textures;
+    EnvironmentValues v;
+    v.iblSamples = 2048;
+    v.iblImageFile = file;
+    auto light = createImageBasedLight(v, textures);
+    ASSERT_TRUE(light);
+    EXPECT_EQ(light->subLights().size(), 2048u);
+    LightContext ctx;
+    Random r(5);
+    for (int k = 0; k < 50; ++k) {
+        const Vec3 n = k == 0 ? Vec3(0, 1, 0)
+                              : Vec3(2 * r.next() - 1, r.next(), 2 * r.next() - 1).normalized();
+        const Color e = light->illuminate({0, 0, 0}, n, ctx, false) * light->cosineFactor({}, n);
+        expectRelative(e.g, 0.6f, 0.01f, "green");
+        expectRelative(e.b, 0.8f, 0.01f, "blue");
+    }
+    // A probe wider than the limit is read from a mip level of the same mean.
+    LightProbeImage small;
+    ASSERT_TRUE(readLightProbe(textures, file, small, 16));
+    EXPECT_EQ(small.width, 16);
+    EXPECT_EQ(small.height, 8);
+    EXPECT_NEAR(small.at(15, 7).r, 0.4f, 1e-6f);
+    // A file the readers cannot decode gives no light.
+    std::ofstream(bad) << "not an image";
+    v.iblImageFile = bad;
+    EXPECT_EQ(createImageBasedLight(v, textures), nullptr);
 }
 
 TEST(ImageBasedLight, BrightTexelMakesOneDominantSubLight) {
