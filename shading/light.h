@@ -175,6 +175,10 @@ public:
     }
     /// Unit direction from p towards the light; the zero vector at the light's own position.
     virtual Vec3 directionToLight(const Vec3 &p) const = 0;
+    /// Unit direction from p towards the nearest point of the light's emitting surface: the
+    /// same as `directionToLight` for point-like lights (point, spot, directional, ambient,
+    /// albedo); an area light points at the nearest point of its rectangle. Zero on the light.
+    virtual Vec3 directionToLightSurface(const Vec3 &p) const { return directionToLight(p); }
     /// Distance from p to the light's position; -1 for lights without a position.
     virtual float distanceTo(const Vec3 &) const { return -1.0f; }
     /// Radiance a camera sees on the light itself (black for every light).
@@ -330,7 +334,8 @@ private:
 };
 
 /// An area light: the square -1..1 in the light's x-y plane, lighting the +z side. The shadow
-/// sampler integrates over the rectangle; attenuation uses the distance to the centre.
+/// sampler integrates over the rectangle; attenuation uses the distance to the centre (at most
+/// 1 with ClampToIntensity).
 class SimpleAreaLight : public SimpleLightSourceBase {
 public:
     explicit SimpleAreaLight(const LightParameters &p);
@@ -342,12 +347,15 @@ public:
     /// rectangle to the hemisphere of n and integrating over its edges).
     float cosineFactor(const Vec3 &p, const Vec3 &n) const override;
     Vec3 directionToLight(const Vec3 &p) const override { return (center_ - p).normalized(); }
+    Vec3 directionToLightSurface(const Vec3 &p) const override;
     float distanceTo(const Vec3 &p) const override { return (center_ - p).length(); }
     /// In front of the light and closer to its centre than DecayCutoff.
     bool affectsPoint(const Vec3 &p) const override;
 
     const Vec3 &center() const { return center_; }
     const Vec3 &normal() const { return normal_; }
+    /// True when the light never gets brighter than its colour: the attenuation near the light
+    /// is clamped to 1 whatever the attenuation model.
     bool clampToIntensity() const { return clampToIntensity_; }
     /// The four corners in world space.
     const Vec3 *corners() const { return corners_; }
@@ -371,6 +379,7 @@ public:
         return dot(directionToLight(p), n);
     }
     Vec3 directionToLight(const Vec3 &) const override { return -normal_; }
+    Vec3 directionToLightSurface(const Vec3 &) const override { return -normal_; }
     /// Half opening angle in radians.
     float halfAngle() const { return halfAngle_; }
     float tanHalfAngle() const { return tanHalfAngle_; }

@@ -4,6 +4,7 @@
 #include <array>
 #include <cmath>
 
+#include "config/settings_render.h"
 #include "core/random.h"
 #include "raytrace/complete_grid.h"
 
@@ -53,6 +54,16 @@ inline bool traces(const ShadowSamplerSettings &s, const LightContext &ctx) {
 }
 
 }  // namespace
+
+ShadowTracer shadowTracerFor(const RenderSettingsBase &render, const ADSInterface *structure) {
+    ShadowTracer t;
+    t.ads = structure;
+    const float bias = render.bias();
+    t.bias = bias > 0.0f && std::isfinite(bias) ? bias : kDefaultShadowBias;
+    t.minShadowRays = render.minShadowRays();
+    t.maxShadowRays = render.maxShadowRays();
+    return t;
+}
 
 ShadowGrid shadowGridLayout(uint32_t n) {
     return kGridTable[std::clamp<uint32_t>(n, 1, kMaxShadowSamples)];

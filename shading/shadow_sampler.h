@@ -9,6 +9,16 @@
 /// three samplers (towards a disk around a point, over a rectangle, within a cone of directions).
 namespace ox {
 
+class RenderSettingsBase;
+
+/// Ray bias of shadow rays when the render settings hold none that can be used.
+constexpr float kDefaultShadowBias = 0.005f;
+
+/// The shadow tracer of a run from its render settings: the ray bias (a bias that is not a
+/// positive finite number gives kDefaultShadowBias), minShadowRays, maxShadowRays, and the
+/// occlusion queries of the built acceleration structure (null: no shadow rays).
+ShadowTracer shadowTracerFor(const RenderSettingsBase &render, const ADSInterface *structure);
+
 /// Most shadow rays one sampler traces for one query.
 constexpr uint32_t kMaxShadowSamples = 256;
 /// Ray depth at which shadows are no longer traced.

@@ -9,6 +9,7 @@
 #include <memory>
 #include <vector>
 
+#include "config/ox_config.h"
 #include "core/message.h"
 #include "core/random.h"
 #include "raytrace/complete_grid.h"
@@ -602,6 +603,62 @@ TEST(ImageBasedLight, ShadowedSubLights) {
     ctx.singleShadowRay = true;
     EXPECT_EQ(light.illuminate({0, 0, 0}, {0, 0, 1}, ctx, true).r, 0.0f);
     EXPECT_NEAR(light.illuminate({0, 0, 2}, {0, 0, 1}, ctx, true).r, 1.0f, 0.02f);
+}
+
+TEST(OtherLights, SurfaceDirectionClampToIntensityAndTracerSettings) {
+    // Point-like lights give one direction from both operations.
+    LightParameters p = whiteLight(LightType::kPoint, Mtx4::translation({0, 1, 0}));
+    bool shadows;
+    std::unique_ptr<LightSource> pointLike[] = {
+        createLight(p, shadows), createLight(whiteLight(LightType::kDirectional, Mtx4()), shadows),
+        std::make_unique<SimpleAmbientLight>("a", Color(1, 1, 1, 1)),
+        std::make_unique<AlbedoLight>()};
+    for (const auto &l : pointLike)
+        for (Vec3 at : {Vec3(0, 0, 0), Vec3(3, -2, 1), Vec3(0, 1, 0)})
+            EXPECT_EQ(l->directionToLightSurface(at), l->directionToLight(at)) << l->className();
+    EXPECT_EQ(pointLike[2]->directionToLightSurface({}), Vec3(0, 1, 0));
+    EXPECT_EQ(pointLike[3]->directionToLightSurface({}), Vec3(0, 0, 1));
+
+    // The area light (the square at z = 1 facing down) points at its nearest point; under the
+    // square that is straight up.
+    p = whiteLight(LightType::kArea, downwardSquare(1.0f));
+    p.falloffExponent = 2.0f;
+    p.decayClampToOne = false;
+    auto area = make<SimpleAreaLight>(p);
+    const Vec3 side = area->directionToLightSurface({3, 0, 0});
+    EXPECT_NEAR(side.x, -2.0f / std::sqrt(5.0f), 1e-6f);
+    EXPECT_NEAR(side.z, 1.0f / std::sqrt(5.0f), 1e-6f);
+    EXPECT_EQ(area->directionToLightSurface({0.5f, 0.2f, 0}), Vec3(0, 0, 1));
+
+    // ClampToIntensity: (1 / d)^2 near the light is held at the colour.
+    LightContext ctx;
+    p.clampToIntensity = true;
+    auto clamped = make<SimpleAreaLight>(p);
+    const struct {
+        float z, plain, clamped;
+    } distances[] = {{0.5f, 4.0f, 1.0f}, {0.0f, 1.0f, 1.0f}, {-1.0f, 0.25f, 0.25f}};
+    for (const auto &d : distances) {
+        EXPECT_FLOAT_EQ(area->illuminate({0, 0, d.z}, {0, 0, 1}, ctx, false).r, d.plain);
+        EXPECT_FLOAT_EQ(clamped->illuminate({0, 0, d.z}, {0, 0, 1}, ctx, false).r, d.clamped);
+    }
+
+    // The shadow tracer of a run from its render settings.
+    Blocker blocker = ceiling();
+    OXConfig config;
+    RenderSettingsBase &render = config.RenderSettings;
+    render.minShadowRays = 3u;
+    render.maxShadowRays = 40u;
+    const struct {
+        float bias, want;
+    } biases[] = {{0.02f, 0.02f}, {0.0f, 0.005f}, {-1.0f, 0.005f}, {NAN, 0.005f}};
+    for (const auto &b : biases) {
+        render.bias = b.bias;
+        const ShadowTracer t = shadowTracerFor(render, &blocker.grid);
+        EXPECT_EQ(t.bias, b.want);
+        EXPECT_EQ(t.ads, &blocker.grid);
+        EXPECT_EQ(t.minShadowRays, 3u);
+        EXPECT_EQ(t.maxShadowRays, 40u);
+    }
 }
 
 TEST(OtherLights, EnvironmentOverTheHemisphere) {
