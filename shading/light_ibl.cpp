@@ -171,19 +171,19 @@ Color KDHDRLight::sum(const Vec3 &p, const Vec3 &n, LightContext &ctx, bool with
                         ctx.rayDepth < kShadowDepthLimit;
     // Noise instead of banding: shadow rays jitter over their region by this fraction.
     const float jitter = 1.0f - std::clamp(bandingVsNoise_, 0.0f, 1.0f);
-    auto blocked = [&](const IBLSubLight &l) {
+    auto transmitted = [&](const IBLSubLight &l) {
         Vec3 d = l.direction;
         if (jitter > 0.0f && ctx.random) {
             const float a = 2.0f * ctx.random->next() - 1.0f, b = 2.0f * ctx.random->next() - 1.0f;
             d = (d + (l.spreadU * a + l.spreadV * b) * jitter).normalized();
         }
-        return shadowSegmentBlocked(p, p + d * kReach, ctx);
+        return shadowSegmentTransmission(p, p + d * kReach, ctx);
     };
     Color total;
     if (!traced || !ctx.singleShadowRay) {
         for (const IBLSubLight &l : lights_) {
             const float c = dot(l.direction, n);
-            if (c > 0.0f && !(traced && blocked(l))) total += l.color * c;
+            if (c > 0.0f) total += traced ? l.color * transmitted(l) * c : l.color * c;
         }
         return total * scale;
     }
@@ -206,7 +206,7 @@ Color KDHDRLight::sum(const Vec3 &p, const Vec3 &n, LightContext &ctx, bool with
         pick -= l.color.luminance() * c;
         if (pick < 0.0f) break;
     }
-    return chosen && blocked(*chosen) ? Color::black() : total * scale;
+    return chosen ? total * transmitted(*chosen) * scale : total * scale;
 }
 
 Color KDHDRLight::illuminate(const Vec3 &p, const Vec3 &n, LightContext &ctx,

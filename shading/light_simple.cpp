@@ -239,7 +239,7 @@ Color EnvironmentLight::illuminate(const Vec3 &p, const Vec3 &n, LightContext &c
             const float r2 = ctx.random ? ctx.random->next() : 0.5f;
             const Vec3 d =
                 hemisphereDirection((float(i) + r1) / g.nx, (float(j) + r2) / g.ny, w, u, v);
-            if (!shadowSegmentBlocked(p, p + d * reach, ctx)) sum += shader_->evaluateDirection(d);
+            sum += shader_->evaluateDirection(d) * shadowSegmentTransmission(p, p + d * reach, ctx);
         }
     return sum * (intensityScale(ctx.rayType) / float(uint32_t(g.nx) * g.ny));
 }

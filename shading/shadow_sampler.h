@@ -70,6 +70,14 @@ void perpendicularBasis(const Vec3 &w, Vec3 &u, Vec3 &v);
 /// ends); a segment no longer than twice the bias is never blocked.
 bool shadowSegmentBlocked(const Vec3 &p, const Vec3 &target, LightContext &ctx);
 
+/// Most surfaces one shadow ray passes; a ray that meets more counts as blocked.
+constexpr int kMaxTransparentHits = 64;
+
+/// The colour that reaches p from target: white when nothing lies between, black past an
+/// opaque surface, the product of the transparency colours of the surfaces passed when the
+/// tracer knows them (alpha is the mean of R, G and B).
+Color shadowSegmentTransmission(const Vec3 &p, const Vec3 &target, LightContext &ctx);
+
 /// Transmission from p towards a disk of radius s.size around the light position, the disk
 /// facing p.
 Color tracePointShadow(const ShadowSamplerSettings &s, const Vec3 &lightPosition, const Vec3 &p,

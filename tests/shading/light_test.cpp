@@ -215,21 +215,26 @@ TEST(AreaLight, SidesAndCosineOverTheRectangle) {
     EXPECT_LT(half, 0.5f);
 }
 
-// A scene of one blocking rectangle from (x0, y0) to (x1, y1) at height z.
+// A scene of blocking quads, four corners each.
 struct Blocker {
     std::vector<Vec3> positions;
-    std::vector<uint32_t> indices{0, 1, 2, 0, 2, 3};
+    std::vector<uint32_t> indices;
     CompleteGrid grid;
     ShadowTracer tracer;
 
-    Blocker(Vec3 a, Vec3 b, Vec3 c, Vec3 d) : positions{a, b, c, d} { build(); }
+    Blocker(Vec3 a, Vec3 b, Vec3 c, Vec3 d) : Blocker(std::vector<Vec3>{a, b, c, d}) {}
+    explicit Blocker(std::vector<Vec3> quads) : positions(std::move(quads)) {
+        for (uint32_t q = 0; q + 4 <= positions.size(); q += 4)
+            indices.insert(indices.end(), {q, q + 1, q + 2, q, q + 2, q + 3});
+        build();
+    }
     void build() {
         InstanceInput in;
         in.name = "blocker";
         in.mesh.positions = positions.data();
         in.mesh.vertexCount = positions.size();
         in.mesh.indices = indices.data();
-        in.mesh.triangleCount = 2;
+        in.mesh.triangleCount = indices.size() / 3;
         in.flags = 0x4EDFF;
         in.index = 0;
         EXPECT_TRUE(grid.build({in}, ADSParameters()));
@@ -288,6 +293,56 @@ TEST(ShadowSampling, HalfBlockedAreaLight) {
     ctx.allowShadows = true;
     p.castShadows = false;
     EXPECT_EQ(make<SimpleAreaLight>(p)->shadowTransmission({0, 0, 0}, ctx, 1.0f), Color::white());
+}
+
+// Surfaces of one transparency colour.
+struct TintedSurfaces : ShadowTransparencyInterface {
+    Color tint;
+    explicit TintedSurfaces(Color c) : tint(c) {}
+    Color transparency(const Ray &, const Hit &) const override { return tint; }
+};
+
+TEST(ShadowSampling, SemiTransparentOccluders) {
+    // The half-blocked area light behind a tinted blocker: the hidden half passes the tint.
+    Blocker half = halfPlane();
+    TintedSurfaces tint(Color(0.5f, 0.25f, 1.0f, 1));
+    half.tracer.transparency = &tint;
+    LightParameters p = whiteLight(LightType::kArea, downwardSquare(2.0f));
+    p.castShadows = true;
+    p.shadowSamples = 64;
+    Random random(4);
+    LightContext ctx;
+    ctx.tracer = &half.tracer;
+    ctx.random = &random;
+    const Color t = make<SimpleAreaLight>(p)->shadowTransmission({0, 0, 0}, ctx, 1.0f);
+    EXPECT_EQ(Vec3(t.r, t.g, t.b), Vec3(0.75f, 0.625f, 1.0f));
+
+    // Two sheets between a point light and the point multiply; channels outside [0, 1] and NaN
+    // are taken within it (NaN as opaque).
+    Blocker sheets({{-50, -50, 1},
+                    {50, -50, 1},
+                    {50, 50, 1},
+                    {-50, 50, 1},  //
+                    {-50, -50, 2},
+                    {50, -50, 2},
+                    {50, 50, 2},
+                    {-50, 50, 2}});
+    sheets.tracer.transparency = &tint;
+    ctx.tracer = &sheets.tracer;
+    p = whiteLight(LightType::kPoint, Mtx4::translation({0, 0, 3}));
+    p.castShadows = true;
+    auto point = make<SimplePointLight>(p);
+    const struct {
+        Color tint, want;
+    } cases[] = {{{0.5f, 0.5f, 0.5f, 1}, {0.25f, 0.25f, 0.25f, 0.25f}},
+                 {{NAN, -1, 2, 1}, {0, 0, 1, 1.0f / 3.0f}},
+                 {{0, 0, 0, 1}, Color::black()}};
+    for (const auto &c : cases) {
+        tint.tint = c.tint;
+        const Color got = point->shadowTransmission({0, 0, 0}, ctx, 1.0f);
+        EXPECT_EQ(Vec3(got.r, got.g, got.b), Vec3(c.want.r, c.want.g, c.want.b));
+        EXPECT_NEAR(got.a, c.want.a, 1e-6f);
+    }
 }
 
 TEST(ShadowSampling, StratifiedHalvesTheErrorOfPlainRandom) {
