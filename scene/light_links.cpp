@@ -10,7 +10,8 @@ namespace {
 std::unordered_map<std::string, uint32_t> indexByName(const std::vector<LightLinkEntry> &entries) {
     std::unordered_map<std::string, uint32_t> map;
     map.reserve(entries.size());
-    for (uint32_t i = 0; i < entries.size(); ++i) map.try_emplace(entries[i].name, i);
+    for (uint32_t i = 0; i < entries.size(); ++i)
+        if (entries[i].named) map.try_emplace(entries[i].name, i);
     return map;
 }
 

@@ -15,6 +15,8 @@ struct LightLinkEntry {
     std::string name;
     LinkMode mode = LinkMode::kNone;
     std::vector<std::string> links;
+    /// False for lights the system made itself (they share names): link lists cannot name them.
+    bool named = true;
 };
 
 /// Which light reaches which instance: one bit row per instance (scene order), one bit per light

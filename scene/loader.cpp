@@ -9,6 +9,7 @@
 #include "scene/material_converter.h"
 #include "scene/scene_elements.h"
 #include "scene/vtm.h"
+#include "shading/texture_lookup.h"
 
 namespace ox {
 namespace {
@@ -75,6 +76,18 @@ std::unique_ptr<Camera> createCamera(const XMLCameraCompact &r,
         default:
             return nullptr;
     }
+}
+
+// Loads a spot light's gobo through the texture manager; a file that cannot be decoded leaves
+// the light without gobo (after one message naming it).
+void attachGobo(SimpleSpotLight &spot, TextureFactory &textures) {
+    if (spot.goboFile().empty()) return;
+    std::shared_ptr<const OXTexture> texture = textures.getTexture(spot.goboFile(), kFilterEWA);
+    if (!texture || texture->resolution().x <= 0 || texture->resolution().y <= 0) {
+        message(kMsgError, 3, "Gobo file %s failed to load", spot.goboFile().c_str());
+        return;
+    }
+    spot.setGoboTexture(std::make_shared<OXTextureLookup>(std::move(texture)));
 }
 
 }  // namespace
@@ -285,6 +298,8 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
         bool castShadows = false;
         auto light = createLight(r->light, castShadows);
         if (!light) continue;
+        if (auto *spot = dynamic_cast<SimpleSpotLight *>(light.get()))
+            attachGobo(*spot, scene.textures());
         const bool environment = r->light.type == LightType::kEnvironment;
         if (environment && castShadows)
             scene.addShadowedEnvironmentLight(std::move(light), linkMode(r->lightLinkMode),
@@ -297,8 +312,12 @@ bool ZPXLoader::load(const std::vector<std::string> &inputs, const SceneLoadSett
         scene.addLight(std::make_unique<SimpleAmbientLight>("globalAmbientLight", ambient),
                        LinkMode::kNone, {});
     if (settings.environment.iblEmitLight && settings.environment.iblImageFile != "-") {
-        if (auto ibl = createImageBasedLight(settings.environment))
+        if (auto ibl = createImageBasedLight(settings.environment, scene.textures())) {
+            std::vector<std::unique_ptr<KDSpecularSubLight>> specular;
+            if (ibl->emitSpecular()) specular = ibl->makeSpecularSubLights();
             scene.addLight(std::move(ibl), LinkMode::kNone, {});
+            for (auto &sub : specular) scene.addGeneratedLight(std::move(sub));
+        }
     }
 
     Timer linkTimer;

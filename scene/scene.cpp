@@ -72,6 +72,15 @@ bool Scene::addShadowedEnvironmentLight(std::unique_ptr<LightSource> light, Link
     return true;
 }
 
+bool Scene::addGeneratedLight(std::unique_ptr<LightSource> light) {
+    if (!light) return false;
+    LightLinkEntry entry{light->name(), LinkMode::kNone, {}};
+    entry.named = false;
+    lights_.push_back(std::move(light));
+    lightLinks_.push_back(std::move(entry));
+    return true;
+}
+
 const LightSource *Scene::findLight(const std::string &name) const {
     auto it = lightIndex_.find(name);
     return it == lightIndex_.end() ? nullptr : lights_[it->second].get();

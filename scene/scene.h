@@ -60,7 +60,12 @@ public:
     /// Adds an environment light that casts shadows (the GI code samples these itself).
     bool addShadowedEnvironmentLight(std::unique_ptr<LightSource> light, LinkMode mode,
                                      std::vector<std::string> instances);
-    /// The light of this name, or null.
+    /// Adds a light the system made itself (the image-based light's specular sub-lights, which
+    /// share one name): kept apart from the named lights, so it neither takes a name nor is
+    /// refused for one, and link lists cannot name it; it reaches every instance whose own link
+    /// mode is NONE.
+    bool addGeneratedLight(std::unique_ptr<LightSource> light);
+    /// The light of this name among the lights added by name, or null.
     const LightSource *findLight(const std::string &name) const;
     const std::vector<std::unique_ptr<LightSource>> &lights() const { return lights_; }
     /// Indices (into lights()) of the environment lights that cast shadows.

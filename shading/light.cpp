@@ -259,14 +259,6 @@ KDHDRLight::KDHDRLight(const EnvironmentValues &v)
 
 KDHDRLight::~KDHDRLight() = default;
 
-std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values) {
-    if (!FileSystemUtilities::canRead(values.iblImageFile)) {
-        message(kMsgError, 6, "Error reading IBL lightprobe");
-        return nullptr;
-    }
-    return std::make_unique<KDHDRLight>(values);
-}
-
 std::unique_ptr<LightSource> createLight(const LightParameters &p, bool &castShadows) {
     castShadows = p.castShadows;
     switch (p.type) {

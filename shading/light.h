@@ -14,6 +14,8 @@
 
 namespace ox {
 
+class TextureFactory;
+
 /// The distance attenuation models of the scene ("STANDARD" 0, "UNREAL" 1).
 enum class AttenuationType : int32_t { kStandard = 0, kUnreal = 1 };
 
@@ -173,6 +175,10 @@ public:
     }
     /// Unit direction from p towards the light; the zero vector at the light's own position.
     virtual Vec3 directionToLight(const Vec3 &p) const = 0;
+    /// Unit direction from p towards the nearest point of the light's emitting surface: the
+    /// same as `directionToLight` for point-like lights (point, spot, directional, ambient,
+    /// albedo); an area light points at the nearest point of its rectangle. Zero on the light.
+    virtual Vec3 directionToLightSurface(const Vec3 &p) const { return directionToLight(p); }
     /// Distance from p to the light's position; -1 for lights without a position.
     virtual float distanceTo(const Vec3 &) const { return -1.0f; }
     /// Radiance a camera sees on the light itself (black for every light).
@@ -328,7 +334,8 @@ private:
 };
 
 /// An area light: the square -1..1 in the light's x-y plane, lighting the +z side. The shadow
-/// sampler integrates over the rectangle; attenuation uses the distance to the centre.
+/// sampler integrates over the rectangle; attenuation uses the distance to the centre (at most
+/// 1 with ClampToIntensity).
 class SimpleAreaLight : public SimpleLightSourceBase {
 public:
     explicit SimpleAreaLight(const LightParameters &p);
@@ -340,12 +347,15 @@ public:
     /// rectangle to the hemisphere of n and integrating over its edges).
     float cosineFactor(const Vec3 &p, const Vec3 &n) const override;
     Vec3 directionToLight(const Vec3 &p) const override { return (center_ - p).normalized(); }
+    Vec3 directionToLightSurface(const Vec3 &p) const override;
     float distanceTo(const Vec3 &p) const override { return (center_ - p).length(); }
     /// In front of the light and closer to its centre than DecayCutoff.
     bool affectsPoint(const Vec3 &p) const override;
 
     const Vec3 &center() const { return center_; }
     const Vec3 &normal() const { return normal_; }
+    /// True when the light never gets brighter than its colour: the attenuation near the light
+    /// is clamped to 1 whatever the attenuation model.
     bool clampToIntensity() const { return clampToIntensity_; }
     /// The four corners in world space.
     const Vec3 *corners() const { return corners_; }
@@ -369,6 +379,7 @@ public:
         return dot(directionToLight(p), n);
     }
     Vec3 directionToLight(const Vec3 &) const override { return -normal_; }
+    Vec3 directionToLightSurface(const Vec3 &) const override { return -normal_; }
     /// Half opening angle in radians.
     float halfAngle() const { return halfAngle_; }
     float tanHalfAngle() const { return tanHalfAngle_; }
@@ -531,8 +542,18 @@ int64_t iblScaledPhotonEnergy(int32_t energy);
 /// castShadows receives the CastShadows flag (environment lights are added differently).
 std::unique_ptr<LightSource> createLight(const LightParameters &p, bool &castShadows);
 
-/// Makes the image-based light; null (with the error "Error reading IBL lightprobe") when the
-/// probe image cannot be read.
-std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values);
+/// Widest probe the image-based light splits: larger probes are read from the first mip level
+/// at most this wide and high (the levels keep the mean, so the energy is the same).
+constexpr int32_t kMaxLightProbeSide = 2048;
+
+/// Reads a light probe through the texture manager into plain floats (rows from the bottom);
+/// false (after the texture manager's message) when the file cannot be read.
+bool readLightProbe(TextureFactory &textures, const std::string &file, LightProbeImage &out,
+                    int32_t maxSide = kMaxLightProbeSide);
+
+/// Makes the image-based light with its sub-lights from the probe file iblImageFile; null (with
+/// the error "Error reading IBL lightprobe") when the probe cannot be read.
+std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values,
+                                                  TextureFactory &textures);
 
 }  // namespace ox

@@ -10,6 +10,17 @@ namespace ox {
 class ADSInterface;
 class Random;
 
+/// What a shadow ray keeps of its light where it passes a surface. The code that knows the
+/// scene's materials implements it; shadow rays ask it once per surface they pass, and only
+/// when a tracer has one (without it every surface is opaque).
+class ShadowTransparencyInterface {
+public:
+    virtual ~ShadowTransparencyInterface() = default;
+    /// The transparency colour of the surface hit by a shadow ray: white passes all light,
+    /// black (the answer for opaque surfaces) none. Channels are taken within [0, 1].
+    virtual Color transparency(const Ray &ray, const Hit &hit) const = 0;
+};
+
 /// Scene-wide, read-only inputs of shadow tracing, set up once before rendering and shared by
 /// every render thread.
 struct ShadowTracer {
@@ -22,6 +33,8 @@ struct ShadowTracer {
     /// maxShadowRays); the samplers never trace fewer than 1 or more than 256.
     uint32_t minShadowRays = 0;
     uint32_t maxShadowRays = 0xFFFFFFFFu;
+    /// The transparency of the surfaces shadow rays pass; null: every surface is opaque.
+    const ShadowTransparencyInterface *transparency = nullptr;
 };
 
 /// The calling thread's state for the light operations: owned by one render thread, never shared,

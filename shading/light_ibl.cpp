@@ -2,8 +2,10 @@
 #include <algorithm>
 #include <cmath>
 
+#include "core/message.h"
 #include "core/random.h"
 #include "shading/light.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 namespace {
@@ -169,19 +171,19 @@ Color KDHDRLight::sum(const Vec3 &p, const Vec3 &n, LightContext &ctx, bool with
                         ctx.rayDepth < kShadowDepthLimit;
     // Noise instead of banding: shadow rays jitter over their region by this fraction.
     const float jitter = 1.0f - std::clamp(bandingVsNoise_, 0.0f, 1.0f);
-    auto blocked = [&](const IBLSubLight &l) {
+    auto transmitted = [&](const IBLSubLight &l) {
         Vec3 d = l.direction;
         if (jitter > 0.0f && ctx.random) {
             const float a = 2.0f * ctx.random->next() - 1.0f, b = 2.0f * ctx.random->next() - 1.0f;
             d = (d + (l.spreadU * a + l.spreadV * b) * jitter).normalized();
         }
-        return shadowSegmentBlocked(p, p + d * kReach, ctx);
+        return shadowSegmentTransmission(p, p + d * kReach, ctx);
     };
     Color total;
     if (!traced || !ctx.singleShadowRay) {
         for (const IBLSubLight &l : lights_) {
             const float c = dot(l.direction, n);
-            if (c > 0.0f && !(traced && blocked(l))) total += l.color * c;
+            if (c > 0.0f) total += traced ? l.color * transmitted(l) * c : l.color * c;
         }
         return total * scale;
     }
@@ -204,7 +206,7 @@ Color KDHDRLight::sum(const Vec3 &p, const Vec3 &n, LightContext &ctx, bool with
         pick -= l.color.luminance() * c;
         if (pick < 0.0f) break;
     }
-    return chosen && blocked(*chosen) ? Color::black() : total * scale;
+    return chosen ? total * transmitted(*chosen) * scale : total * scale;
 }
 
 Color KDHDRLight::illuminate(const Vec3 &p, const Vec3 &n, LightContext &ctx,
@@ -247,6 +249,38 @@ Color KDSpecularSubLight::shadowTransmission(const Vec3 &p, LightContext &ctx,
                                              float importance) const {
     if (!castsShadowsFor(ctx)) return Color::white();
     return traceDirectionalShadow(shadow_, direction_, nullptr, p, ctx, importance);
+}
+
+bool readLightProbe(TextureFactory &textures, const std::string &file, LightProbeImage &out,
+                    int32_t maxSide) {
+    const std::shared_ptr<const MipImage> image = textures.getImage(file);
+    if (!image || image->levelCount() == 0) return false;
+    int level = 0;
+    while (level + 1 < image->levelCount() &&
+           (image->level(level).width() > maxSide || image->level(level).height() > maxSide))
+        ++level;
+    const TexelBuffer &b = image->level(level);
+    if (b.width() <= 0 || b.height() <= 0) return false;
+    LightProbeImage probe;
+    probe.width = b.width();
+    probe.height = b.height();
+    probe.texels.resize(size_t(b.width()) * size_t(b.height()));
+    for (int32_t y = 0; y < b.height(); ++y)
+        for (int32_t x = 0; x < b.width(); ++x)
+            probe.texels[size_t(y) * size_t(b.width()) + size_t(x)] = b.texel(x, y);
+    out = std::move(probe);
+    return true;
+}
+
+std::unique_ptr<KDHDRLight> createImageBasedLight(const EnvironmentValues &values,
+                                                  TextureFactory &textures) {
+    LightProbeImage probe;
+    auto light = std::make_unique<KDHDRLight>(values);
+    if (!readLightProbe(textures, values.iblImageFile, probe) || !light->buildSubLights(probe)) {
+        message(kMsgError, 6, "Error reading IBL lightprobe");
+        return nullptr;
+    }
+    return light;
 }
 
 }  // namespace ox

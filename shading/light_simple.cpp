@@ -122,7 +122,8 @@ Color SimpleAreaLight::illuminate(const Vec3 &p, const Vec3 &, LightContext &ctx
                                   bool withShadow) const {
     const Vec3 fromCenter = p - center_;
     if (dot(normal_, fromCenter) < 0.0f) return Color::black();
-    const float a = attenuationAt(fromCenter.length(), ctx);
+    float a = attenuationAt(fromCenter.length(), ctx);
+    if (clampToIntensity_) a = std::fmin(a, 1.0f);
     if (color_.luminance() * a < kLightCutLuminance) return Color::black();
     Color c = color_ * (a * intensityScale(ctx.rayType));
     if (withShadow) c = c * shadowTransmission(p, ctx, 1.0f);
@@ -163,6 +164,14 @@ float SimpleAreaLight::cosineFactor(const Vec3 &p, const Vec3 &n) const {
         integral += angle * dot(g, n) / gl;
     }
     return std::clamp(0.5f * std::fabs(integral) / omega, 0.0f, 1.0f);
+}
+
+Vec3 SimpleAreaLight::directionToLightSurface(const Vec3 &p) const {
+    // The nearest point of the rectangle: p in light space, clamped to the square.
+    const Vec3 local = worldToLight_.transformPoint(p);
+    const Vec3 onSquare(std::clamp(local.x, -1.0f, 1.0f), std::clamp(local.y, -1.0f, 1.0f), 0.0f);
+    const Vec3 d = objectToWorld_.transformPoint(onSquare) - p;
+    return std::isfinite(d.x + d.y + d.z) ? d.normalized() : directionToLight(p);
 }
 
 bool SimpleAreaLight::affectsPoint(const Vec3 &p) const {
@@ -230,7 +239,7 @@ Color EnvironmentLight::illuminate(const Vec3 &p, const Vec3 &n, LightContext &c
             const float r2 = ctx.random ? ctx.random->next() : 0.5f;
             const Vec3 d =
                 hemisphereDirection((float(i) + r1) / g.nx, (float(j) + r2) / g.ny, w, u, v);
-            if (!shadowSegmentBlocked(p, p + d * reach, ctx)) sum += shader_->evaluateDirection(d);
+            sum += shader_->evaluateDirection(d) * shadowSegmentTransmission(p, p + d * reach, ctx);
         }
     return sum * (intensityScale(ctx.rayType) / float(uint32_t(g.nx) * g.ny));
 }

@@ -4,6 +4,7 @@
 #include <array>
 #include <cmath>
 
+#include "config/settings_render.h"
 #include "core/random.h"
 #include "raytrace/complete_grid.h"
 
@@ -31,21 +32,33 @@ inline float draw(LightContext &ctx) { return ctx.random ? ctx.random->next() : 
 inline Color gray(float f) { return Color(f, f, f, f); }
 
 // Shared loop of the samplers: target(a, b) gives the ray target for the square coordinates
-// (a, b) in [-1, 1]^2, or false when the ray is blocked without tracing.
+// (a, b) in [-1, 1]^2, or false when the ray is blocked without tracing. Opaque scenes count
+// the open rays; with transparent surfaces the transmitted colours are averaged.
 template <typename Target>
 Color stratified(uint32_t n, LightContext &ctx, const Vec3 &p, Target &&target) {
     const ShadowGrid g = shadowGridLayout(n);
     const float sx = 2.0f / float(g.nx), sy = 2.0f / float(g.ny);
+    const float count = float(uint32_t(g.nx) * g.ny);
+    const bool opaque = ctx.tracer->transparency == nullptr;
     uint32_t open = 0;
+    Color sum;
     for (uint32_t j = 0; j < g.ny; ++j)
         for (uint32_t i = 0; i < g.nx; ++i) {
             const float r1 = draw(ctx), r2 = draw(ctx);
             const float a = (float(i) + r1) * sx - 1.0f, b = (float(j) + r2) * sy - 1.0f;
             Vec3 q;
-            if (target(a, b, q) && !shadowSegmentBlocked(p, q, ctx)) ++open;
+            if (!target(a, b, q)) continue;
+            if (opaque)
+                open += shadowSegmentBlocked(p, q, ctx) ? 0u : 1u;
+            else
+                sum += shadowSegmentTransmission(p, q, ctx);
         }
-    return gray(float(open) / float(uint32_t(g.nx) * g.ny));
+    if (opaque) return gray(float(open) / count);
+    return Color(sum.r / count, sum.g / count, sum.b / count, sum.a / count);
 }
+
+// A transparency channel within [0, 1] (NaN counts as opaque).
+inline float channel(float c) { return c > 0.0f ? (c < 1.0f ? c : 1.0f) : 0.0f; }
 
 // The steps every sampler starts with: white at the depth limit or without occlusion queries.
 inline bool traces(const ShadowSamplerSettings &s, const LightContext &ctx) {
@@ -53,6 +66,16 @@ inline bool traces(const ShadowSamplerSettings &s, const LightContext &ctx) {
 }
 
 }  // namespace
+
+ShadowTracer shadowTracerFor(const RenderSettingsBase &render, const ADSInterface *structure) {
+    ShadowTracer t;
+    t.ads = structure;
+    const float bias = render.bias();
+    t.bias = bias > 0.0f && std::isfinite(bias) ? bias : kDefaultShadowBias;
+    t.minShadowRays = render.minShadowRays();
+    t.maxShadowRays = render.maxShadowRays();
+    return t;
+}
 
 ShadowGrid shadowGridLayout(uint32_t n) {
     return kGridTable[std::clamp<uint32_t>(n, 1, kMaxShadowSamples)];
@@ -108,13 +131,44 @@ bool shadowSegmentBlocked(const Vec3 &p, const Vec3 &target, LightContext &ctx) 
     return ctx.tracer->ads->occluded(ray, len - 2.0f * bias, ctx.counter);
 }
 
+Color shadowSegmentTransmission(const Vec3 &p, const Vec3 &target, LightContext &ctx) {
+    const ShadowTransparencyInterface *transparency = ctx.tracer->transparency;
+    if (!transparency)
+        return shadowSegmentBlocked(p, target, ctx) ? Color::black() : Color::white();
+    const float bias = ctx.bias();
+    Vec3 d = target - p;
+    const float len = d.length();
+    if (!(len > 2.0f * bias) || !std::isfinite(len)) return Color::white();
+    d *= 1.0f / len;
+    Ray ray;
+    ray.origin = p + d * bias;
+    ray.direction = d;
+    ray.type = kRayShadow;
+    ray.time = ctx.time;
+    float remaining = len - 2.0f * bias;
+    float r = 1.0f, g = 1.0f, b = 1.0f;
+    for (int k = 0; k < kMaxTransparentHits; ++k) {
+        Hit hit;
+        if (!ctx.tracer->ads->intersect(ray, hit, remaining, ctx.counter) || !hit.found())
+            return Color(r, g, b, (r + g + b) / 3.0f);
+        const Color t = transparency->transparency(ray, hit);
+        r *= channel(t.r), g *= channel(t.g), b *= channel(t.b);
+        if (!(r > 0.0f || g > 0.0f || b > 0.0f)) return Color::black();
+        // Go on past the surface.
+        const float step = hit.t + bias;
+        remaining -= step;
+        if (!(remaining > 0.0f)) return Color(r, g, b, (r + g + b) / 3.0f);
+        ray.origin = ray.origin + d * step;
+    }
+    return Color::black();
+}
+
 Color tracePointShadow(const ShadowSamplerSettings &s, const Vec3 &lightPosition, const Vec3 &p,
                        LightContext &ctx, float importance) {
     if (!traces(s, ctx)) return Color::white();
     // Every ray towards a disk of radius 0 is the same ray: one ray, no draws.
     const float radius = s.size > 0.0f && std::isfinite(s.size) ? s.size : 0.0f;
-    if (radius == 0.0f)
-        return shadowSegmentBlocked(p, lightPosition, ctx) ? Color::black() : Color::white();
+    if (radius == 0.0f) return shadowSegmentTransmission(p, lightPosition, ctx);
     const Vec3 w = (lightPosition - p).normalized();
     Vec3 u, v;
     perpendicularBasis(w, u, v);
@@ -150,8 +204,7 @@ Color traceDirectionalShadow(const ShadowSamplerSettings &s, const Vec3 &toLight
     const float spread = std::tan(angle);
     const uint32_t n = spread > 0.0f ? shadowSampleCount(s, ctx, importance) : 1;
     if (spread == 0.0f && !window)
-        return shadowSegmentBlocked(p, p + toLight * kDirectionalReach, ctx) ? Color::black()
-                                                                             : Color::white();
+        return shadowSegmentTransmission(p, p + toLight * kDirectionalReach, ctx);
     u *= spread;
     v *= spread;
     return stratified(n, ctx, p, [&](float a, float b, Vec3 &q) {

@@ -9,6 +9,16 @@
 /// three samplers (towards a disk around a point, over a rectangle, within a cone of directions).
 namespace ox {
 
+class RenderSettingsBase;
+
+/// Ray bias of shadow rays when the render settings hold none that can be used.
+constexpr float kDefaultShadowBias = 0.005f;
+
+/// The shadow tracer of a run from its render settings: the ray bias (a bias that is not a
+/// positive finite number gives kDefaultShadowBias), minShadowRays, maxShadowRays, and the
+/// occlusion queries of the built acceleration structure (null: no shadow rays).
+ShadowTracer shadowTracerFor(const RenderSettingsBase &render, const ADSInterface *structure);
+
 /// Most shadow rays one sampler traces for one query.
 constexpr uint32_t kMaxShadowSamples = 256;
 /// Ray depth at which shadows are no longer traced.
@@ -59,6 +69,14 @@ void perpendicularBasis(const Vec3 &w, Vec3 &u, Vec3 &v);
 /// True when something lies between p and target (the segment shortened by the bias at both
 /// ends); a segment no longer than twice the bias is never blocked.
 bool shadowSegmentBlocked(const Vec3 &p, const Vec3 &target, LightContext &ctx);
+
+/// Most surfaces one shadow ray passes; a ray that meets more counts as blocked.
+constexpr int kMaxTransparentHits = 64;
+
+/// The colour that reaches p from target: white when nothing lies between, black past an
+/// opaque surface, the product of the transparency colours of the surfaces passed when the
+/// tracer knows them (alpha is the mean of R, G and B).
+Color shadowSegmentTransmission(const Vec3 &p, const Vec3 &target, LightContext &ctx);
 
 /// Transmission from p towards a disk of radius s.size around the light position, the disk
 /// facing p.

@@ -10,6 +10,7 @@
 #include "scene/material_converter.h"
 #include "scene_test_util.h"
 #include "shading/phong.h"
+#include "tests/support/tga_file.h"
 
 namespace ox {
 namespace {
@@ -293,6 +294,70 @@ TEST(ZPXLoader, FailuresStopTheLoad) {
     SceneFiles empty;
     empty.xml("empty.xml", "");
     EXPECT_EQ(fail(empty, s).error, "Unable to create environment");
+}
+
+TEST(ZPXLoader, GobosProbesAndGeneratedLights) {
+    SceneFiles f;
+    // A 2 x 2 gobo, rows from the bottom: red, green, then blue, white.
+    const std::string gobo = f.dir.file("gobo.tga"), bad = f.dir.file("bad.tga");
+    const std::string probe = f.dir.file("probe.tga");
+    ASSERT_TRUE(
+        oxtest::writeTGA(gobo, 2, 2, {{255, 0, 0}, {0, 255, 0}, {0, 0, 255}, {255, 255, 255}}));
+    ASSERT_TRUE(oxtest::writeTGA(probe, 8, 4, {32, {255, 255, 255}}));
+    test::writeBytes(bad, {'n', 'o', 't'});
+    const std::string spot =
+        "<Color><r>1</r><g>1</g><b>1</b><a>1</a></Color>"
+        "<SpotLightConeAngle>90</SpotLightConeAngle><SpotLightGoboTexture>";
+    f.quad("a.vtm", "plane", "m");
+    f.xml("s.xml", material("m") +
+                       instance("linked", "plane",
+                                "<LightLinkMode>INCLUSIVE</LightLinkMode><LightLinkedLights>"
+                                "<element>SpecularSublight</element></LightLinkedLights>") +
+                       instance("open", "plane") +
+                       light("gobo", "SPOT", spot + gobo + "</SpotLightGoboTexture>") +
+                       light("broken", "SPOT", spot + bad + "</SpotLightGoboTexture>") +
+                       light("SpecularSublight", "POINT") + light("lamp", "POINT") +
+                       light("lamp", "POINT"));
+    SceneLoadSettings s = settings();
+    s.environment.iblEmitLight = true;
+    s.environment.iblEmitSpecular = true;
+    s.environment.iblSamples = 4;
+    s.environment.iblImageFile = probe;
+    Scene scene;
+    LoadResult r = load(f.inputs, scene, s);
+    ASSERT_TRUE(r.ok) << r.error << r.out;
+    EXPECT_EQ(test::countOf(r.out, "Gobo file " + bad + " failed to load"), 1u) << r.out;
+    EXPECT_EQ(test::countOf(r.out, "Duplicate light name"), 1u) << r.out;  // the second lamp
+
+    // The gobo over a cone of 45 degrees each side: u = 0.5 + x / 2, v = 0.5 + z / 2 one unit
+    // below the light; near the cone's edge the edge texels, never the opposite side.
+    auto *g = dynamic_cast<const SimpleSpotLight *>(scene.findLight("gobo"));
+    ASSERT_TRUE(g && g->hasGobo());
+    EXPECT_FALSE(dynamic_cast<const SimpleSpotLight *>(scene.findLight("broken"))->hasGobo());
+    LightContext ctx;
+    const struct {
+        float x, z;
+        Color want;
+    } across[] = {{-0.5f, -0.5f, {1, 0, 0, 1}},     {0.5f, -0.5f, {0, 1, 0, 1}},
+                  {-0.5f, 0.5f, {0, 0, 1, 1}},      {0.5f, 0.5f, {1, 1, 1, 1}},
+                  {0.9f, 0.0f, {0.5f, 1, 0.5f, 1}}, {0.0f, -0.9f, {0.5f, 0.5f, 0, 1}}};
+    for (const auto &a : across) {
+        const Color c = g->illuminate({a.x, -1, a.z}, {0, 1, 0}, ctx, false);
+        const float got[] = {c.r, c.g, c.b, c.a}, want[] = {a.want.r, a.want.g, a.want.b, a.want.a};
+        for (int i = 0; i < 4; ++i) EXPECT_NEAR(got[i], want[i], 1e-5f) << a.x << " " << a.z;
+    }
+
+    // The image-based light and its four specular sub-lights, kept apart from the named lights:
+    // the name still finds the scene's own light, and only that one is linkable by it.
+    ASSERT_EQ(scene.lights().size(), 4u + 1u + 4u);
+    EXPECT_STREQ(scene.lights()[4]->className(), "KDHDRLight");
+    for (uint32_t l = 5; l < 9; ++l) {
+        EXPECT_STREQ(scene.lights()[l]->className(), "KDSpecularSubLight");
+        EXPECT_FALSE(scene.lightReaches(0, l));
+        EXPECT_TRUE(scene.lightReaches(1, l));
+    }
+    EXPECT_EQ(scene.findLight("SpecularSublight"), scene.lights()[2].get());
+    EXPECT_TRUE(scene.lightReaches(0, 2));
 }
 
 TEST(ZPXLoader, ShapesEdgeCases) {

@@ -10,6 +10,7 @@
 #include "shading/light.h"
 #include "shading/material.h"
 #include "shading/phong.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 namespace {
@@ -163,7 +164,10 @@ TEST(Lights, ImageBasedLightParameters) {
 
     EnvironmentValues v;
     v.iblImageFile = "/no/such/probe.hdr";
-    std::string out = captureMessages([&] { EXPECT_EQ(createImageBasedLight(v), nullptr); });
+    std::string out = captureMessages([&] {
+        TextureFactory textures;
+        EXPECT_EQ(createImageBasedLight(v, textures), nullptr);
+    });
     EXPECT_NE(out.find("Error reading IBL lightprobe"), std::string::npos);
     KDHDRLight light(v);
     EXPECT_EQ(light.flags(), kLightDiffuse | kLightShadows);

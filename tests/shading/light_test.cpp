@@ -5,13 +5,17 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <fstream>
 #include <memory>
 #include <vector>
 
+#include "config/ox_config.h"
 #include "core/message.h"
 #include "core/random.h"
 #include "raytrace/complete_grid.h"
 #include "shading/shadow_sampler.h"
+#include "tests/support/tga_file.h"
+#include "texture/texture_factory.h"
 
 namespace ox {
 namespace {
@@ -211,21 +215,26 @@ TEST(AreaLight, SidesAndCosineOverTheRectangle) {
     EXPECT_LT(half, 0.5f);
 }
 
-// A scene of one blocking rectangle from (x0, y0) to (x1, y1) at height z.
+// A scene of blocking quads, four corners each.
 struct Blocker {
     std::vector<Vec3> positions;
-    std::vector<uint32_t> indices{0, 1, 2, 0, 2, 3};
+    std::vector<uint32_t> indices;
     CompleteGrid grid;
     ShadowTracer tracer;
 
-    Blocker(Vec3 a, Vec3 b, Vec3 c, Vec3 d) : positions{a, b, c, d} { build(); }
+    Blocker(Vec3 a, Vec3 b, Vec3 c, Vec3 d) : Blocker(std::vector<Vec3>{a, b, c, d}) {}
+    explicit Blocker(std::vector<Vec3> quads) : positions(std::move(quads)) {
+        for (uint32_t q = 0; q + 4 <= positions.size(); q += 4)
+            indices.insert(indices.end(), {q, q + 1, q + 2, q, q + 2, q + 3});
+        build();
+    }
     void build() {
         InstanceInput in;
         in.name = "blocker";
         in.mesh.positions = positions.data();
         in.mesh.vertexCount = positions.size();
         in.mesh.indices = indices.data();
-        in.mesh.triangleCount = 2;
+        in.mesh.triangleCount = indices.size() / 3;
         in.flags = 0x4EDFF;
         in.index = 0;
         EXPECT_TRUE(grid.build({in}, ADSParameters()));
@@ -284,6 +293,56 @@ TEST(ShadowSampling, HalfBlockedAreaLight) {
     ctx.allowShadows = true;
     p.castShadows = false;
     EXPECT_EQ(make<SimpleAreaLight>(p)->shadowTransmission({0, 0, 0}, ctx, 1.0f), Color::white());
+}
+
+// Surfaces of one transparency colour.
+struct TintedSurfaces : ShadowTransparencyInterface {
+    Color tint;
+    explicit TintedSurfaces(Color c) : tint(c) {}
+    Color transparency(const Ray &, const Hit &) const override { return tint; }
+};
+
+TEST(ShadowSampling, SemiTransparentOccluders) {
+    // The half-blocked area light behind a tinted blocker: the hidden half passes the tint.
+    Blocker half = halfPlane();
+    TintedSurfaces tint(Color(0.5f, 0.25f, 1.0f, 1));
+    half.tracer.transparency = &tint;
+    LightParameters p = whiteLight(LightType::kArea, downwardSquare(2.0f));
+    p.castShadows = true;
+    p.shadowSamples = 64;
+    Random random(4);
+    LightContext ctx;
+    ctx.tracer = &half.tracer;
+    ctx.random = &random;
+    const Color t = make<SimpleAreaLight>(p)->shadowTransmission({0, 0, 0}, ctx, 1.0f);
+    EXPECT_EQ(Vec3(t.r, t.g, t.b), Vec3(0.75f, 0.625f, 1.0f));
+
+    // Two sheets between a point light and the point multiply; channels outside [0, 1] and NaN
+    // are taken within it (NaN as opaque).
+    Blocker sheets({{-50, -50, 1},
+                    {50, -50, 1},
+                    {50, 50, 1},
+                    {-50, 50, 1},  //
+                    {-50, -50, 2},
+                    {50, -50, 2},
+                    {50, 50, 2},
+                    {-50, 50, 2}});
+    sheets.tracer.transparency = &tint;
+    ctx.tracer = &sheets.tracer;
+    p = whiteLight(LightType::kPoint, Mtx4::translation({0, 0, 3}));
+    p.castShadows = true;
+    auto point = make<SimplePointLight>(p);
+    const struct {
+        Color tint, want;
+    } cases[] = {{{0.5f, 0.5f, 0.5f, 1}, {0.25f, 0.25f, 0.25f, 0.25f}},
+                 {{NAN, -1, 2, 1}, {0, 0, 1, 1.0f / 3.0f}},
+                 {{0, 0, 0, 1}, Color::black()}};
+    for (const auto &c : cases) {
+        tint.tint = c.tint;
+        const Color got = point->shadowTransmission({0, 0, 0}, ctx, 1.0f);
+        EXPECT_EQ(Vec3(got.r, got.g, got.b), Vec3(c.want.r, c.want.g, c.want.b));
+        EXPECT_NEAR(got.a, c.want.a, 1e-6f);
+    }
 }
 
 TEST(ShadowSampling, StratifiedHalvesTheErrorOfPlainRandom) {
@@ -481,6 +540,38 @@ TEST(ImageBasedLight, ConstantProbeLightsEveryUpwardNormalAlike) {
     }
 }
 
+TEST(ImageBasedLight, ProbeFileThroughTheTextureManager) {
+    // A constant probe of (0.4, 0.6, 0.8) written as a file and read by the texture manager.
+    const std::string file = testing::TempDir() + "ox_light_probe.tga", bad = file + ".bad.tga";
+    ASSERT_TRUE(oxtest::writeTGA(file, 128, 64, {128 * 64, {102, 153, 204}}));
+    TextureFactory textures;
+    EnvironmentValues v;
+    v.iblSamples = 2048;
+    v.iblImageFile = file;
+    auto light = createImageBasedLight(v, textures);
+    ASSERT_TRUE(light);
+    EXPECT_EQ(light->subLights().size(), 2048u);
+    LightContext ctx;
+    Random r(5);
+    for (int k = 0; k < 50; ++k) {
+        const Vec3 n = k == 0 ? Vec3(0, 1, 0)
+                              : Vec3(2 * r.next() - 1, r.next(), 2 * r.next() - 1).normalized();
+        const Color e = light->illuminate({0, 0, 0}, n, ctx, false) * light->cosineFactor({}, n);
+        expectRelative(e.g, 0.6f, 0.01f, "green");
+        expectRelative(e.b, 0.8f, 0.01f, "blue");
+    }
+    // A probe wider than the limit is read from a mip level of the same mean.
+    LightProbeImage small;
+    ASSERT_TRUE(readLightProbe(textures, file, small, 16));
+    EXPECT_EQ(small.width, 16);
+    EXPECT_EQ(small.height, 8);
+    EXPECT_NEAR(small.at(15, 7).r, 0.4f, 1e-6f);
+    // A file the readers cannot decode gives no light.
+    std::ofstream(bad) << "not an image";
+    v.iblImageFile = bad;
+    EXPECT_EQ(createImageBasedLight(v, textures), nullptr);
+}
+
 TEST(ImageBasedLight, BrightTexelMakesOneDominantSubLight) {
     LightProbeImage probe = constantProbe(64, 32, Color(0.01f, 0.01f, 0.01f, 1));
     const int32_t bx = 40, by = 22;
@@ -567,6 +658,47 @@ TEST(ImageBasedLight, ShadowedSubLights) {
     ctx.singleShadowRay = true;
     EXPECT_EQ(light.illuminate({0, 0, 0}, {0, 0, 1}, ctx, true).r, 0.0f);
     EXPECT_NEAR(light.illuminate({0, 0, 2}, {0, 0, 1}, ctx, true).r, 1.0f, 0.02f);
+}
+
+TEST(OtherLights, SurfaceDirectionClampToIntensityAndTracerSettings) {
+    // Ambient and albedo lights keep their fixed directions; the area light (the square at
+    // z = 1 facing down) points at its nearest point, straight up from under the square.
+    EXPECT_EQ(AlbedoLight().directionToLightSurface({3, 2, 1}), Vec3(0, 0, 1));
+    EXPECT_EQ(SimpleAmbientLight("a", Color()).directionToLightSurface({3, 2, 1}), Vec3(0, 1, 0));
+    LightParameters p = whiteLight(LightType::kArea, downwardSquare(1.0f));
+    p.falloffExponent = 2.0f;
+    p.decayClampToOne = false;
+    auto area = make<SimpleAreaLight>(p);
+    const Vec3 side = area->directionToLightSurface({3, 0, 0});
+    EXPECT_NEAR(side.x, -2.0f / std::sqrt(5.0f), 1e-6f);
+    EXPECT_NEAR(side.z, 1.0f / std::sqrt(5.0f), 1e-6f);
+    EXPECT_EQ(area->directionToLightSurface({0.5f, 0.2f, 0}), Vec3(0, 0, 1));
+
+    // ClampToIntensity: (1 / d)^2 near the light is held at the colour.
+    LightContext ctx;
+    p.clampToIntensity = true;
+    auto clamped = make<SimpleAreaLight>(p);
+    const struct {
+        float z, plain, clamped;
+    } distances[] = {{0.5f, 4.0f, 1.0f}, {0.0f, 1.0f, 1.0f}, {-1.0f, 0.25f, 0.25f}};
+    for (const auto &d : distances) {
+        EXPECT_FLOAT_EQ(area->illuminate({0, 0, d.z}, {0, 0, 1}, ctx, false).r, d.plain);
+        EXPECT_FLOAT_EQ(clamped->illuminate({0, 0, d.z}, {0, 0, 1}, ctx, false).r, d.clamped);
+    }
+
+    // The shadow tracer of a run from its render settings; unusable biases give the default.
+    Blocker blocker = ceiling();
+    OXConfig config;
+    RenderSettingsBase &render = config.RenderSettings;
+    render.minShadowRays = 3u;
+    render.maxShadowRays = 40u;
+    const ShadowTracer t = shadowTracerFor(render, &blocker.grid);
+    EXPECT_EQ(t.ads, &blocker.grid);
+    EXPECT_EQ(t.minShadowRays + t.maxShadowRays, 43u);
+    for (float bias : {0.02f, 0.0f, -1.0f, NAN}) {
+        render.bias = bias;
+        EXPECT_EQ(shadowTracerFor(render, nullptr).bias, bias == 0.02f ? bias : 0.005f);
+    }
 }
 
 TEST(OtherLights, EnvironmentOverTheHemisphere) {
