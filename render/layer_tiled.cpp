@@ -45,6 +45,13 @@ void MMFileTiledStorageT<T>::writeTile(uint32_t tx, uint32_t ty, const T *source
     memory_->copyIn((uint64_t(ty) * this->tilesPerRow() + tx) * n, source, n);
 }
 
+template <typename T>
+T *MMFileTiledStorageT<T>::tileData(uint32_t tx, uint32_t ty) {
+    T *data = memory_->data();
+    return data ? data + (uint64_t(ty) * this->tilesPerRow() + tx) * this->tileElements()
+                : nullptr;
+}
+
 // --- Cache -----------------------------------------------------------------------------------
 
 template <typename T>
@@ -160,16 +167,22 @@ void TiledMemoryLayerT<T>::copyRegion(const Region &r, T *data, int64_t stride) 
             const int64_t x1 = std::min<int64_t>(r.xMax, (tx + 1) * tw);
             // A paste that covers the whole tile need not read it from storage first.
             const bool whole = kPaste && x1 - x0 == tw && y1 - y0 == th;
-            T *tile = cache_->acquire(uint32_t(tx), uint32_t(ty), !whole, kPaste);
             const size_t rowBytes = size_t(x1 - x0) * sizeof(T);
-            for (int64_t y = y0; y < y1; ++y) {
-                T *t = tile + (y - ty * th) * tw + (x0 - tx * tw);
-                T *d = data + (y - r.yMin) * stride + (x0 - r.xMin);
-                if constexpr (kPaste)
-                    std::memcpy(t, d, rowBytes);
-                else
-                    std::memcpy(d, t, rowBytes);
-            }
+            auto copy = [&](T *tile) {
+                for (int64_t y = y0; y < y1; ++y) {
+                    T *t = tile + (y - ty * th) * tw + (x0 - tx * tw);
+                    T *d = data + (y - r.yMin) * stride + (x0 - r.xMin);
+                    if constexpr (kPaste)
+                        std::memcpy(t, d, rowBytes);
+                    else
+                        std::memcpy(d, t, rowBytes);
+                }
+            };
+            // Reads of a tile that is not cached, and pastes that replace one whole, go
+            // straight to storage: loading the tile would only add a copy (and a write-back).
+            if ((!kPaste || whole) && cache_->copyUncached(uint32_t(tx), uint32_t(ty), copy))
+                continue;
+            copy(cache_->acquire(uint32_t(tx), uint32_t(ty), !whole, kPaste));
             cache_->release(uint32_t(tx), uint32_t(ty));
         }
     }

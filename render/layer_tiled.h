@@ -22,6 +22,8 @@ public:
     virtual void readTile(uint32_t tx, uint32_t ty, T *destination) = 0;
     /// Copies source into tile (tx, ty).
     virtual void writeTile(uint32_t tx, uint32_t ty, const T *source) = 0;
+    /// The elements of tile (tx, ty) in place, or null when the storage is not addressable.
+    virtual T *tileData(uint32_t, uint32_t) { return nullptr; }
 
     int32_t tileWidth() const { return tileWidth_; }
     int32_t tileHeight() const { return tileHeight_; }
@@ -53,6 +55,7 @@ public:
     bool isFileBacked() const { return memory_ && memory_->isFileBacked(); }
     void readTile(uint32_t tx, uint32_t ty, T *destination) override;
     void writeTile(uint32_t tx, uint32_t ty, const T *source) override;
+    T *tileData(uint32_t tx, uint32_t ty) override;
 
 private:
     std::unique_ptr<LargeMemory<T>> memory_;
@@ -79,6 +82,20 @@ public:
     /// undefined until the caller has written all of it. A tile acquired with write false is
     /// only read by the caller and is not marked for writing back.
     T *acquire(uint32_t tx, uint32_t ty, bool partial, bool write = true);
+    /// When tile (tx, ty) is not cached and its storage is addressable, runs copy(tile) on the
+    /// storage itself under the cache's lock (no load, no write-back) and returns true;
+    /// otherwise returns false without running it.
+    template <typename F>
+    bool copyUncached(uint32_t tx, uint32_t ty, F &&copy) {
+        const uint64_t key = keyOf(tx, ty);
+        OXScopedLock<StdMutex> lock(mutex_);
+        for (const Entry &e : entries_)
+            if (e.key == key) return false;
+        T *tile = storage_.tileData(tx, ty);
+        if (!tile) return false;
+        copy(tile);
+        return true;
+    }
     /// Unpins a tile acquired before.
     void release(uint32_t tx, uint32_t ty);
     /// Writes every cached tile marked for writing back to storage (pinned ones included: call

@@ -157,20 +157,37 @@ TEST(TileCacheTest, WholeTilesAreNotReadAndTheOldestUnpinnedTileIsEvicted) {
     ox::TiledMemoryLayerT<float> layer("Z", 64 * 31, 128);
     const auto &cache = *layer.cache();
     std::vector<float> tile(64 * 64);
-    // A paste of a whole tile does not read it; a paste of part of one does.
+    // A paste of a whole tile that is not cached goes straight to storage, as do reads.
     for (int i = 0; i < 31; ++i) {
         for (float &v : tile) v = float(i + 1);
         ASSERT_TRUE(layer.paste(Region(64 * i, 0, 64 * (i + 1), 64), tile.data()));
     }
-    EXPECT_EQ(cache.storageReads(), 0u);
-    EXPECT_EQ(cache.bufferCount(), ox::TileStorageCacheT<float>::kCapacity);
-    // The 31st tile evicted the first, written back intact.
-    EXPECT_EQ(cache.storageWrites(), 1u);
-    ASSERT_TRUE(layer.paste(Region(3, 64, 5, 66), tile.data()));
-    EXPECT_EQ(cache.storageReads(), 1u);
     std::vector<float> back(64 * 64);
-    ASSERT_TRUE(layer.read(Region(0, 0, 64, 64), back.data()));
-    for (float v : back) ASSERT_EQ(v, 1.0f);
+    ASSERT_TRUE(layer.read(Region(64, 0, 128, 64), back.data()));
+    for (float v : back) ASSERT_EQ(v, 2.0f);
+    EXPECT_EQ(cache.bufferCount(), 0u);
+    EXPECT_EQ(cache.storageReads(), 0u);
+    EXPECT_EQ(cache.storageWrites(), 0u);
+    // A paste of part of a tile loads it; the 31st such tile evicts the first, written back.
+    for (int i = 0; i < 31; ++i) {
+        for (float &v : tile) v = float(i + 100);
+        ASSERT_TRUE(layer.paste(Region(64 * i, 0, 64 * i + 63, 64), tile.data(), 64));
+    }
+    EXPECT_EQ(cache.storageReads(), 31u);
+    EXPECT_EQ(cache.bufferCount(), ox::TileStorageCacheT<float>::kCapacity);
+    EXPECT_EQ(cache.storageWrites(), 1u);
+    // A whole-tile paste into a cached tile goes through the cache; reads see both paths.
+    for (float &v : tile) v = 7.0f;
+    ASSERT_TRUE(layer.paste(Region(64 * 30, 0, 64 * 31, 64), tile.data()));
+    EXPECT_EQ(cache.storageReads(), 31u);
+    for (int i : {0, 1, 30}) {
+        ASSERT_TRUE(layer.read(Region(64 * i, 0, 64 * (i + 1), 64), back.data()));
+        for (int y = 0; y < 64; ++y)
+            for (int x = 0; x < 64; ++x) {
+                const float want = i == 30 ? 7.0f : x == 63 ? float(i + 1) : float(i + 100);
+                ASSERT_EQ(back[size_t(y * 64 + x)], want) << i << " " << x << " " << y;
+            }
+    }
 }
 
 TEST(TileCacheTest, PinnedTilesAreNeverEvictedAndTheCacheGrows) {
