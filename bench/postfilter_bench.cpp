@@ -85,20 +85,21 @@ ox::RenderContext &noContext() {
     return *reinterpret_cast<ox::RenderContext *>(storage);
 }
 
-/// The floor of every filter that replaces a layer: read it in bands, paste into a new layer,
-/// delete the old one and rename the new one.
+/// The floor of every filter that replaces a layer: read it in bands, paste into a scratch
+/// layer (the storage retired by the previous round), retire the old one and rename the new
+/// one.
 void BM_LayerReplace(benchmark::State &state) {
     auto frame = makeFrame();
     std::vector<ox::Color> band(size_t(kSize) * ox::kFilterBandRows);
     for (auto _ : state) {
         ox::LayerT<ox::Color> *in = frame->getColorLayer("beauty");
-        ox::LayerT<ox::Color> *out = frame->addTiledLayer<ox::Color>("temp");
+        ox::LayerT<ox::Color> *out = frame->addScratchColorLayer("temp");
         for (int y = 0; y < kSize; y += ox::kFilterBandRows) {
             const ox::Region rows(0, y, kSize, y + ox::kFilterBandRows);
             in->read(rows, band.data());
             out->paste(rows, band.data());
         }
-        frame->deleteLayer("beauty");
+        frame->retireLayer("beauty");
         frame->renameLayer("temp", "beauty");
     }
     state.SetItemsProcessed(int64_t(state.iterations()) * kSize * kSize);

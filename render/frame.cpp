@@ -103,6 +103,30 @@ bool Frame::deleteLayer(const std::string &name) {
     return true;
 }
 
+bool Frame::retireLayer(const std::string &name) {
+    std::unique_ptr<Layer> layer = detachLayer(name);
+    if (!layer) return false;
+    auto *tiled = layer->kind() == kLayerColor
+                      ? dynamic_cast<TiledMemoryLayerT<Color> *>(layer.get())
+                      : nullptr;
+    if (!tiled || tiled->tileWidth() != kLayerTileSize || tiled->tileHeight() != kLayerTileSize)
+        return true;  // destroyed here like a deleted layer
+    layer->observers_.clear();
+    if (retired_.size() >= kRetiredLayers) retired_.erase(retired_.begin());
+    retired_.push_back(std::move(layer));
+    return true;
+}
+
+LayerT<Color> *Frame::addScratchColorLayer(const std::string &name) {
+    if (retired_.empty() || hasLayer(name)) return addTiledLayer<Color>(name);
+    std::unique_ptr<Layer> layer = std::move(retired_.back());
+    retired_.pop_back();
+    layer->name_ = name;
+    auto *p = static_cast<LayerT<Color> *>(layer.get());
+    layers_.emplace(name, std::move(layer));
+    return p;
+}
+
 std::unique_ptr<Layer> Frame::detachLayer(const std::string &name) {
     auto it = layers_.find(name);
     if (it == layers_.end()) {

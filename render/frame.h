@@ -35,6 +35,12 @@ public:
     /// Creates and adds a tiled boolean, float or colour layer; null when refused.
     template <typename T>
     LayerT<T> *addTiledLayer(const std::string &name, int32_t tileSize = kLayerTileSize);
+    /// Adds a tiled colour layer (default tiles) for a result that its maker writes whole
+    /// before anything reads it: it takes over the storage of a layer retired before when the
+    /// frame keeps one (its pixels are then undefined until written), else it is a new
+    /// zero-filled layer. Null when refused. Reusing storage spares the page faults and the
+    /// zero filling of a fresh block, which cost more than the filters themselves.
+    LayerT<Color> *addScratchColorLayer(const std::string &name);
     /// Creates and adds a linear custom-float layer of `channels` floats per pixel; null
     /// when refused.
     CustomFloatLayer *addCustomFloatLayer(const std::string &name, int32_t channels);
@@ -73,6 +79,16 @@ public:
 
     /// Removes and destroys a layer (its observer registrations go with it).
     bool deleteLayer(const std::string &name);
+    /// Removes a layer like deleteLayer, but keeps the storage of a tiled colour layer with
+    /// default tiles for the next addScratchColorLayer (at most kRetiredLayers are kept; an
+    /// older one is destroyed). Its observer registrations go.
+    bool retireLayer(const std::string &name);
+    /// Destroys the kept storage of retired layers.
+    void releaseRetiredLayers() { retired_.clear(); }
+    /// The number of retired layers kept.
+    size_t retiredLayerCount() const { return retired_.size(); }
+    /// The most retired layers a frame keeps.
+    static constexpr size_t kRetiredLayers = 1;
     /// Removes a layer without destroying it; the caller owns the result (null when absent).
     std::unique_ptr<Layer> detachLayer(const std::string &name);
     /// Calls the layer's synchronize.
@@ -90,6 +106,7 @@ private:
 
     int32_t width_, height_;
     std::map<std::string, std::unique_ptr<Layer>> layers_;
+    std::vector<std::unique_ptr<Layer>> retired_;  // oldest first
 };
 
 /// Frame utilities.

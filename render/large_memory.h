@@ -5,14 +5,14 @@
 #include <memory>
 
 #include "platform/memory_mapped_file.h"
-#include "platform/mutex.h"
 
 /// The storage block under every frame layer.
 namespace ox {
 
 /// A zero-filled block of `count` elements of T, in plain memory up to the spill limit and in
-/// a mapped temporary file above it. Row copies in and out take the block's own mutex, so that
-/// readers never see a row half-copied by another thread.
+/// a mapped temporary file above it. The mapping is fixed once the block exists, so copies into
+/// or out of disjoint element ranges may run from any number of threads without a lock; the
+/// owner orders copies that touch the same range.
 template <typename T>
 class LargeMemory {
 public:
@@ -36,18 +36,15 @@ public:
     uint64_t count() const { return count_; }
     /// True when the block lives in a temporary file.
     bool isFileBacked() const { return file_ && file_->isFileBacked(); }
-    /// The first element (null when the block is empty or failed). Copies through this
-    /// pointer bypass the block's mutex.
+    /// The first element (null when the block is empty or failed).
     T *data() { return data_; }
 
-    /// Copies n elements from source to elements [index, index + n), under the mutex.
+    /// Copies n elements from source to elements [index, index + n).
     void copyIn(uint64_t index, const T *source, uint64_t n) {
-        OXScopedLock<StdMutex> lock(mutex_);
         std::memcpy(data_ + index, source, n * sizeof(T));
     }
-    /// Copies elements [index, index + n) to destination, under the mutex.
+    /// Copies elements [index, index + n) to destination.
     void copyOut(uint64_t index, T *destination, uint64_t n) {
-        OXScopedLock<StdMutex> lock(mutex_);
         std::memcpy(destination, data_ + index, n * sizeof(T));
     }
 
@@ -55,7 +52,6 @@ private:
     uint64_t count_;
     std::unique_ptr<MemoryMappedFile> file_;
     T *data_ = nullptr;
-    StdMutex mutex_{true};
 };
 
 }  // namespace ox

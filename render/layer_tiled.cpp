@@ -45,26 +45,37 @@ void MMFileTiledStorageT<T>::writeTile(uint32_t tx, uint32_t ty, const T *source
     memory_->copyIn((uint64_t(ty) * this->tilesPerRow() + tx) * n, source, n);
 }
 
+template <typename T>
+T *MMFileTiledStorageT<T>::tileData(uint32_t tx, uint32_t ty) {
+    T *data = memory_->data();
+    return data ? data + (uint64_t(ty) * this->tilesPerRow() + tx) * this->tileElements()
+                : nullptr;
+}
+
 // --- Cache -----------------------------------------------------------------------------------
 
 template <typename T>
-T *TileStorageCacheT<T>::acquire(uint32_t tx, uint32_t ty, bool partial) {
+T *TileStorageCacheT<T>::acquire(uint32_t tx, uint32_t ty, bool partial, bool write) {
     const uint64_t key = keyOf(tx, ty);
     OXScopedLock<StdMutex> lock(mutex_);
     for (Entry &e : entries_)
         if (e.key == key) {
             ++e.pins;
+            e.dirty = e.dirty || write;
             return e.buffer.get();
         }
-    Entry entry{key, 1, nullptr};
+    Entry entry{key, 1, write, nullptr};
     if (entries_.size() >= kCapacity) {
         // The oldest tile that no thread is copying into or out of makes room.
         auto victim = std::find_if(entries_.begin(), entries_.end(),
                                    [](const Entry &e) { return e.pins == 0; });
         if (victim != entries_.end()) {
-            storage_.writeTile(uint32_t(victim->key >> 32), uint32_t(victim->key),
-                               victim->buffer.get());
-            ++writes_;
+            // A tile that was only read holds what storage holds already.
+            if (victim->dirty) {
+                storage_.writeTile(uint32_t(victim->key >> 32), uint32_t(victim->key),
+                                   victim->buffer.get());
+                ++writes_;
+            }
             entry.buffer = std::move(victim->buffer);
             entries_.erase(victim);
         }
@@ -96,7 +107,9 @@ template <typename T>
 void TileStorageCacheT<T>::flush() {
     OXScopedLock<StdMutex> lock(mutex_);
     for (Entry &e : entries_) {
+        if (!e.dirty) continue;
         storage_.writeTile(uint32_t(e.key >> 32), uint32_t(e.key), e.buffer.get());
+        e.dirty = false;
         ++writes_;
     }
 }
@@ -154,16 +167,22 @@ void TiledMemoryLayerT<T>::copyRegion(const Region &r, T *data, int64_t stride) 
             const int64_t x1 = std::min<int64_t>(r.xMax, (tx + 1) * tw);
             // A paste that covers the whole tile need not read it from storage first.
             const bool whole = kPaste && x1 - x0 == tw && y1 - y0 == th;
-            T *tile = cache_->acquire(uint32_t(tx), uint32_t(ty), !whole);
             const size_t rowBytes = size_t(x1 - x0) * sizeof(T);
-            for (int64_t y = y0; y < y1; ++y) {
-                T *t = tile + (y - ty * th) * tw + (x0 - tx * tw);
-                T *d = data + (y - r.yMin) * stride + (x0 - r.xMin);
-                if constexpr (kPaste)
-                    std::memcpy(t, d, rowBytes);
-                else
-                    std::memcpy(d, t, rowBytes);
-            }
+            auto copy = [&](T *tile) {
+                for (int64_t y = y0; y < y1; ++y) {
+                    T *t = tile + (y - ty * th) * tw + (x0 - tx * tw);
+                    T *d = data + (y - r.yMin) * stride + (x0 - r.xMin);
+                    if constexpr (kPaste)
+                        std::memcpy(t, d, rowBytes);
+                    else
+                        std::memcpy(d, t, rowBytes);
+                }
+            };
+            // Reads of a tile that is not cached, and pastes that replace one whole, go
+            // straight to storage: loading the tile would only add a copy (and a write-back).
+            if ((!kPaste || whole) && cache_->copyUncached(uint32_t(tx), uint32_t(ty), copy))
+                continue;
+            copy(cache_->acquire(uint32_t(tx), uint32_t(ty), !whole, kPaste));
             cache_->release(uint32_t(tx), uint32_t(ty));
         }
     }

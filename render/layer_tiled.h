@@ -22,6 +22,8 @@ public:
     virtual void readTile(uint32_t tx, uint32_t ty, T *destination) = 0;
     /// Copies source into tile (tx, ty).
     virtual void writeTile(uint32_t tx, uint32_t ty, const T *source) = 0;
+    /// The elements of tile (tx, ty) in place, or null when the storage is not addressable.
+    virtual T *tileData(uint32_t, uint32_t) { return nullptr; }
 
     int32_t tileWidth() const { return tileWidth_; }
     int32_t tileHeight() const { return tileHeight_; }
@@ -53,6 +55,7 @@ public:
     bool isFileBacked() const { return memory_ && memory_->isFileBacked(); }
     void readTile(uint32_t tx, uint32_t ty, T *destination) override;
     void writeTile(uint32_t tx, uint32_t ty, const T *source) override;
+    T *tileData(uint32_t tx, uint32_t ty) override;
 
 private:
     std::unique_ptr<LargeMemory<T>> memory_;
@@ -60,7 +63,8 @@ private:
 
 /// A cache of tile buffers over a TiledStorageT. A tile handed out by acquire is pinned until
 /// release: it is never written back, evicted or reused meanwhile. Eviction takes the oldest
-/// loaded unpinned tile (first loaded, first evicted; a hit does not refresh a tile). When
+/// loaded unpinned tile (first loaded, first evicted; a hit does not refresh a tile) and writes
+/// it back only when it was acquired for writing since it was loaded or written back. When
 /// every buffer is pinned the cache grows by one buffer instead of waiting. Thread-safe.
 template <typename T>
 class TileStorageCacheT {
@@ -75,12 +79,27 @@ public:
 
     /// The buffer of tile (tx, ty), pinned. A tile not cached is filled from storage when
     /// partial (the caller will overwrite only part of it); otherwise its contents are
-    /// undefined until the caller has written all of it.
-    T *acquire(uint32_t tx, uint32_t ty, bool partial);
+    /// undefined until the caller has written all of it. A tile acquired with write false is
+    /// only read by the caller and is not marked for writing back.
+    T *acquire(uint32_t tx, uint32_t ty, bool partial, bool write = true);
+    /// When tile (tx, ty) is not cached and its storage is addressable, runs copy(tile) on the
+    /// storage itself under the cache's lock (no load, no write-back) and returns true;
+    /// otherwise returns false without running it.
+    template <typename F>
+    bool copyUncached(uint32_t tx, uint32_t ty, F &&copy) {
+        const uint64_t key = keyOf(tx, ty);
+        OXScopedLock<StdMutex> lock(mutex_);
+        for (const Entry &e : entries_)
+            if (e.key == key) return false;
+        T *tile = storage_.tileData(tx, ty);
+        if (!tile) return false;
+        copy(tile);
+        return true;
+    }
     /// Unpins a tile acquired before.
     void release(uint32_t tx, uint32_t ty);
-    /// Writes every cached tile back to storage (pinned ones included: call without pastes
-    /// running).
+    /// Writes every cached tile marked for writing back to storage (pinned ones included: call
+    /// without pastes running).
     void flush();
 
     /// Buffers held (kCapacity, or more while all were pinned at once).
@@ -94,6 +113,7 @@ private:
     struct Entry {
         uint64_t key;
         uint32_t pins;
+        bool dirty;
         std::unique_ptr<T[]> buffer;
     };
     static uint64_t keyOf(uint32_t tx, uint32_t ty) { return (uint64_t(tx) << 32) | ty; }
@@ -118,6 +138,10 @@ public:
     bool pasteRegion(const Region &region, const void *source, int64_t stride) override;
     bool readRegion(const Region &region, void *destination, int64_t stride) override;
 
+    /// The tile width in pixels.
+    int32_t tileWidth() const { return storage_ ? storage_->tileWidth() : 0; }
+    /// The tile height in pixels.
+    int32_t tileHeight() const { return storage_ ? storage_->tileHeight() : 0; }
     /// The tile cache (for tests and diagnostics).
     const TileStorageCacheT<T> *cache() const { return cache_.get(); }
     /// True when the tiles live in a temporary file.

@@ -97,14 +97,16 @@ LayerT<Color> *FilterResults::addColor(const std::string &name, const std::strin
                 name.c_str(), filterName);
         return nullptr;
     }
-    LayerT<Color> *layer = frame_.addTiledLayer<Color>(name);
+    // Every filter writes all of its result before placing it, so recycled storage serves.
+    LayerT<Color> *layer = frame_.addScratchColorLayer(name);
     if (layer) entries_.push_back({name, target});
     return layer;
 }
 
 bool FilterResults::place(const std::vector<std::string> &sources) {
+    // The replaced sources keep their storage for the next filter's result.
     for (const std::string &s : sources)
-        if (frame_.hasLayer(s)) frame_.deleteLayer(s);
+        if (frame_.hasLayer(s)) frame_.retireLayer(s);
     for (const Entry &e : entries_)
         if (e.target != e.name && frame_.hasLayer(e.target)) frame_.deleteLayer(e.target);
     bool ok = true;

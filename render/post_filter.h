@@ -101,10 +101,11 @@ public:
     FilterResults &operator=(const FilterResults &) = delete;
 
     /// Creates a tiled colour layer `name` that will replace `target` (which may be absent);
-    /// null after one error message when the name is taken or the layer cannot be made.
+    /// null after one error message when the name is taken or the layer cannot be made. It
+    /// may reuse a retired layer's storage: the filter must write every texel before placing.
     LayerT<Color> *addColor(const std::string &name, const std::string &target,
                             const char *filterName);
-    /// Deletes every source given (may repeat or be absent), then renames each result to
+    /// Retires every source given (may repeat or be absent), then renames each result to
     /// its target. False after one error message when a rename fails.
     bool place(const std::vector<std::string> &sources);
     /// Deletes the results now.

@@ -157,20 +157,37 @@ TEST(TileCacheTest, WholeTilesAreNotReadAndTheOldestUnpinnedTileIsEvicted) {
     ox::TiledMemoryLayerT<float> layer("Z", 64 * 31, 128);
     const auto &cache = *layer.cache();
     std::vector<float> tile(64 * 64);
-    // A paste of a whole tile does not read it; a paste of part of one does.
+    // A paste of a whole tile that is not cached goes straight to storage, as do reads.
     for (int i = 0; i < 31; ++i) {
         for (float &v : tile) v = float(i + 1);
         ASSERT_TRUE(layer.paste(Region(64 * i, 0, 64 * (i + 1), 64), tile.data()));
     }
-    EXPECT_EQ(cache.storageReads(), 0u);
-    EXPECT_EQ(cache.bufferCount(), ox::TileStorageCacheT<float>::kCapacity);
-    // The 31st tile evicted the first, written back intact.
-    EXPECT_EQ(cache.storageWrites(), 1u);
-    ASSERT_TRUE(layer.paste(Region(3, 64, 5, 66), tile.data()));
-    EXPECT_EQ(cache.storageReads(), 1u);
     std::vector<float> back(64 * 64);
-    ASSERT_TRUE(layer.read(Region(0, 0, 64, 64), back.data()));
-    for (float v : back) ASSERT_EQ(v, 1.0f);
+    ASSERT_TRUE(layer.read(Region(64, 0, 128, 64), back.data()));
+    for (float v : back) ASSERT_EQ(v, 2.0f);
+    EXPECT_EQ(cache.bufferCount(), 0u);
+    EXPECT_EQ(cache.storageReads(), 0u);
+    EXPECT_EQ(cache.storageWrites(), 0u);
+    // A paste of part of a tile loads it; the 31st such tile evicts the first, written back.
+    for (int i = 0; i < 31; ++i) {
+        for (float &v : tile) v = float(i + 100);
+        ASSERT_TRUE(layer.paste(Region(64 * i, 0, 64 * i + 63, 64), tile.data(), 64));
+    }
+    EXPECT_EQ(cache.storageReads(), 31u);
+    EXPECT_EQ(cache.bufferCount(), ox::TileStorageCacheT<float>::kCapacity);
+    EXPECT_EQ(cache.storageWrites(), 1u);
+    // A whole-tile paste into a cached tile goes through the cache; reads see both paths.
+    for (float &v : tile) v = 7.0f;
+    ASSERT_TRUE(layer.paste(Region(64 * 30, 0, 64 * 31, 64), tile.data()));
+    EXPECT_EQ(cache.storageReads(), 31u);
+    for (int i : {0, 1, 30}) {
+        ASSERT_TRUE(layer.read(Region(64 * i, 0, 64 * (i + 1), 64), back.data()));
+        for (int y = 0; y < 64; ++y)
+            for (int x = 0; x < 64; ++x) {
+                const float want = i == 30 ? 7.0f : x == 63 ? float(i + 1) : float(i + 100);
+                ASSERT_EQ(back[size_t(y * 64 + x)], want) << i << " " << x << " " << y;
+            }
+    }
 }
 
 TEST(TileCacheTest, PinnedTilesAreNeverEvictedAndTheCacheGrows) {
@@ -196,6 +213,34 @@ TEST(TileCacheTest, PinnedTilesAreNeverEvictedAndTheCacheGrows) {
     storage.readTile(5, 0, written.data());
     EXPECT_EQ(written[0], 105.0f);
     (void)extra;
+}
+
+TEST(TileCacheTest, OnlyWrittenTilesAreWrittenBack) {
+    ox::MMFileTiledStorageT<float> storage(64 * 40, 1, 64, 1);
+    ox::TileStorageCacheT<float> cache(storage);
+    // Thirty tiles only read, then evicted by ten more: storage is never written.
+    for (uint32_t i = 0; i < 30; ++i) {
+        cache.acquire(i, 0, true, false)[0] = float(i) + 1;  // a stray write stays unseen
+        cache.release(i, 0);
+    }
+    for (uint32_t i = 30; i < 40; ++i) {
+        cache.acquire(i, 0, true, false);
+        cache.release(i, 0);
+    }
+    EXPECT_EQ(cache.storageWrites(), 0u);
+    std::vector<float> tile(64);
+    storage.readTile(3, 0, tile.data());
+    EXPECT_EQ(tile[0], 0.0f);
+    // A tile read and then written by another acquirer is written back once, on flush.
+    cache.acquire(35, 0, true, false);
+    cache.acquire(35, 0, true)[1] = 5.0f;
+    cache.release(35, 0);
+    cache.release(35, 0);
+    cache.flush();
+    cache.flush();
+    EXPECT_EQ(cache.storageWrites(), 1u);
+    storage.readTile(35, 0, tile.data());
+    EXPECT_EQ(tile[1], 5.0f);
 }
 
 TEST(TileCacheTest, TileKeysBeyondSixteenBits) {
@@ -366,6 +411,52 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
     EXPECT_TRUE(has(out, "Non implemented notify called")) << out;
     // Deleting the layer drops its registrations along with it.
     EXPECT_TRUE(frame.deleteLayer("Z"));
+}
+
+TEST(FrameTest, RetiredStorageServesTheNextScratchLayerOnly) {
+    ox::Frame frame(100, 70);
+    ox::LayerT<Color> *beauty = frame.addTiledLayer<Color>("beauty");
+    std::vector<Color> all(100 * 70);
+    for (int y = 0; y < 70; ++y)
+        for (int x = 0; x < 100; ++x) all[size_t(y * 100 + x)] = code(x, y, 7);
+    ASSERT_TRUE(beauty->paste(Region(0, 0, 100, 70), all.data()));
+    RecordingObserver obs;
+    ASSERT_TRUE(frame.registerObserver("beauty", &obs));
+    // Other kinds and tile sizes are destroyed like deleted layers.
+    frame.addTiledLayer<float>("Z");
+    frame.addTiledLayer<Color>("small tiles", 8);
+    EXPECT_TRUE(frame.retireLayer("Z"));
+    EXPECT_TRUE(frame.retireLayer("small tiles"));
+    EXPECT_EQ(frame.retiredLayerCount(), 0u);
+    EXPECT_TRUE(frame.retireLayer("beauty"));
+    EXPECT_FALSE(frame.hasLayer("beauty"));
+    EXPECT_EQ(frame.retiredLayerCount(), 1u);
+
+    // The scratch layer is the retired one under its new name, without the old observers;
+    // a second scratch layer, or a plain tiled one, is fresh and zero-filled.
+    ox::LayerT<Color> *scratch = frame.addScratchColorLayer("temp");
+    EXPECT_EQ(scratch, beauty);
+    EXPECT_EQ(frame.getColorLayer("temp"), scratch);
+    EXPECT_EQ(scratch->name(), "temp");
+    EXPECT_TRUE(scratch->observers().empty());
+    EXPECT_EQ(frame.retiredLayerCount(), 0u);
+    ox::LayerT<Color> *fresh = frame.addScratchColorLayer("temp1");
+    ASSERT_NE(fresh, nullptr);
+    std::vector<Color> back(100 * 70);
+    ASSERT_TRUE(fresh->read(Region(0, 0, 100, 70), back.data()));
+    for (const Color &c : back) ASSERT_EQ(c, Color(0, 0, 0, 0));
+    // Pasting the whole scratch layer leaves nothing of its former contents.
+    for (Color &c : all) c.b = 9;
+    ASSERT_TRUE(scratch->paste(Region(0, 0, 100, 70), all.data()));
+    ASSERT_TRUE(scratch->read(Region(0, 0, 100, 70), back.data()));
+    EXPECT_EQ(back, all);
+    EXPECT_TRUE(obs.regions.empty());
+    // A taken name is refused as for any new layer.
+    std::string out = captured([&] { EXPECT_EQ(frame.addScratchColorLayer("temp"), nullptr); });
+    EXPECT_TRUE(has(out, "Layer temp already exists in the frame")) << out;
+    frame.retireLayer("temp1");
+    frame.releaseRetiredLayers();
+    EXPECT_EQ(frame.retiredLayerCount(), 0u);
 }
 
 TEST(LayerViewTest, ColourAndCustomFloatViews) {
