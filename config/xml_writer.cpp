@@ -212,11 +212,14 @@ public:
     explicit XMLSchemeWriterVisitor(xmlTextWriterPtr w) : w_(w) {}
 
     bool ok() const { return ok_; }
-    /// Writes the declaration of `value` as an element named `name` with its documentation.
-    void write(const OXCTypeBase &value, std::string_view name, const std::string *doc) {
+    /// Writes the declaration of `value` as an element named `name` with its documentation;
+    /// `optional` lets a document leave the element out (members of settings objects).
+    void write(const OXCTypeBase &value, std::string_view name, const std::string *doc,
+               bool optional = false) {
         if (!ok_) return;
         name_.assign(name);
         doc_ = doc;
+        optional_ = optional;
         value.accept(*this);
     }
 
@@ -263,7 +266,8 @@ public:
         for (const auto &m : v.members()) {
             std::string key(m.key());
             auto it = docs.find(key);
-            write(*m.value, key, it == docs.end() ? nullptr : &it->second);
+            // A file names only the keys it changes; the others keep their defaults.
+            write(*m.value, key, it == docs.end() ? nullptr : &it->second, true);
         }
         end();
         end();
@@ -311,9 +315,11 @@ private:
         // Copy first: writing members below reuses name_ and doc_.
         std::string name = name_;
         const std::string *doc = doc_;
+        const bool optional = optional_;
         start("xsd:element");
         attr("name", name.c_str());
         if (type) attr("type", type);
+        if (optional) attr("minOccurs", "0");
         if (doc) {
             start("xsd:annotation");
             start("xsd:documentation");
@@ -352,6 +358,7 @@ private:
     bool ok_ = true;
     std::string name_;
     const std::string *doc_ = nullptr;
+    bool optional_ = false;
 };
 
 /// Runs one writer over a sink: document start, indentation, the body, document end, flush.
