@@ -306,6 +306,27 @@ bool parseCommandLine(const std::vector<std::string> &args, const InputListLoade
     return true;
 }
 
+std::string describeRunAction(int32_t action, const CommandLineOptions &options) {
+    // The values of the configuration's renderType, by the action each selects.
+    static const struct {
+        int32_t action;
+        const char *kind;
+        const char *renderType;
+    } kFromConfiguration[] = {
+        {kActionRender, "camera render", "Render"},
+        {kActionTextureBake, "texture bake", "TextureBake"},
+        {kActionVertexBake, "vertex bake", "VertexBake"},
+        {kActionSurfaceTransfer, "surface transfer", "SurfaceTransfer"},
+        {kActionVertexTransfer, "vertex surface transfer", "VertexTransfer"},
+        {kActionPointCloudBake, "point cloud bake", "PointCloudBake"},
+    };
+    if (options.action == kActionNone)
+        for (const auto &c : kFromConfiguration)
+            if (c.action == action)
+                return std::string(c.kind) + " (renderType " + c.renderType + ")";
+    return describeAction(action);
+}
+
 std::string describeAction(int32_t action) {
     switch (action) {
         case kActionNone:

@@ -89,5 +89,9 @@ bool parseCommandLine(const std::vector<std::string> &args, const InputListLoade
 
 /// A short description of an action ("texture bake (-b)") for messages.
 std::string describeAction(int32_t action);
+/// The same for the action a run resolved: when no action option was given, the action came
+/// from the configuration and the text names that setting ("texture bake (renderType
+/// TextureBake)").
+std::string describeRunAction(int32_t action, const CommandLineOptions &options);
 
 }  // namespace ox

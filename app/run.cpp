@@ -55,7 +55,7 @@ int32_t runDriver(const RunEnvironment &env, int32_t action, RunContext &context
     RunDriverInterface *driver = env.drivers.find(action);
     if (!driver) {
         message(kMsgError, 6, "The %s is not available: this build has no driver for it.",
-                describeAction(action).c_str());
+                describeRunAction(action, context.options).c_str());
         return kStatusUnsupported;
     }
     return driver->run(action, context);
@@ -162,7 +162,8 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
             break;
         }
         default:
-            message(kMsgError, 6, "The %s cannot run on a scene.", describeAction(action).c_str());
+            message(kMsgError, 6, "The %s cannot run on a scene.",
+                    describeRunAction(action, options).c_str());
             break;
     }
     // Statistics and timings are reported whatever the outcome, for diagnosis.

@@ -32,6 +32,11 @@ const Camera *Scene::findCamera(const std::string &name) const {
     return it == cameraIndex_.end() ? nullptr : cameras_[it->second].get();
 }
 
+const Camera *Scene::runCamera(const std::string &cameraName) const {
+    if (const Camera *named = findCamera(cameraName)) return named;
+    return cameras_.empty() ? nullptr : cameras_.front().get();
+}
+
 bool Scene::addShape(std::unique_ptr<Shape> shape) {
     return addNamed(shapes_, shapeIndex_, std::move(shape), "shape");
 }

@@ -33,6 +33,9 @@ public:
     bool addCamera(std::unique_ptr<Camera> camera);
     /// The camera of this name, or null.
     const Camera *findCamera(const std::string &name) const;
+    /// The camera a run looks through: the one named by the frame setting cameraName, else the
+    /// first camera (the loader adds "camera1" to a scene without one); null without cameras.
+    const Camera *runCamera(const std::string &cameraName) const;
     const std::vector<std::unique_ptr<Camera>> &cameras() const { return cameras_; }
 
     /// The material table (safe for concurrent registration while shapes build).

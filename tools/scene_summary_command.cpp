@@ -9,20 +9,29 @@
 #include "core/message.h"
 #include "platform/system.h"
 #include "scene/load_settings.h"
+#include "tools/run_checks.h"
 
 namespace ox {
 
 const char *const kInspectUsage =
     "Usage: thevorn-inspect <scene inputs...> [-x config.xml]\n"
+    "       thevorn-inspect --help\n"
     "  Loads the scene files (.xml) and temporary mesh files (.vtm) as a run would and prints\n"
-    "  a summary: shapes, instances, materials, cameras, lights, light links, box and bias.\n";
+    "  a summary: shapes, instances, materials, cameras, lights, light links, box and bias.\n"
+    "  With -x it also checks the configuration against the scene, one line per finding: the\n"
+    "  bake targets' instances and UV sets, the camera, the lights. Exit status 0 when the scene\n"
+    "  loads and a run would proceed, 1 when it would not, 2 for a bad command line, 3 when the\n"
+    "  configuration cannot be loaded.\n";
 
 bool parseInspectCommand(const std::vector<std::string> &args, InspectCommand &command,
                          std::string &error) {
     command = InspectCommand();
     for (size_t i = 0; i < args.size(); ++i) {
         const std::string &a = args[i];
-        if (a == "-x") {
+        if (a == "--help" || a == "-h") {
+            command.help = true;
+            return true;
+        } else if (a == "-x") {
             if (i + 1 >= args.size()) {
                 error = "-x needs a configuration file";
                 return false;
@@ -53,6 +62,38 @@ const char *cameraKind(const Camera &c) {
     if (dynamic_cast<const OrthoCamera *>(&c)) return "orthographic";
     if (dynamic_cast<const EnvCamera *>(&c)) return "environment";
     return "camera";
+}
+
+std::string shellWord(const std::string &s) {
+    if (!s.empty() && s.find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ"
+                                          "0123456789_-./+=:,") == std::string::npos)
+        return s;
+    std::string q = "'";
+    for (char c : s) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    return q + "'";
+}
+
+/// The last line of the output: one plain sentence of what the user can do next.
+std::string nextStep(const InspectCommand &command, const Scene &scene,
+                     const std::vector<RunFinding> *findings, const std::string &missingDriver) {
+    std::string inputs;
+    for (const std::string &in : command.inputs) inputs += " " + shellWord(in);
+    if (!findings) {
+        if (scene.lights().empty())
+            return "Next: the scene has no lights; add one (README, \"Adding lights\"), then check "
+                   "a configuration against the scene with: thevorn-inspect" +
+                   inputs + " -x <configuration.xml>\n";
+        return "Next: check a configuration against the scene with: thevorn-inspect" + inputs +
+               " -x <configuration.xml>\n";
+    }
+    if (!runWouldProceed(*findings))
+        return "Next: mend the configuration where the lines marked error say, then inspect "
+               "again.\n";
+    if (!missingDriver.empty())
+        return "Next: nothing more to check here, but this build has no driver for the " +
+               missingDriver + " yet (thevorn would stop with status 4).\n";
+    return "Next: run it with: thevorn" + inputs + " -x " + shellWord(command.configFile) +
+           " -od out/\n";
 }
 
 }  // namespace
@@ -121,7 +162,17 @@ int32_t runInspect(const InspectCommand &command, std::string &summary) {
         return kStatusFailure;
     }
     summary = sceneSummary(scene);
-    return kStatusSuccess;
+    if (command.configFile.empty()) {
+        summary += nextStep(command, scene, nullptr, "");
+        return kStatusSuccess;
+    }
+    const std::vector<RunFinding> findings = checkRunAgainstScene(settings.config(), scene);
+    summary += "Checks against " + command.configFile + ":\n" + formatFindings(findings);
+    const int32_t action = resolveAction(kActionNone, settings);
+    const std::string missingDriver =
+        defaultRunEnvironment().drivers.find(action) ? "" : describeRunAction(action, {});
+    summary += nextStep(command, scene, &findings, missingDriver);
+    return runWouldProceed(findings) ? kStatusSuccess : kStatusFailure;
 }
 
 }  // namespace ox

@@ -11,6 +11,7 @@ namespace ox {
 struct InspectCommand {
     std::vector<std::string> inputs;  ///< scene documents and mesh files, in order
     std::string configFile;           ///< -x (empty: the default configuration)
+    bool help = false;                ///< --help: print the usage and stop
 };
 
 /// The usage text of thevorn-inspect.
@@ -21,7 +22,10 @@ bool parseInspectCommand(const std::vector<std::string> &args, InspectCommand &c
                          std::string &error);
 
 /// Loads the scene as a run does (configuration, thread count, loader, messages) and returns
-/// the run's status; on success summary receives the text to print.
+/// the run's status; on success summary receives the text to print: the scene summary, the
+/// checks of the configuration against the scene when one was given, and one line of what to
+/// do next. A check that would stop the run makes the status a general failure (the text is
+/// still given).
 int32_t runInspect(const InspectCommand &command, std::string &summary);
 
 /// The summary of a loaded scene: shapes, instances, materials, cameras, lights, the light-link

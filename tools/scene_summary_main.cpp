@@ -15,8 +15,12 @@ int main(int argc, char **argv) {
         std::fputs(ox::kInspectUsage, stdout);
         return ox::processExitCode(ox::kStatusSyntaxError);
     }
+    if (command.help) {
+        std::fputs(ox::kInspectUsage, stdout);
+        return 0;
+    }
     std::string summary;
     const int32_t status = ox::runInspect(command, summary);
-    if (status == ox::kStatusSuccess) std::fputs(summary.c_str(), stdout);
+    std::fputs(summary.c_str(), stdout);
     return ox::processExitCode(status);
 }

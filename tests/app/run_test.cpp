@@ -209,9 +209,16 @@ TEST_F(RunTest, TheRunPlugsInDriversListsAndSettings) {
     EXPECT_EQ(driver->renderType, 0);  // the option was written back before the driver ran
     EXPECT_FALSE(driver->fgUseLegacy);
     EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml", "-b"}, env), ox::kStatusUnsupported);
+    // Without an action option the configuration chose it: the message names that setting.
+    env.drivers.set(ox::kActionVertexTransfer, nullptr);
+    EXPECT_EQ(ox::runThevorn({"thevorn", "s.xml"}, env), ox::kStatusUnsupported);
     const std::string out2 = testing::internal::GetCapturedStdout();
     EXPECT_NE(out2.find("[ERROR]    The texture bake (-b) is not available: this build has no "
                         "driver for it.\n"),
+              std::string::npos)
+        << out2;
+    EXPECT_NE(out2.find("[ERROR]    The vertex surface transfer (renderType VertexTransfer) is not "
+                        "available: this build has no driver for it.\n"),
               std::string::npos)
         << out2;
 }
