@@ -169,6 +169,7 @@ TEST_F(ConfigSchema, EveryExampleConfigurationValidatesAndLoadsWithoutWarnings) 
     }
     EXPECT_GE(documents.size(), 2u);  // the Cornell box's bake.xml and render.xml at least
     const auto shown = readmeConfigurations(readFile((source / "README.md").string()));
+    EXPECT_GE(shown.size(), 1u);  // the walkthrough's bake.xml
     for (size_t i = 0; i < shown.size(); ++i)
         documents.emplace_back("README.md configuration " + std::to_string(i + 1), shown[i]);
 
