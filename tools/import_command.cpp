@@ -334,7 +334,7 @@ void reportStats(const ImportStats &s) {
         message(kMsgWarning, 6, "Dropped %llu points and lines",
                 (unsigned long long)s.pointsAndLines);
     if (s.polygonsTriangulated)
-        message(kMsgWarning, 6, "Triangulated %llu polygons of more than three corners",
+        message(kMsgInfo, 6, "Triangulated %llu polygons of more than three corners",
                 (unsigned long long)s.polygonsTriangulated);
     if (s.hugePolygons)
         message(kMsgWarning, 6, "Dropped %llu polygons of more than %u corners",
@@ -399,8 +399,13 @@ static int runImportSteps(const ImportCommand &command,
     if (!readModel(command.model, options, model, stats)) return kImportFailed;
     if (options.progress) options.progress(1.0f);
     reportStats(stats);
-    if (model.shapes.empty() && !command.list)
-        message(kMsgWarning, 6, "The model %s holds no triangles", command.model.c_str());
+    if (model.shapes.empty() && !command.list) {
+        // Nothing a scene could show: refuse before any file or directory is made. A listing
+        // writes nothing and still shows what the file holds.
+        message(kMsgError, 6, "The model %s holds no triangles; nothing was written",
+                command.model.c_str());
+        return kImportFailed;
+    }
 
     if (command.lightmapResolution > 0 && !addLightmapUVs(model, command.lightmap))
         return kImportFailed;
@@ -463,6 +468,10 @@ static int runImportSteps(const ImportCommand &command,
             "cameras, %zu lights",
             targets.size(), triangles, scenePath.c_str(), model.materials.size(),
             model.instances.size(), model.cameras.size(), model.lights.size());
+    if (model.lights.empty())
+        message(kMsgInfo, 6,
+                "The model has no lights; add one before baking (README, \"Adding lights\", has "
+                "ready LightSource blocks)");
     return kImportOk;
 }
 

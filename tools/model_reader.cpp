@@ -200,7 +200,7 @@ public:
         if (!disk_) {
             if (!sideFiles_ || !sideFiles_(file, data)) return nullptr;
         } else if (!readModelFile(file, kMaxModelFileBytes, data, why)) {
-            message(kMsgWarning, 6, "Cannot read %s: %s", file, why.c_str());
+            reportUnreadable(file, why);
             return nullptr;
         }
         // The only side files the OBJ reader opens are material libraries.
@@ -212,6 +212,25 @@ public:
     void Close(Assimp::IOStream *stream) override { delete stream; }
 
 private:
+    // The library asks for a file more than once, and after a material library that an OBJ
+    // file names it tries one named after the model: each file is reported once, and that
+    // guess not at all once the named library was reported.
+    void reportUnreadable(const std::string &file, const std::string &why) {
+        const bool library = lowerExtension(file) == ".mtl";
+        const bool guess = library && lowerExtension(path_) == ".obj" &&
+                           file == path_.substr(0, path_.size() - 3) + "mtl";
+        if (guess && reportedLibrary_) return;
+        if (!reported_.insert(file).second) return;
+        if (library) {
+            reportedLibrary_ = true;
+            message(kMsgWarning, 6,
+                    "Cannot read the material library %s: %s; the faces that use its materials "
+                    "get the default material",
+                    file.c_str(), why.c_str());
+        } else {
+            message(kMsgWarning, 6, "Cannot read %s: %s", file.c_str(), why.c_str());
+        }
+    }
     bool isMain(const char *file) const {
         if (path_ == file) return true;
         std::error_code ec;
@@ -221,6 +240,8 @@ private:
     std::string_view bytes_;
     bool disk_;
     SideFileReader sideFiles_;
+    std::unordered_set<std::string> reported_;
+    bool reportedLibrary_ = false;
 };
 
 class ProgressRelay : public Assimp::ProgressHandler {

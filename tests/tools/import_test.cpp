@@ -272,11 +272,14 @@ TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
           "Triangulated 1 polygons", "Shapes: 1 (3 triangles)"})
         EXPECT_NE(r.output.find(want), std::string::npos) << want << "\n" << r.output;
 
-    // Nothing usable at all: a warning, no crash, an empty scene.
+    // Nothing usable at all: no crash; the listing shows an empty model, the import refuses it.
     writeText("none.obj", "v 0 0 0\nv 1 0 0\nf 1 2 7\n");
     r = runImport("none.obj --list");
     EXPECT_EQ(r.status, 0) << r.output;
     EXPECT_NE(r.output.find("Shapes: 0"), std::string::npos) << r.output;
+    r = runImport("none.obj -o none");
+    EXPECT_EQ(r.status, 1) << r.output;
+    EXPECT_FALSE(fs::exists("none"));
 }
 
 // A file that is no model: one error, a non-zero status, nothing written.
