@@ -72,12 +72,12 @@ int32_t CameraBakeRun::run() {
     auto *settings = dynamic_cast<ConfigRunSettings *>(&c_.settings);
     if (!settings) {
         message(kMsgError, 6, "The %s needs the configuration reader, which this build lacks.",
-                describeAction(action_).c_str());
+                describeRunAction(action_, c_.options).c_str());
         return kStatusUnsupported;
     }
     if (!factory_.supports(action_)) {
         message(kMsgError, 6, "The %s is not available: this build has no driver for it.",
-                describeAction(action_).c_str());
+                describeRunAction(action_, c_.options).c_str());
         return kStatusUnsupported;
     }
     // The working copy takes whatever the scene load changes (the automatic bias), so

@@ -61,6 +61,7 @@ public:
         : factory_(std::move(factory)), skipPrepass_(skipPrepass) {}
 
     int32_t run(int32_t action, RunContext &context) override;
+    bool supports(int32_t action) const override { return factory_->supports(action); }
 
 private:
     std::shared_ptr<RenderRunFactoryInterface> factory_;

@@ -35,6 +35,11 @@ public:
     virtual ~RunDriverInterface() = default;
     /// Runs action with the run's context.
     virtual int32_t run(int32_t action, RunContext &context) = 0;
+    /// False when this build can register the driver for action but not yet run it.
+    virtual bool supports(int32_t action) const {
+        (void)action;
+        return true;
+    }
 };
 
 /// The drivers known to this build, by action code.

@@ -169,8 +169,10 @@ int32_t runInspect(const InspectCommand &command, std::string &summary) {
     const std::vector<RunFinding> findings = checkRunAgainstScene(settings.config(), scene);
     summary += "Checks against " + command.configFile + ":\n" + formatFindings(findings);
     const int32_t action = resolveAction(kActionNone, settings);
+    const RunEnvironment environment = defaultRunEnvironment();
+    const RunDriverInterface *driver = environment.drivers.find(action);
     const std::string missingDriver =
-        defaultRunEnvironment().drivers.find(action) ? "" : describeRunAction(action, {});
+        driver && driver->supports(action) ? "" : describeRunAction(action, {});
     summary += nextStep(command, scene, &findings, missingDriver);
     return runWouldProceed(findings) ? kStatusSuccess : kStatusFailure;
 }
