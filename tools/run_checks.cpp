@@ -55,9 +55,10 @@ void checkTargets(const OXConfig &config, const Scene &scene, std::vector<RunFin
             continue;
         }
         if (auto [it, fresh] = names.emplace(name, t); !fresh) {
-            out.push_back({FindingLevel::kError,
-                           "target " + name + ": another target has this textureName, so their "
-                                              "files would overwrite each other"});
+            out.push_back(
+                {FindingLevel::kError, "target " + name +
+                                           ": another target has this textureName, so their "
+                                           "files would overwrite each other"});
             continue;
         }
         std::vector<std::string> usable, skipped;
@@ -95,9 +96,9 @@ void checkTargets(const OXConfig &config, const Scene &scene, std::vector<RunFin
         for (const std::string &why : skipped)
             out.push_back({FindingLevel::kWarning,
                            "target " + name + ": " + why + "; the run skips that shape"});
-        out.push_back({FindingLevel::kOk, formatText("target %s: %g x %g texels; ", name.c_str(),
-                                                     w, h) +
-                                              joined(usable)});
+        out.push_back(
+            {FindingLevel::kOk,
+             formatText("target %s: %g x %g texels; ", name.c_str(), w, h) + joined(usable)});
     }
 }
 
@@ -160,13 +161,14 @@ std::vector<RunFinding> checkRunAgainstScene(const OXConfig &config, const Scene
                            "renderType TextureBake, but no pass is switched on in "
                            "TextureBakeSettings/RenderComponents (the run stops with status 10)"});
         else
-            out.push_back({FindingLevel::kOk, "renderType TextureBake: " +
-                                                  plural(bake.targets.size(), "target", "targets") +
-                                                  ", " + plural(passes.size(), "pass", "passes") +
-                                                  " (" + joined(passes) + ")"});
+            out.push_back(
+                {FindingLevel::kOk,
+                 "renderType TextureBake: " + plural(bake.targets.size(), "target", "targets") +
+                     ", " + plural(passes.size(), "pass", "passes") + " (" + joined(passes) + ")"});
         if (bake.targets.size() == 0)
-            out.push_back({FindingLevel::kError,
-                           "TextureBakeSettings/targets lists no BakeTextureTarget: nothing to bake"});
+            out.push_back(
+                {FindingLevel::kError,
+                 "TextureBakeSettings/targets lists no BakeTextureTarget: nothing to bake"});
     } else {
         out.push_back({FindingLevel::kNote, "renderType " + renderTypeName(frame)});
     }
@@ -193,8 +195,8 @@ std::vector<RunFinding> checkRunAgainstScene(const OXConfig &config, const Scene
                        "black (README, \"Adding lights\", has ready LightSource blocks)"});
     } else {
         std::string text;
-        if (!lights.empty()) text = plural(lights.size(), "light", "lights") + " (" +
-                                    joined(lights) + ")";
+        if (!lights.empty())
+            text = plural(lights.size(), "light", "lights") + " (" + joined(lights) + ")";
         if (!emissive.empty())
             text += (text.empty() ? "" : ", ") +
                     plural(emissive.size(), "emissive material", "emissive materials") + " (" +

@@ -51,8 +51,8 @@ public:
 
     /// Empty when the document validates, else libxml2's complaints.
     std::string problems(const std::string &document) const {
-        xmlDocPtr doc = xmlReadMemory(document.data(), int(document.size()), "noname.xml",
-                                      nullptr, XML_PARSE_NONET);
+        xmlDocPtr doc = xmlReadMemory(document.data(), int(document.size()), "noname.xml", nullptr,
+                                      XML_PARSE_NONET);
         if (!doc) return "not well-formed";
         std::string errors;
         xmlSchemaValidCtxtPtr valid = xmlSchemaNewValidCtxt(schema_);
@@ -118,11 +118,13 @@ TEST_F(ConfigSchema, PartialFilesInTheWrittenOrderValidate) {
         bool valid;
     } cases[] = {
         {"an empty root", config(""), true},
-        {"one settings object, one key", config("<FrameSettings><renderType>TextureBake"
-                                                "</renderType></FrameSettings>"),
+        {"one settings object, one key",
+         config("<FrameSettings><renderType>TextureBake"
+                "</renderType></FrameSettings>"),
          true},
-        {"keys in the written order", config("<FrameSettings><cameraName>cam</cameraName>"
-                                             "<renderType>Render</renderType></FrameSettings>"),
+        {"keys in the written order",
+         config("<FrameSettings><cameraName>cam</cameraName>"
+                "<renderType>Render</renderType></FrameSettings>"),
          true},
         {"settings objects in the written order",
          config("<FrameSettings/><GISettings><enableGI>true</enableGI></GISettings>"), true},
@@ -134,8 +136,9 @@ TEST_F(ConfigSchema, PartialFilesInTheWrittenOrderValidate) {
          config("<TextureBakeSettings><RenderComponents><customPasses><element>ambientOcclusion"
                 "</element></customPasses></RenderComponents></TextureBakeSettings>"),
          true},
-        {"keys out of order", config("<FrameSettings><renderType>Render</renderType>"
-                                     "<cameraName>cam</cameraName></FrameSettings>"),
+        {"keys out of order",
+         config("<FrameSettings><renderType>Render</renderType>"
+                "<cameraName>cam</cameraName></FrameSettings>"),
          false},
         {"settings objects out of order", config("<GISettings/><FrameSettings/>"), false},
         {"a bake target as <element>",
@@ -146,13 +149,14 @@ TEST_F(ConfigSchema, PartialFilesInTheWrittenOrderValidate) {
          config("<FrameSettings><resolution><x>64</x></resolution></FrameSettings>"), false},
         {"an unknown enumeration name",
          config("<FrameSettings><renderType>Bake</renderType></FrameSettings>"), false},
-        {"a key given twice", config("<FrameSettings><dither>true</dither><dither>false</dither>"
-                                     "</FrameSettings>"),
+        {"a key given twice",
+         config("<FrameSettings><dither>true</dither><dither>false</dither>"
+                "</FrameSettings>"),
          false},
     };
     for (const auto &c : cases)
         EXPECT_EQ(schema.problems(c.document).empty(), c.valid) << c.what << "\n"
-                                                                  << schema.problems(c.document);
+                                                                << schema.problems(c.document);
 }
 
 TEST_F(ConfigSchema, EveryExampleConfigurationValidatesAndLoadsWithoutWarnings) {

@@ -80,12 +80,12 @@ TEST_F(InspectChecks, TheConfigurationIsCheckedAgainstTheScene) {
                                   "<Instance><Name>ground</Name><Shape>ground</Shape></Instance>"
                                   "<Instance><Name>roof</Name><Shape>roof</Shape></Instance>"
                                   "</OXScene>");
-    const std::string glowing = file(
-        "glow.xml",
-        "<OXScene><Material><Name>m</Name><Emissive><Color><r>1</r><g>1</g><b>1</b><a>1</a>"
-        "</Color><Scale>1</Scale></Emissive></Material>"
-        "<Instance><Name>ground</Name><Shape>ground</Shape></Instance>"
-        "<Instance><Name>roof</Name><Shape>roof</Shape></Instance></OXScene>");
+    const std::string glowing =
+        file("glow.xml",
+             "<OXScene><Material><Name>m</Name><Emissive><Color><r>1</r><g>1</g><b>1</b><a>1</a>"
+             "</Color><Scale>1</Scale></Emissive></Material>"
+             "<Instance><Name>ground</Name><Shape>ground</Shape></Instance>"
+             "<Instance><Name>roof</Name><Shape>roof</Shape></Instance></OXScene>");
     const std::string meshes = " " + ground + " " + roof;
 
     const struct {
@@ -95,48 +95,73 @@ TEST_F(InspectChecks, TheConfigurationIsCheckedAgainstTheScene) {
         int status;
         std::vector<std::string> lines;
     } cases[] = {
-        {"a bake that would run", lit, bake(target("ground", shape("ground")), kTwoPasses), 0,
+        {"a bake that would run",
+         lit,
+         bake(target("ground", shape("ground")), kTwoPasses),
+         0,
          {"  ok       renderType TextureBake: 1 target, 2 passes (tpIllumination, tpAlbedo)\n",
           "  ok       target ground: 4 x 4 texels; ground (UV set \"LightMap\")\n",
           "  ok       cameraName \"cam\" names a camera\n", "  ok       1 light (lamp)\n"}},
         {"a shape without the named set is skipped",
-         lit, bake(target("both", shape("ground") + shape("roof")), kTwoPasses, "cam", "LightMap"),
+         lit,
+         bake(target("both", shape("ground") + shape("roof")), kTwoPasses, "cam", "LightMap"),
          0,
          {"  warning  target both: instance roof has no UV set \"LightMap\" (it has map1); the "
           "run skips that shape\n",
           "  ok       target both: 4 x 4 texels; ground (UV set \"LightMap\")\n"}},
-        {"one set on the shape and none named: the first", lit,
+        {"one set on the shape and none named: the first",
+         lit,
          bake(target("roof", shape("roof")), kTwoPasses),
          0,
          {"  ok       target roof: 4 x 4 texels; roof (UV set \"map1\")\n"}},
-        {"a target whose only instance is missing", lit,
-         bake(target("ground", shape("grund")), kTwoPasses), 1,
+        {"a target whose only instance is missing",
+         lit,
+         bake(target("ground", shape("grund")), kTwoPasses),
+         1,
          {"  error    target ground: nothing to bake: no instance is called \"grund\"\n",
           "Next: mend the configuration where the lines marked error say, then inspect again.\n"}},
-        {"an override naming a set the shape lacks", lit,
-         bake(target("ground", shape("ground", "uv7")), kTwoPasses), 1,
+        {"an override naming a set the shape lacks",
+         lit,
+         bake(target("ground", shape("ground", "uv7")), kTwoPasses),
+         1,
          {"  error    target ground: nothing to bake: instance ground has no UV set \"uv7\" (it "
           "has map1, LightMap)\n"}},
-        {"two targets with one name", lit,
-         bake(target("t", shape("ground")) + target("t", shape("roof")), kTwoPasses), 1,
+        {"two targets with one name",
+         lit,
+         bake(target("t", shape("ground")) + target("t", shape("roof")), kTwoPasses),
+         1,
          {"  error    target t: another target has this textureName"}},
-        {"no pass", lit, bake(target("ground", shape("ground")), ""), 1,
+        {"no pass",
+         lit,
+         bake(target("ground", shape("ground")), ""),
+         1,
          {"  error    renderType TextureBake, but no pass is switched on"}},
-        {"no targets", lit, bake("", kTwoPasses), 1,
+        {"no targets",
+         lit,
+         bake("", kTwoPasses),
+         1,
          {"  error    TextureBakeSettings/targets lists no BakeTextureTarget: nothing to bake\n"}},
-        {"a camera name the scene lacks", lit,
-         bake(target("ground", shape("ground")), kTwoPasses, "persp"), 0,
+        {"a camera name the scene lacks",
+         lit,
+         bake(target("ground", shape("ground")), kTwoPasses, "persp"),
+         0,
          {"  note     cameraName \"persp\" names no camera; the run uses \"cam\", the scene's "
           "first\n"}},
-        {"no light, no emissive material", dark, bake(target("ground", shape("ground")), kTwoPasses),
+        {"no light, no emissive material",
+         dark,
+         bake(target("ground", shape("ground")), kTwoPasses),
          0,
          {"  note     cameraName \"cam\" names no camera; the run uses \"camera1\"",
           "  warning  the scene has no light and no emissive material"}},
-        {"an emissive material gives light", glowing,
-         bake(target("ground", shape("ground")), kTwoPasses), 0,
+        {"an emissive material gives light",
+         glowing,
+         bake(target("ground", shape("ground")), kTwoPasses),
+         0,
          {"  ok       1 emissive material (m)\n"}},
-        {"a render names the camera it falls back to", lit,
-         "<OXConfig><FrameSettings><cameraName>persp</cameraName></FrameSettings></OXConfig>", 0,
+        {"a render names the camera it falls back to",
+         lit,
+         "<OXConfig><FrameSettings><cameraName>persp</cameraName></FrameSettings></OXConfig>",
+         0,
          {"  note     renderType Render\n", "  warning  cameraName \"persp\" names no camera"}},
     };
     for (const auto &c : cases) {
@@ -146,7 +171,7 @@ TEST_F(InspectChecks, TheConfigurationIsCheckedAgainstTheScene) {
         EXPECT_EQ(r.status, c.status) << c.what << "\n" << r.output;
         for (const std::string &line : c.lines)
             EXPECT_NE(r.output.find(line), std::string::npos) << c.what << ": " << line << "\n"
-                                                                << r.output;
+                                                              << r.output;
         // The last line says what to do next.
         const size_t last = r.output.rfind('\n', r.output.size() - 2);
         EXPECT_EQ(r.output.compare(last + 1, 6, "Next: "), 0) << c.what << "\n" << r.output;
