@@ -96,14 +96,14 @@ bool checkPly(std::string_view bytes, std::string &why) {
         } else if (w[0] == "property" && !elements.empty()) {
             Element &e = elements.back();
             const bool list = w.size() >= 2 && w[1] == "list";
-            const uint64_t bytes =
+            const uint64_t propertyBytes =
                 list ? (w.size() >= 5 && plyTypeBytes(w[3]) > 0 ? plyTypeBytes(w[2]) : 0)
                      : (w.size() >= 3 ? plyTypeBytes(w[1]) : 0);
-            if (bytes == 0) {
+            if (propertyBytes == 0) {
                 why = "the header holds a property of an unknown type in element " + e.name;
                 return false;
             }
-            e.minBytes += binary ? bytes : 2;
+            e.minBytes += binary ? propertyBytes : 2;
             if (e.minBytes > 1 << 20) {
                 why = "the header declares too many properties of element " + e.name;
                 return false;

@@ -618,12 +618,12 @@ TEST_F(ShapeNormalizationTest, RecordRoundTripAndZeroRanges) {
         "<!DOCTYPE r [<!ENTITY e SYSTEM \"/etc/passwd\">]><MinMaxRoot><minMaxVec><ShapeMinMax>"
         "<shape>&e;</shape></ShapeMinMax></minMaxVec></MinMaxRoot>",
     };
-    for (const char *text : bad) {
-        std::ofstream("bad.xml") << text;
+    for (const char *doc : bad) {
+        std::ofstream("bad.xml") << doc;
         ox::MinMaxData kept = back;
         const std::string why =
-            captured([&] { EXPECT_FALSE(ox::readMinMaxData("bad.xml", kept)) << text; });
-        EXPECT_TRUE(has(why, "MinMaxData file bad.xml")) << text << ": " << why;
+            captured([&] { EXPECT_FALSE(ox::readMinMaxData("bad.xml", kept)) << doc; });
+        EXPECT_TRUE(has(why, "MinMaxData file bad.xml")) << doc << ": " << why;
         EXPECT_EQ(kept.shapes.size(), back.shapes.size());
     }
 
