@@ -7,15 +7,10 @@
 
 #include "bake_test_util.h"
 #include "core/message.h"
+#include "tests/support/test_support.h"
 
 namespace ox {
 namespace {
-
-std::string capture(const std::function<void()> &f) {
-    testing::internal::CaptureStdout();
-    f();
-    return testing::internal::GetCapturedStdout();
-}
 
 TEST(BakePassList, FollowsTheBakeOrderWithBeautyLast) {
     OXCComplexTypeInstantiator<RenderComponentsBase> c;
@@ -55,7 +50,9 @@ TEST(BakeTargetValidation, RejectsBadSizesAndSharedNames) {
         t.hasResolutionOverride = true;
         t.resolutionOverride = c.size;
         bool ok = false;
-        const std::string out = capture([&] { ok = validateBakeTargets(s, {640, 480}); });
+        const std::string out = oxtest::captureOutput([&] {
+            ok = validateBakeTargets(s, {640, 480});
+        });
         EXPECT_EQ(ok, c.ok) << c.size.x << "x" << c.size.y << " * " << c.scale;
         EXPECT_EQ(out.find("BakeTextureTarget 'wall' with invalid dimension") != std::string::npos,
                   !c.ok);
@@ -69,7 +66,7 @@ TEST(BakeTargetValidation, RejectsBadSizesAndSharedNames) {
     // Two targets named alike would write the same files.
     s.targets.append();
     bool ok = true;
-    const std::string out = capture([&] { ok = validateBakeTargets(s, {640, 480}); });
+    const std::string out = oxtest::captureOutput([&] { ok = validateBakeTargets(s, {640, 480}); });
     EXPECT_FALSE(ok);
     EXPECT_NE(out.find("BakeTextureTarget 1 and 3 are both named 'default'"), std::string::npos);
 }
@@ -113,7 +110,7 @@ TEST(BakeShapes, ResolveUvSetsAndSkipBadShapes) {
     unknown.UVSetOverride = "nope";
 
     std::vector<ResolvedBakeShape> shapes;
-    const std::string out = capture([&] { shapes = resolveBakeShapes(s, t, scene); });
+    const std::string out = oxtest::captureOutput([&] { shapes = resolveBakeShapes(s, t, scene); });
     EXPECT_NE(out.find("Instance missing not found, make sure it exists in the scene"),
               std::string::npos);
     EXPECT_NE(out.find("Target atlas with instance b has a non-invertible UV-matrix!"),

@@ -37,7 +37,7 @@ class WrittenSchema {
 public:
     WrittenSchema() {
         ox::OXConfig config;
-        captured([&] { EXPECT_TRUE(ox::writeSchema("config.xsd", config)); });
+        oxtest::captureOutput([&] { EXPECT_TRUE(ox::writeSchema("config.xsd", config)); });
         xmlSchemaParserCtxtPtr parser = xmlSchemaNewParserCtxt("config.xsd");
         xmlSchemaSetParserErrors(parser, collectError, collectError, &errors_);
         schema_ = xmlSchemaParse(parser);
@@ -180,8 +180,8 @@ TEST_F(ConfigSchema, EveryExampleConfigurationValidatesAndLoadsWithoutWarnings) 
     for (const auto &[name, text] : documents) {
         EXPECT_EQ(schema.problems(text), "") << name;
         ox::OXConfig loaded;
-        const std::string printed =
-            captured([&] { EXPECT_TRUE(ox::loadSettingsFromMemory(text, loaded)) << name; });
+        const std::string printed = oxtest::captureOutput(
+            [&] { EXPECT_TRUE(ox::loadSettingsFromMemory(text, loaded)) << name; });
         EXPECT_EQ(printed.find("arning"), std::string::npos) << name << "\n" << printed;
         if (text.find("<renderType>TextureBake</renderType>") != std::string::npos) {
             // A bake configuration must name what it bakes, in the spelling that loads.

@@ -8,6 +8,7 @@
 
 #include "config/type.h"
 #include "config/xml.h"
+#include "tests/support/test_support.h"
 
 // Settings classes and helpers shared by the configuration tests: every value type, a nested
 // object, both vector kinds, two enumerations that share a type name.
@@ -17,14 +18,6 @@ inline int countOf(const std::string &text, const std::string &what) {
     int n = 0;
     for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
     return n;
-}
-
-/// What is printed to the console while f runs.
-template <typename F>
-std::string captured(F &&f) {
-    testing::internal::CaptureStdout();
-    f();
-    return testing::internal::GetCapturedStdout();
 }
 
 inline std::string readFile(const std::string &path) {

@@ -48,7 +48,7 @@ TEST(ConfigType, RegistryOrderLookupAndDuplicates) {
     EXPECT_EQ(dup.findMember("key"), &dup.first);
     EXPECT_EQ(dup.members().size(), 2u);
 
-    out = captured([&] { EXPECT_EQ(ox::checkDocumentation(dup), 1); });
+    out = oxtest::captureOutput([&] { EXPECT_EQ(ox::checkDocumentation(dup), 1); });
     EXPECT_EQ(countOf(out, "Attribute plain in type Dup is undocumented"), 1);
 }
 
@@ -98,7 +98,7 @@ TEST(ConfigType, EnumerationsAreKeyedByTheirType) {
 
     ox::OXCEnum<EnvB> camEnv("env", EnvB::Latlong);
     // Same member name, another table: refused.
-    EXPECT_EQ(countOf(captured([&] { ox::assign(a.inner.env, camEnv); }),
+    EXPECT_EQ(countOf(oxtest::captureOutput([&] { ox::assign(a.inner.env, camEnv); }),
                       "Type error when assigning variable env"),
               1);
     EXPECT_EQ(a.inner.env.get(), EnvA::Camera);
@@ -129,7 +129,7 @@ TEST(ConfigType, AssignmentByName) {
 
     // A scalar of another type warns and keeps the target.
     ox::OXCType<int32_t> intSource("bias", 3);
-    EXPECT_EQ(countOf(captured([&] { ox::assign(target.bias, intSource); }),
+    EXPECT_EQ(countOf(oxtest::captureOutput([&] { ox::assign(target.bias, intSource); }),
                       "Type error when assigning variable bias"),
               1);
     EXPECT_FLOAT_EQ(target.bias.get(), 0.005f);
@@ -137,12 +137,13 @@ TEST(ConfigType, AssignmentByName) {
     // Vector entries must have the target's element type.
     ox::OXCTypedVector<std::string> strings("targets");
     strings.push("not a target");
-    EXPECT_EQ(countOf(captured([&] { ox::assign(target.targets, strings); }),
+    EXPECT_EQ(countOf(oxtest::captureOutput([&] { ox::assign(target.targets, strings); }),
                       "Type error when assigning variable targets"),
               1);
     EXPECT_EQ(target.targets.size(), 1u);
     ox::OXCType<int32_t> wrongEntry("element", 1);
-    EXPECT_EQ(countOf(captured([&] { EXPECT_FALSE(target.files.add(wrongEntry)); }), "Type error"),
+    EXPECT_EQ(countOf(oxtest::captureOutput([&] { EXPECT_FALSE(target.files.add(wrongEntry)); }),
+                      "Type error"),
               1);
     // Members the target lacks: see VectorEntriesAlwaysHaveTheElementClass.
 }
@@ -180,14 +181,14 @@ TEST(ConfigType, VectorEntriesAlwaysHaveTheElementClass) {
     one.extra = 5;
     ASSERT_TRUE(lookAlikes.add(one));
     All all;
-    EXPECT_EQ(countOf(captured([&] { ox::assign(all.targets, lookAlikes); }),
+    EXPECT_EQ(countOf(oxtest::captureOutput([&] { ox::assign(all.targets, lookAlikes); }),
                       "Unknown target for assignment extra in complex type Target"),
               1);
     ASSERT_EQ(all.targets.size(), 1u);
     EXPECT_EQ(all.targets[0].name.get(), "converted");
     EXPECT_NE(dynamic_cast<TargetBase *>(&all.targets.element(0)), nullptr);
 
-    captured([&] { EXPECT_TRUE(all.targets.append(one.clone())); });
+    oxtest::captureOutput([&] { EXPECT_TRUE(all.targets.append(one.clone())); });
     EXPECT_NE(dynamic_cast<TargetBase *>(&all.targets.element(1)), nullptr);
     EXPECT_EQ(all.targets[1].name.get(), "converted");
 

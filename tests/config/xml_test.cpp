@@ -81,9 +81,10 @@ TEST_F(ConfigXml, WrittenFilesReadBackIdenticallyAndValidate) {
 
     // The schema: a documented scalar's type comes before its annotation; the file validates
     // and an invalid enumeration name does not.
-    EXPECT_EQ(
-        captured([&] { EXPECT_TRUE(ox::writeSchema("a.xsd", original)); }).find("undocumented"),
-        std::string::npos);
+    EXPECT_EQ(oxtest::captureOutput([&] {
+                  EXPECT_TRUE(ox::writeSchema("a.xsd", original));
+              }).find("undocumented"),
+              std::string::npos);
     std::string xsd = readFile("a.xsd");
     EXPECT_NE(xsd.find("<xsd:element name=\"bias\" type=\"xsd:float\" minOccurs=\"0\">"),
               std::string::npos);
@@ -126,7 +127,7 @@ TEST_F(ConfigXml, PartialFilesWarnAndKeepDefaults) {
 </AnyRootName>)");
     Root b;
     bool loaded = false;
-    std::string out = captured([&] { loaded = ox::loadSettings("bad.xml", b); });
+    std::string out = oxtest::captureOutput([&] { loaded = ox::loadSettings("bad.xml", b); });
     ASSERT_TRUE(loaded);
     for (const std::string node : {"Alll", "bogus", "item", "w", "r"})  // r: a fifth matrix row
         EXPECT_EQ(countOf(out, "Warning, unknown node: " + node + "\n"), 1) << node;
@@ -167,7 +168,8 @@ TEST_F(ConfigXml, XIncludeIsRelativeToTheCurrentDirectoryOnEveryThread) {
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>7</count>"
               "<xi:include href=\"part.xml\"/></All></OXConfig>");
     Root r;
-    std::string out = captured([&] { EXPECT_TRUE(ox::loadSettings("sub/main.xml", r)); });
+    std::string out =
+        oxtest::captureOutput([&] { EXPECT_TRUE(ox::loadSettings("sub/main.xml", r)); });
     EXPECT_EQ(countOf(out, "Did XInclude inclusions"), 1);
     EXPECT_FLOAT_EQ(r.all.inner.gamma.get(), 3.5f);
 
@@ -192,7 +194,7 @@ TEST_F(ConfigXml, XIncludeIsRelativeToTheCurrentDirectoryOnEveryThread) {
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>9</count>"
               "<xi:include href=\"nothere.xml\"/></All></OXConfig>");
     Root m;
-    out = captured([&] { EXPECT_FALSE(ox::loadSettings("miss.xml", m)); });
+    out = oxtest::captureOutput([&] { EXPECT_FALSE(ox::loadSettings("miss.xml", m)); });
     EXPECT_EQ(countOf(out, "XInclude processing failed"), 1);
     EXPECT_EQ(m.all.count.get(), -2);
 }
@@ -200,7 +202,8 @@ TEST_F(ConfigXml, XIncludeIsRelativeToTheCurrentDirectoryOnEveryThread) {
 TEST_F(ConfigXml, HostileFilesFailCleanly) {
     Root r;
     auto failsWith = [&](const std::string &file, const std::string &text) {
-        std::string out = captured([&] { EXPECT_FALSE(ox::loadSettings(file, r)) << file; });
+        std::string out =
+            oxtest::captureOutput([&] { EXPECT_FALSE(ox::loadSettings(file, r)) << file; });
         EXPECT_NE(out.find(text), std::string::npos) << file << ": " << out;
     };
     failsWith("missing.xml", "Error opening file missing.xml in xmlsource");
@@ -231,7 +234,7 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
     Root e;
     auto t0 = std::chrono::steady_clock::now();
     bool ok = false;
-    captured([&] { ok = ox::loadSettings("laughs.xml", e); });
+    oxtest::captureOutput([&] { ok = ox::loadSettings("laughs.xml", e); });
     EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(20));
     if (ok) {
         EXPECT_EQ(e.all.camera.get(), "xy");
@@ -244,14 +247,14 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
               "<?xml version=\"1.0\"?><!DOCTYPE r SYSTEM \"nothere.dtd\" [<!ENTITY s SYSTEM "
               "\"secret.txt\">]><OXConfig><All><camera>&s;</camera></All></OXConfig>");
     Root x;
-    captured([&] { ox::loadSettings("ext.xml", x); });
+    oxtest::captureOutput([&] { ox::loadSettings("ext.xml", x); });
     EXPECT_EQ(x.all.camera.get().find("SECRET"), std::string::npos);
 
     // XInclude of a device is refused, not read forever.
     writeFile("dev.xml",
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All>"
               "<xi:include href=\"/dev/zero\" parse=\"text\"/></All></OXConfig>");
-    captured([&] { EXPECT_FALSE(ox::loadSettings("dev.xml", x)); });
+    oxtest::captureOutput([&] { EXPECT_FALSE(ox::loadSettings("dev.xml", x)); });
 
     // Files under /proc report the size 0 but hold text: what is actually read counts, for the
     // main file and for included ones.
@@ -259,7 +262,7 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
               "<OXConfig xmlns:xi=\"http://www.w3.org/2001/XInclude\"><All><count>5</count>"
               "<xi:include href=\"/proc/self/status\" parse=\"text\"/></All></OXConfig>");
     Root p;
-    std::string out = captured([&] { EXPECT_TRUE(ox::loadSettings("proc.xml", p)); });
+    std::string out = oxtest::captureOutput([&] { EXPECT_TRUE(ox::loadSettings("proc.xml", p)); });
     EXPECT_EQ(countOf(out, "Did XInclude inclusions"), 1);
     EXPECT_EQ(p.all.count.get(), 5);
     failsWith("/proc/self/status", "Error parsing file /proc/self/status in xmlsource");
@@ -268,7 +271,7 @@ TEST_F(ConfigXml, HostileFilesFailCleanly) {
 TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
     Root r;
     writeFile("keep.xml", "precious");
-    EXPECT_NE(captured([&] {
+    EXPECT_NE(oxtest::captureOutput([&] {
                   EXPECT_FALSE(ox::writeSettings("keep.xml", r, "NO-SUCH-ENCODING"));
               }).find("Error starting xml document"),
               std::string::npos);
@@ -281,13 +284,13 @@ TEST_F(ConfigXml, FailedWritesKeepTheExistingFile) {
     EXPECT_NE(GetCapturedStdout().find("Error creating xml writer"), std::string::npos);
 
     fs::create_directories("target_is_dir");
-    captured([&] { EXPECT_FALSE(ox::writeSettings("target_is_dir", r)); });
+    oxtest::captureOutput([&] { EXPECT_FALSE(ox::writeSettings("target_is_dir", r)); });
     EXPECT_TRUE(fs::is_directory("target_is_dir"));
 
     // Text that XML cannot carry is refused, not written into an unreadable file.
     for (const char *text : {"a\x01z", "bad \xff utf8", "\xc0\x80", "\xed\xa0\x80"}) {
         r.all.camera = text;
-        EXPECT_NE(captured([&] {
+        EXPECT_NE(oxtest::captureOutput([&] {
                       EXPECT_FALSE(ox::writeSettings("keep.xml", r));
                   }).find("the value of camera is not UTF-8 text"),
                   std::string::npos);
@@ -349,7 +352,7 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
         "<Samples>many</Samples><EnvironmentType> BALL </EnvironmentType></Thing>\n"
         "</OXScene>\n";
     gLive = gMaxLive = 0;
-    std::string out = captured([&] { EXPECT_TRUE(sax.parseMemory(doc)); });
+    std::string out = oxtest::captureOutput([&] { EXPECT_TRUE(sax.parseMemory(doc)); });
     ASSERT_EQ(names.size(), 51u);
     EXPECT_EQ(names[7], "t7");
     EXPECT_EQ(tx[7], 7.0f);
@@ -365,13 +368,13 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
 
     // Another document element: nothing is read.
     names.clear();
-    out = captured(
+    out = oxtest::captureOutput(
         [&] { EXPECT_TRUE(sax.parseMemory("<Scene><Thing><Name>n</Name></Thing></Scene>")); });
     EXPECT_EQ(countOf(out, "[XMLSAXParser] Unknown node: Scene"), 1);
     EXPECT_TRUE(names.empty());
 
     // A malformed document fails after delivering what came before the fault.
-    out = captured([&] {
+    out = oxtest::captureOutput([&] {
         EXPECT_FALSE(sax.parseMemory("<OXScene><Thing><Name>ok</Name></Thing><Thing></OXScene>"));
     });
     EXPECT_NE(out.find("Error parsing file"), std::string::npos);
@@ -388,7 +391,7 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
     // Files: a directory is refused, a real file streams.
     writeFile("scene.xml", doc);
     names.clear();
-    captured([&] {
+    oxtest::captureOutput([&] {
         EXPECT_TRUE(sax.parseFile("scene.xml"));
         EXPECT_FALSE(sax.parseFile("."));
     });
@@ -397,7 +400,7 @@ TEST_F(ConfigXml, StreamingReaderFillsOneObjectAtATime) {
     // Declared and external entities are never expanded, predefined ones are.
     writeFile("secret.txt", "SECRET");
     names.clear();
-    captured([&] {
+    oxtest::captureOutput([&] {
         sax.parseMemory(
             billionLaughs("OXScene SYSTEM \"none.dtd\"", "<!ENTITY s SYSTEM \"secret.txt\">",
                           "<OXScene><Thing><Name>x&a29;&s;&amp;y</Name></Thing></OXScene>"));
@@ -416,7 +419,7 @@ TEST_F(ConfigXml, InputListsAppendTheirEntries) {
     ASSERT_TRUE(ox::loadInputList("l1.xml", files));
     ASSERT_TRUE(ox::loadInputList("l2.xml", files));
     EXPECT_EQ(files, (std::vector<std::string>{"direct.xml", "a.xml", "b.vtm", "c.xml"}));
-    captured([&] { EXPECT_FALSE(ox::loadInputList("missing.xml", files)); });
+    oxtest::captureOutput([&] { EXPECT_FALSE(ox::loadInputList("missing.xml", files)); });
     EXPECT_EQ(files.size(), 4u);
 }
 
@@ -448,12 +451,14 @@ TEST_F(ConfigXml, WholeConfigurationWithEveryVectorFilledRoundTrips) {
     EXPECT_GT(added, 10);
     ASSERT_TRUE(ox::writeSettings("full.xml", config));
     ox::OXConfig loaded;
-    EXPECT_EQ(
-        captured([&] { EXPECT_TRUE(ox::loadSettings("full.xml", loaded)); }).find("[WARNING]"),
-        std::string::npos);
+    EXPECT_EQ(oxtest::captureOutput([&] {
+                  EXPECT_TRUE(ox::loadSettings("full.xml", loaded));
+              }).find("[WARNING]"),
+              std::string::npos);
     ASSERT_TRUE(ox::writeSettings("again.xml", loaded));
     EXPECT_EQ(readFile("full.xml"), readFile("again.xml"));
-    const std::string printed = captured([&] { EXPECT_TRUE(ox::writeSchema("full.xsd", config)); });
+    const std::string printed =
+        oxtest::captureOutput([&] { EXPECT_TRUE(ox::writeSchema("full.xsd", config)); });
     // 36 keys have no text (one of them in both RNMSettings); one more means a lost text.
     EXPECT_EQ(countOf(printed, " is undocumented"), 36) << printed;
     EXPECT_EQ(countOf(printed, "Attribute cosLobeExponent in type RNMSettings is undocumented"), 2);

@@ -24,13 +24,6 @@ int countOf(const std::string &text, const std::string &what) {
     return n;
 }
 
-template <typename F>
-std::string captured(F &&f) {
-    testing::internal::CaptureStdout();
-    f();
-    return testing::internal::GetCapturedStdout();
-}
-
 std::string readFile(const fs::path &path) {
     std::ifstream in(path, std::ios::binary);
     std::stringstream ss;
@@ -161,7 +154,7 @@ TEST(PointCloud, VariablesAreFoundByNameNotByPlace) {
     const std::string bytes = toBytes(odd);
     PointCloud target = oxtest::sampleCloud(ox::PointSampleFactory(), 2);
     const PointCloud before = target;
-    std::string out = captured([&] {
+    std::string out = oxtest::captureOutput([&] {
         EXPECT_FALSE(
             ox::readPointCloudFromMemory(bytes, PointCloudEncoding::Binary, target, &irradiance));
     });
@@ -175,7 +168,7 @@ TEST(PointCloud, VariablesAreFoundByNameNotByPlace) {
     // A variable of the right name but another size is not taken for the expected one.
     PointCloud wide;
     wide.addVariable("position", ox::PointDataType::Double, 3);
-    out = captured([&] {
+    out = oxtest::captureOutput([&] {
         PointCloud c;
         EXPECT_FALSE(
             ox::readPointCloudFromMemory(toBytes(wide), PointCloudEncoding::Binary, c, &photons));
@@ -191,12 +184,12 @@ TEST(PointCloud, VersionsOtherThanOneWarnOrFail) {
         return b;
     };
     PointCloud c;
-    std::string out = captured([&] {
+    std::string out = oxtest::captureOutput([&] {
         EXPECT_FALSE(ox::readPointCloudFromMemory(withVersion(2), PointCloudEncoding::Binary, c));
     });
     EXPECT_NE(out.find("is not a valid binary point cloud file!"), std::string::npos) << out;
     EXPECT_NE(out.find("is not a valid binary point could file!"), std::string::npos) << out;
-    out = captured([&] {
+    out = oxtest::captureOutput([&] {
         EXPECT_TRUE(ox::readPointCloudFromMemory(withVersion(0), PointCloudEncoding::Binary, c));
     });
     EXPECT_NE(out.find("is from another version (version = 0 | current version = 1)"),
@@ -216,7 +209,7 @@ TEST(PointCloud, LongNamesAreCutWithAWarning) {
     cloud.addVariable(std::string(33, 'w'), ox::PointDataType::Float, 1);
     ASSERT_TRUE(cloud.resize(1));
     std::string bytes;
-    std::string out = captured([&] { bytes = toBytes(cloud); });
+    std::string out = oxtest::captureOutput([&] { bytes = toBytes(cloud); });
     EXPECT_EQ(countOf(out, "is longer than 31 bytes"), 3) << out;
     PointCloud back = fromBytes(bytes);
     EXPECT_EQ(back.header().description, std::string(31, 'd'));
@@ -228,7 +221,7 @@ TEST(PointCloud, LongNamesAreCutWithAWarning) {
     PointCloud twins;
     twins.addVariable(std::string(31, 'v') + "1", ox::PointDataType::Float, 1);
     twins.addVariable(std::string(31, 'v') + "2", ox::PointDataType::Float, 1);
-    out = captured([&] {
+    out = oxtest::captureOutput([&] {
         std::string b;
         EXPECT_FALSE(ox::writePointCloudToMemory(b, PointCloudEncoding::Binary, twins));
     });
@@ -310,12 +303,13 @@ TEST(PointCloud, AMillionPointsRoundTrip) {
 TEST_F(PointCloudFiles, FilesAreWrittenAndReadByTheirNames) {
     const PointCloud cloud = oxtest::sampleCloud(ox::PhotonPointSampleFactory(), 5);
     for (const char *name : {"c.ptc", "c.xml", "c.XML", "c"}) {
-        std::string out = captured([&] { EXPECT_TRUE(ox::writePointCloud(name, cloud)); });
+        std::string out =
+            oxtest::captureOutput([&] { EXPECT_TRUE(ox::writePointCloud(name, cloud)); });
         EXPECT_NE(out.find(std::string("Writing file ") + name + " to disk..."), std::string::npos);
         const bool xml = std::string(name) == "c.xml";
         EXPECT_EQ(readFile(name).rfind("<?xml", 0) == 0, xml) << name;
         PointCloud back;
-        out = captured([&] { EXPECT_TRUE(ox::readPointCloud(name, back)); });
+        out = oxtest::captureOutput([&] { EXPECT_TRUE(ox::readPointCloud(name, back)); });
         EXPECT_NE(out.find(std::string("Reading file ") + name + " from disk..."),
                   std::string::npos);
         EXPECT_TRUE(back == cloud) << name;
@@ -324,11 +318,13 @@ TEST_F(PointCloudFiles, FilesAreWrittenAndReadByTheirNames) {
     EXPECT_EQ(std::distance(fs::directory_iterator(dir_), fs::directory_iterator()), 4);
 
     PointCloud c;
-    std::string out = captured([&] { EXPECT_FALSE(ox::readPointCloud("missing.ptc", c)); });
+    std::string out =
+        oxtest::captureOutput([&] { EXPECT_FALSE(ox::readPointCloud("missing.ptc", c)); });
     EXPECT_NE(out.find("Could not open file missing.ptc for reading!"), std::string::npos) << out;
-    out = captured([&] { EXPECT_FALSE(ox::readPointCloud(dir_.string(), c)); });
+    out = oxtest::captureOutput([&] { EXPECT_FALSE(ox::readPointCloud(dir_.string(), c)); });
     EXPECT_NE(out.find("for reading!"), std::string::npos) << out;
-    out = captured([&] { EXPECT_FALSE(ox::writePointCloud("no/such/dir/c.ptc", cloud)); });
+    out = oxtest::captureOutput(
+        [&] { EXPECT_FALSE(ox::writePointCloud("no/such/dir/c.ptc", cloud)); });
     EXPECT_NE(out.find("Could not open file no/such/dir/c.ptc for writing!"), std::string::npos)
         << out;
 }
@@ -346,7 +342,8 @@ TEST_F(PointCloudFiles, FailedWritesLeaveTheOldFileAndNoTrace) {
         struct rlimit low = old;
         low.rlim_cur = 64 * 1024;
         ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &low), 0);
-        std::string out = captured([&] { EXPECT_FALSE(ox::writePointCloud(name, big)); });
+        std::string out =
+            oxtest::captureOutput([&] { EXPECT_FALSE(ox::writePointCloud(name, big)); });
         ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &old), 0);
         EXPECT_NE(out.find(std::string("Could not write file ") + name), std::string::npos) << out;
         EXPECT_EQ(readFile(name), before) << name;
@@ -357,11 +354,12 @@ TEST_F(PointCloudFiles, FailedWritesLeaveTheOldFileAndNoTrace) {
     // Clouds the XML encoding cannot carry are refused before anything is written.
     PointCloud bad = small;
     bad.header().description = "\xff\xfe";
-    std::string out = captured([&] { EXPECT_FALSE(ox::writePointCloud("old.xml", bad)); });
+    std::string out =
+        oxtest::captureOutput([&] { EXPECT_FALSE(ox::writePointCloud("old.xml", bad)); });
     EXPECT_NE(out.find("the description is not text XML can hold"), std::string::npos) << out;
     PointCloud spaced;
     spaced.addVariable("has space", ox::PointDataType::Float, 1);
-    out = captured([&] { EXPECT_FALSE(ox::writePointCloud("old.xml", spaced)); });
+    out = oxtest::captureOutput([&] { EXPECT_FALSE(ox::writePointCloud("old.xml", spaced)); });
     EXPECT_NE(out.find("cannot be an XML element name"), std::string::npos) << out;
 }
 

@@ -4,6 +4,7 @@
 #include "raytrace/instance.h"
 #include "raytrace/shape.h"
 #include "raytrace/vertex_list.h"
+#include "tests/support/test_support.h"
 
 namespace ox {
 namespace {
@@ -11,12 +12,7 @@ namespace {
 // Captures what the message function prints while f runs, with debug messages switched on.
 template <typename F>
 std::string captureMessages(F &&f) {
-    setTypeEnabled(kMsgDebug, true);
-    testing::internal::CaptureStdout();
-    f();
-    std::string out = testing::internal::GetCapturedStdout();
-    resetMessageFilters();
-    return out;
+    return oxtest::captureOutput(f, kMsgDebug);
 }
 
 TEST(VertexList, SetAccessRule) {

@@ -9,18 +9,12 @@
 #include <vector>
 
 #include "render/layer_cache.h"
+#include "tests/support/test_support.h"
 
 namespace {
 
 using ox::Color;
 using ox::Region;
-
-/// What fn printed through the message system.
-std::string captured(const std::function<void()> &fn) {
-    testing::internal::CaptureStdout();
-    fn();
-    return testing::internal::GetCapturedStdout();
-}
 
 bool has(const std::string &text, const std::string &part) {
     return text.find(part) != std::string::npos;
@@ -95,7 +89,7 @@ TEST(LayerTest, PasteReadStrideZeroFillAndRefusedRegions) {
             {Region(0, 0, 10, 2), -2},       {Region(2147483600, 0, 2147483647, 1), -1},
         };
         for (auto &[r, stride] : bad) {
-            std::string out = captured([&, r = r, stride = stride] {
+            std::string out = oxtest::captureOutput([&, r = r, stride = stride] {
                 EXPECT_FALSE(layer->paste(r, big.data(), stride));
                 std::vector<Color> sink(200 * 200);
                 EXPECT_FALSE(layer->read(r, sink.data(), stride));
@@ -111,7 +105,7 @@ TEST(LayerTest, PasteReadStrideZeroFillAndRefusedRegions) {
 }
 
 TEST(LayerTest, SizesAreCheckedBeforeAnythingIsAllocated) {
-    std::string out = captured([] {
+    std::string out = oxtest::captureOutput([] {
         ox::LinearMemoryLayerCF cf("cf", 65536, 65536, 1 << 30);
         EXPECT_FALSE(cf.hasStorage());
         float v = 1.0f;
@@ -124,7 +118,7 @@ TEST(LayerTest, SizesAreCheckedBeforeAnythingIsAllocated) {
     EXPECT_TRUE(has(out, "Failed to initialize linear memory layer")) << out;
     EXPECT_TRUE(has(out, "Failed to initialize Tiled memory layer")) << out;
     ox::Frame frame(10, 10);
-    captured([&] {
+    oxtest::captureOutput([&] {
         EXPECT_FALSE(
             frame.addLayer(std::make_unique<ox::TiledMemoryLayerT<float>>("t", 10, 10, 0, 0)));
     });
@@ -353,7 +347,7 @@ TEST(FrameTest, LayerManagementAndItsMessages) {
     };
     for (const Case &c : cases) {
         bool ok = true;
-        std::string out = captured([&] { ok = c.call(); });
+        std::string out = oxtest::captureOutput([&] { ok = c.call(); });
         EXPECT_FALSE(ok) << c.text;
         EXPECT_TRUE(has(out, std::string("[ERROR]")) && has(out, c.text)) << out;
     }
@@ -380,7 +374,7 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
     ox::Frame frame(8, 8);
     frame.addTiledLayer<Color>("beauty");
     RecordingObserver obs;
-    std::string out = captured([&] {
+    std::string out = oxtest::captureOutput([&] {
         EXPECT_TRUE(frame.registerObserver("beauty", &obs));
         EXPECT_TRUE(frame.registerObserver("beauty", &obs));
     });
@@ -395,7 +389,7 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
     EXPECT_TRUE(frame.flushLayer("beauty"));
     EXPECT_EQ(obs.syncs, 1);
     frame.unregisterObserver("beauty", &obs);
-    out = captured([&] { frame.unregisterObserver("beauty", &obs); });
+    out = oxtest::captureOutput([&] { frame.unregisterObserver("beauty", &obs); });
     EXPECT_TRUE(has(out, "Deleted layer observer didn't exist in layer beauty")) << out;
     ASSERT_TRUE(frame.pasteRegion<Color>("beauty", Region(2, 3, 4, 4), px));
     EXPECT_EQ(obs.regions.size(), 1u);
@@ -407,7 +401,7 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
     frame.addTiledLayer<float>("Z");
     frame.registerObserver("Z", &bare);
     const float z = 1.0f;
-    out = captured([&] { frame.pasteRegion<float>("Z", Region(0, 0, 1, 1), &z); });
+    out = oxtest::captureOutput([&] { frame.pasteRegion<float>("Z", Region(0, 0, 1, 1), &z); });
     EXPECT_TRUE(has(out, "Non implemented notify called")) << out;
     // Deleting the layer drops its registrations along with it.
     EXPECT_TRUE(frame.deleteLayer("Z"));
@@ -452,7 +446,8 @@ TEST(FrameTest, RetiredStorageServesTheNextScratchLayerOnly) {
     EXPECT_EQ(back, all);
     EXPECT_TRUE(obs.regions.empty());
     // A taken name is refused as for any new layer.
-    std::string out = captured([&] { EXPECT_EQ(frame.addScratchColorLayer("temp"), nullptr); });
+    std::string out =
+        oxtest::captureOutput([&] { EXPECT_EQ(frame.addScratchColorLayer("temp"), nullptr); });
     EXPECT_TRUE(has(out, "Layer temp already exists in the frame")) << out;
     frame.retireLayer("temp1");
     frame.releaseRetiredLayers();
@@ -469,7 +464,8 @@ TEST(LayerViewTest, ColourAndCustomFloatViews) {
     std::vector<Color> c(6);
     ASSERT_TRUE(view.read(Region(0, 0, 3, 2), c.data()));
     EXPECT_EQ(c[4], Color(8, 9, 0, 1));
-    std::string out = captured([&] { EXPECT_FALSE(view.paste(Region(0, 0, 1, 1), c.data())); });
+    std::string out =
+        oxtest::captureOutput([&] { EXPECT_FALSE(view.paste(Region(0, 0, 1, 1), c.data())); });
     EXPECT_TRUE(has(out, "Use ColorFromCFLayerRW instead")) << out;
 
     // The writable view stores the channels that exist, from offset 1.
@@ -488,7 +484,7 @@ TEST(LayerViewTest, ColourAndCustomFloatViews) {
     float f[8];
     ASSERT_TRUE(asCF.read(Region(0, 0, 2, 1), f));
     EXPECT_EQ(f[5], 6.0f);
-    out = captured([&] { EXPECT_FALSE(asCF.paste(Region(0, 0, 1, 1), f)); });
+    out = oxtest::captureOutput([&] { EXPECT_FALSE(asCF.paste(Region(0, 0, 1, 1), f)); });
     EXPECT_TRUE(has(out, "CFFromColorLayer.pasteRegion not implemented")) << out;
     EXPECT_TRUE(has(out, "Use CFFromColorLayerRW instead")) << out;
 
@@ -528,11 +524,11 @@ TEST(FrameTest, CropCopiesEveryKind) {
     ASSERT_TRUE(cropped->readCFRegion("irr", Region(0, 0, 1, 1), fb));
     EXPECT_EQ(fb[2], 9.0f);
 
-    std::string out = captured([&] {
+    std::string out = oxtest::captureOutput([&] {
         EXPECT_EQ(ox::FrameUtils::crop(frame, Region(0, 0, 2, 2), {"beauty", "no"}), nullptr);
     });
     EXPECT_TRUE(has(out, "Crop failed, layer no is not present in frame")) << out;
-    out = captured(
+    out = oxtest::captureOutput(
         [&] { EXPECT_EQ(ox::FrameUtils::crop(frame, Region(15, 0, 25, 2), {"beauty"}), nullptr); });
     EXPECT_TRUE(has(out, "Failed to crop layer beauty in FrameUtils::crop")) << out;
 }

@@ -29,12 +29,6 @@ namespace {
 using ox::Color;
 using ox::Region;
 
-std::string captured(const std::function<void()> &fn) {
-    testing::internal::CaptureStdout();
-    fn();
-    return testing::internal::GetCapturedStdout();
-}
-
 bool has(const std::string &text, const std::string &part) {
     return text.find(part) != std::string::npos;
 }
@@ -205,8 +199,8 @@ TEST_F(ImageWriterTest, CollidingChannelNamesAreRefused) {
     for (const Case &c : cases) {
         ox::Frame frame(4, 4);
         c.add(frame);
-        std::string out =
-            captured([&] { EXPECT_FALSE(ox::writeMultiLayerEXR("c.exr", frame, true)); });
+        std::string out = oxtest::captureOutput(
+            [&] { EXPECT_FALSE(ox::writeMultiLayerEXR("c.exr", frame, true)); });
         EXPECT_TRUE(has(out, "Error writing exr file: ")) << out;
         EXPECT_TRUE(has(out, std::string("channel ") + c.channel)) << out;
         EXPECT_FALSE(fs::exists("c.exr"));
@@ -290,7 +284,7 @@ TEST_F(ImageWriterTest, EightBitConversionAndCorrections) {
     gamma->correct(in, out);
     EXPECT_NEAR(out[0].b, std::sqrt(0.5f), 1e-6f);
     EXPECT_EQ(out[0].a, 0.3f);
-    std::string msg = captured([&] {
+    std::string msg = oxtest::captureOutput([&] {
         auto bad = ox::createColorCorrection(ox::ColorCorrection::Gamma, 0.0f);
         bad->correct(in, out);
     });
@@ -382,7 +376,7 @@ TEST_F(ImageWriterTest, FailedWritesLeaveExistingFilesIntact) {
         small.rlim_cur = 2048;
         ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &small), 0);
         bool ok = true;
-        std::string out = captured([&] { ok = c.write(); });
+        std::string out = oxtest::captureOutput([&] { ok = c.write(); });
         setrlimit(RLIMIT_FSIZE, &old);
         EXPECT_FALSE(ok);
         EXPECT_TRUE(has(out, "[ERROR]")) << out;
@@ -407,7 +401,7 @@ TEST_F(ImageWriterTest, FailedWritesLeaveExistingFilesIntact) {
     };
     for (auto &[write, text] : refused) {
         bool ok = true;
-        std::string out = captured([&, &w = write] { ok = w(); });
+        std::string out = oxtest::captureOutput([&, &w = write] { ok = w(); });
         EXPECT_FALSE(ok) << text;
         EXPECT_TRUE(has(out, text)) << out;
     }
@@ -441,7 +435,7 @@ TEST_F(ImageWriterTest, SaveLayerNamesFilesAndSplitsCustomFloatLayers) {
         EXPECT_TRUE(ox::saveLayer(kind, "none", "box", kind == ox::kSaveTGA32 ? "Z" : "beauty",
                                   *frame, nil_, false, "o/"));
     EXPECT_EQ(std::distance(fs::directory_iterator("o"), fs::directory_iterator()), 3);
-    std::string out = captured(
+    std::string out = oxtest::captureOutput(
         [&] { EXPECT_FALSE(ox::saveLayer(9, "x", "box", "beauty", *frame, nil_, false, "o/")); });
     EXPECT_TRUE(has(out, "[ERROR]")) << out;
     // A single-group custom-float layer keeps its plain name.

@@ -24,12 +24,6 @@ using ox::Color;
 using ox::Frame;
 using ox::Region;
 
-std::string captured(const std::function<void()> &fn) {
-    testing::internal::CaptureStdout();
-    fn();
-    return testing::internal::GetCapturedStdout();
-}
-
 bool has(const std::string &text, const std::string &part) {
     return text.find(part) != std::string::npos;
 }
@@ -216,7 +210,12 @@ TEST(EdgeDilationTest, SeveralLayersMissingLayersAndAbort) {
          false,
          false,
          "Source Z layer not found in edge dilation filter"},
-        {"abort", {"beauty", "specular"}, {"beauty", "specular"}, true, true, "Edge dilation aborted"},
+        {"abort",
+         {"beauty", "specular"},
+         {"beauty", "specular"},
+         true,
+         true,
+         "Edge dilation aborted"},
     };
     for (const Case &k : cases) {
         Frame f(2, 2);
@@ -227,7 +226,8 @@ TEST(EdgeDilationTest, SeveralLayersMissingLayersAndAbort) {
         oxtest::FakeIO io;
         io.aborted = k.aborted;
         ox::EdgeDilationFilter filter(k.filterSources, 1, Color::black());
-        const std::string out = captured([&] { EXPECT_FALSE(filter.run(f, &io)) << k.what; });
+        const std::string out =
+            oxtest::captureOutput([&] { EXPECT_FALSE(filter.run(f, &io)) << k.what; });
         EXPECT_TRUE(has(out, k.message)) << k.what << ": " << out;
         EXPECT_EQ(f.layerNames(), before) << k.what;  // no result layer stays behind
         for (const std::string &l : k.layers) EXPECT_EQ(readColors(f, l), a) << k.what;
@@ -361,8 +361,8 @@ TEST(PostFilterCommandTest, FailuresAndAbortLeaveTheSourcesAndNoResult) {
         ox::PostFilterCommand cmd(k.make(), 2);
         oxtest::FakeIO io;
         io.aborted = k.abort;
-        const std::string out =
-            captured([&] { EXPECT_FALSE(cmd.execute(*f, noContext(), io)) << k.what; });
+        const std::string out = oxtest::captureOutput(
+            [&] { EXPECT_FALSE(cmd.execute(*f, noContext(), io)) << k.what; });
         EXPECT_TRUE(has(out, k.message)) << k.what << ": " << out;
         EXPECT_EQ(f->layerNames(), before) << k.what;
         for (const auto &[name, colors] : layers) EXPECT_EQ(readColors(*f, name), colors);
@@ -453,7 +453,8 @@ TEST(RangeRemapTest, MapsTheCoveredRangeToUnitAndLeavesEmptyRangesAlone) {
         auto f = makeFrame(2, 2, z, {{"beauty", k.in}});
         ox::PostFilterCommand cmd(std::make_unique<ox::RangeRemapFilter>("beauty", k.rgb, k.alpha));
         oxtest::FakeIO io;
-        const std::string log = captured([&] { EXPECT_TRUE(cmd.execute(*f, noContext(), io)); });
+        const std::string log =
+            oxtest::captureOutput([&] { EXPECT_TRUE(cmd.execute(*f, noContext(), io)); });
         EXPECT_TRUE(has(log, k.message)) << k.what << ": " << log;
         EXPECT_TRUE(has(log, "Initialising range remap filter...")) << k.what;
         EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
@@ -621,8 +622,8 @@ TEST_F(ShapeNormalizationTest, RecordRoundTripAndZeroRanges) {
     for (const char *doc : bad) {
         std::ofstream("bad.xml") << doc;
         ox::MinMaxData kept = back;
-        const std::string why =
-            captured([&] { EXPECT_FALSE(ox::readMinMaxData("bad.xml", kept)) << doc; });
+        const std::string why = oxtest::captureOutput(
+            [&] { EXPECT_FALSE(ox::readMinMaxData("bad.xml", kept)) << doc; });
         EXPECT_TRUE(has(why, "MinMaxData file bad.xml")) << doc << ": " << why;
         EXPECT_EQ(kept.shapes.size(), back.shapes.size());
     }
@@ -630,13 +631,14 @@ TEST_F(ShapeNormalizationTest, RecordRoundTripAndZeroRanges) {
     // A record that cannot be written fails the filter and leaves the layer as it was.
     auto g = makeFrame(2, 2, z, {{"beauty", in}});
     filter.setRecordFile("no/such/dir/beauty_minmax.xml");
-    const std::string log = captured([&] { EXPECT_FALSE(filter.run(*g, nullptr)); });
+    const std::string log = oxtest::captureOutput([&] { EXPECT_FALSE(filter.run(*g, nullptr)); });
     EXPECT_FALSE(log.empty());
     EXPECT_EQ(g->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
     EXPECT_EQ(readColors(*g, "beauty"), in);
-    EXPECT_TRUE(has(
-        captured([&] { EXPECT_FALSE(ox::readMinMaxData("no/such/dir/beauty_minmax.xml", back)); }),
-        "Could not open MinMaxData file"));
+    EXPECT_TRUE(has(oxtest::captureOutput([&] {
+                        EXPECT_FALSE(ox::readMinMaxData("no/such/dir/beauty_minmax.xml", back));
+                    }),
+                    "Could not open MinMaxData file"));
 }
 
 TEST_F(ShapeNormalizationTest, TexelsWithoutInstanceAreLoggedAndMissingInputsFail) {
@@ -644,19 +646,19 @@ TEST_F(ShapeNormalizationTest, TexelsWithoutInstanceAreLoggedAndMissingInputsFai
     FakeInstances instances(1, {{1, 0}});
     auto f = makeFrame(2, 1, {1, 1}, {{"beauty", {Color(1, 1, 1, 1), Color(3, 3, 3, 1)}}});
     ox::ShapeNormalizationFilter filter("beauty", {}, &instances);
-    std::string log = captured([&] { EXPECT_TRUE(filter.run(*f, nullptr)); });
+    std::string log = oxtest::captureOutput([&] { EXPECT_TRUE(filter.run(*f, nullptr)); });
     EXPECT_TRUE(has(log, "No instance found in sampled pixel 1, 0")) << log;
     EXPECT_EQ(readColors(*f, "beauty")[1], Color(3, 3, 3, 1));
 
     ox::ShapeNormalizationFilter missing("diffuse", {}, &instances);
-    log = captured([&] { EXPECT_FALSE(missing.run(*f, nullptr)); });
+    log = oxtest::captureOutput([&] { EXPECT_FALSE(missing.run(*f, nullptr)); });
     EXPECT_TRUE(has(log, "Source layer diffuse not found in shape normalization filter"));
     ox::ShapeNormalizationFilter noLookup("beauty", {}, nullptr);
-    log = captured([&] { EXPECT_FALSE(noLookup.run(*f, nullptr)); });
+    log = oxtest::captureOutput([&] { EXPECT_FALSE(noLookup.run(*f, nullptr)); });
     EXPECT_FALSE(log.empty());
     oxtest::FakeIO io;
     io.aborted = true;
-    log = captured([&] { EXPECT_FALSE(filter.run(*f, &io)); });
+    log = oxtest::captureOutput([&] { EXPECT_FALSE(filter.run(*f, &io)); });
     EXPECT_TRUE(has(log, "Shape normalization aborted"));
     EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
 }
@@ -679,7 +681,8 @@ TEST(OutputShaderCommandTest, RunsTheShadersOnTheTargetOrFails) {
     EXPECT_TRUE(ok.execute(*f, noContext(), io));
     EXPECT_EQ(readColors(*f, "beauty")[0], Color(4, 8, 12, 16));
     ox::OutputShaderCommand bad("diffuse", {&doubler});
-    const std::string log = captured([&] { EXPECT_FALSE(bad.execute(*f, noContext(), io)); });
+    const std::string log =
+        oxtest::captureOutput([&] { EXPECT_FALSE(bad.execute(*f, noContext(), io)); });
     EXPECT_TRUE(has(log, "OutputShaderCommand failed: target layer diffuse not defined"));
 }
 

@@ -12,6 +12,7 @@
 
 #include "core/message.h"
 #include "scene/vtm.h"
+#include "tests/support/test_support.h"
 
 namespace ox::test {
 
@@ -45,12 +46,7 @@ inline void writeBytes(const std::string &path, const std::vector<unsigned char>
 /// Captures what the message function prints while f runs (debug messages on).
 template <typename F>
 std::string captureMessages(F &&f) {
-    setTypeEnabled(kMsgDebug | kMsgVerbose, true);
-    testing::internal::CaptureStdout();
-    f();
-    std::string out = testing::internal::GetCapturedStdout();
-    resetMessageFilters();
-    return out;
+    return oxtest::captureOutput(f, kMsgDebug | kMsgVerbose);
 }
 
 inline size_t countOf(const std::string &text, const std::string &what) {

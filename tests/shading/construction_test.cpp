@@ -10,17 +10,11 @@
 #include "shading/light.h"
 #include "shading/material.h"
 #include "shading/phong.h"
+#include "tests/support/test_support.h"
 #include "texture/texture_factory.h"
 
 namespace ox {
 namespace {
-
-template <typename F>
-std::string captureMessages(F &&f) {
-    testing::internal::CaptureStdout();
-    f();
-    return testing::internal::GetCapturedStdout();
-}
 
 TEST(Attenuation, ModelsAndRamps) {
     ClampedStandardAttenuation clamped(2.0f);
@@ -112,7 +106,7 @@ TEST(Lights, ConstructionByType) {
     EXPECT_EQ(sl.axis(), Vec3(0, -1, 0));
     // A gobo that cannot be read: the light works without it.
     p.spotLightGoboTexture = "/no/such/gobo.tga";
-    std::string out = captureMessages([&] {
+    std::string out = oxtest::captureOutput([&] {
         auto g = createLight(p, shadows);
         EXPECT_FALSE(static_cast<SimpleSpotLight &>(*g).hasGobo());
     });
@@ -128,7 +122,7 @@ TEST(Lights, ConstructionByType) {
 
     p.type = LightType::kWindow;
     p.directionalLightShadowAngle = 0.5f;
-    out = captureMessages([&] {
+    out = oxtest::captureOutput([&] {
         auto w = createLight(p, shadows);
         auto &wl = static_cast<SimpleWindowLight &>(*w);
         EXPECT_FLOAT_EQ(wl.halfAngle(), 0.25f * 3.14159265f / 180);  // half of 0.5 degrees
@@ -148,7 +142,7 @@ TEST(Lights, ConstructionByType) {
     EXPECT_EQ(shader.evaluateDirection({0, -1, 0}), p.lowerColor);
 
     p.type = static_cast<LightType>(9);
-    out = captureMessages([&] { EXPECT_EQ(createLight(p, shadows), nullptr); });
+    out = oxtest::captureOutput([&] { EXPECT_EQ(createLight(p, shadows), nullptr); });
     EXPECT_NE(out.find("Unknown type 9 of light l"), std::string::npos);
 }
 
@@ -164,7 +158,7 @@ TEST(Lights, ImageBasedLightParameters) {
 
     EnvironmentValues v;
     v.iblImageFile = "/no/such/probe.hdr";
-    std::string out = captureMessages([&] {
+    std::string out = oxtest::captureOutput([&] {
         TextureFactory textures;
         EXPECT_EQ(createImageBasedLight(v, textures), nullptr);
     });

@@ -33,6 +33,18 @@ inline RunResult runProgram(const std::string &program, const std::string &args)
     return r;
 }
 
+/// What the message function prints to the console while f runs. Message types in extraTypes
+/// (debug, verbose) are switched on for the call and the default filters restored afterwards.
+template <typename F>
+std::string captureOutput(F &&f, uint32_t extraTypes = 0) {
+    if (extraTypes != 0) ox::setTypeEnabled(extraTypes, true);
+    ::testing::internal::CaptureStdout();
+    f();
+    std::string out = ::testing::internal::GetCapturedStdout();
+    if (extraTypes != 0) ox::resetMessageFilters();
+    return out;
+}
+
 /// A fixture whose tests each run in a fresh temporary directory with the message filters of a
 /// new process; the old directory is restored and the temporary one removed afterwards.
 class TempDirTest : public ::testing::Test {
