@@ -4,6 +4,7 @@
 #include <cmath>
 #include <map>
 
+#include "bake/bake_target.h"
 #include "core/message.h"
 #include "shading/phong.h"
 
@@ -104,33 +105,6 @@ void checkTargets(const OXConfig &config, const Scene &scene, std::vector<RunFin
 
 }  // namespace
 
-std::vector<std::string> texturePassNames(const RenderComponentsBase &c) {
-    std::vector<std::string> passes;
-    const std::pair<bool, const char *> fixed[] = {
-        {c.illumination(), "tpIllumination"},
-        {c.indirectIllumination(), "tpIndirectIllumination"},
-        {c.albedo(), "tpAlbedo"},
-        {c.diffuse(), "tpDiffuse"},
-        {c.specular(), "tpSpecular"},
-        {c.ambient(), "tpAmbient"},
-        {c.incandescence(), "tpIncandescence"},
-        {c.sss(), "tpSss"},
-        {c.reflections(), "tpReflections"},
-        {c.refractions(), "tpRefractions"},
-        {c.rnm(), "tpRnm"},
-        {c.fullAndIndirectIllumination(), "tpFullandIndirectIllumination"},
-        {c.lua(), "tpLua"},
-        {c.normals(), "tpNormals"},
-    };
-    for (const auto &[on, name] : fixed)
-        if (on) passes.emplace_back(name);
-    for (size_t i = 0; i < c.customPasses.size(); ++i) passes.push_back(c.customPasses[i]);
-    for (size_t i = 0; i < c.lightPass.size(); ++i)
-        passes.push_back(formatText("tpLightPass%zu", i));
-    if (c.fullShading()) passes.emplace_back("beauty");
-    return passes;
-}
-
 int bakeUvSet(const TextureBakeSettingsBase &settings, const BakeShapeBase &shape,
               const VertexList &vertices) {
     const std::string name = shape.hasUVSetOverride() ? shape.UVSetOverride() : settings.uvSet();
@@ -155,7 +129,7 @@ std::vector<RunFinding> checkRunAgainstScene(const OXConfig &config, const Scene
 
     // What kind of run, and what a texture bake would write.
     if (bakes) {
-        const std::vector<std::string> passes = texturePassNames(bake.RenderComponents);
+        const std::vector<std::string> passes = bakePassList(bake.RenderComponents);
         if (passes.empty())
             out.push_back({FindingLevel::kError,
                            "renderType TextureBake, but no pass is switched on in "

@@ -24,9 +24,6 @@ struct RunFinding {
     std::string text;
 };
 
-/// The passes a texture bake with these render components writes, in bake order.
-std::vector<std::string> texturePassNames(const RenderComponentsBase &components);
-
 /// The UV set a bake shape's texels are laid out in: UVSetOverride when hasUVSetOverride is
 /// set, else the settings' uvSet; when both are empty the set called "lightmap" (any case),
 /// else the second set, else the first. -1 when the named set does not exist.
