@@ -189,7 +189,7 @@ bool writeTGA(const std::string &fileName, LayerT<Color> &layer, bool withAlpha,
         message(kMsgError, 6, "Could not open output file: %s", fileName.c_str());
         return false;
     }
-    // ID length, colour-map type, image type 2 (true colour), colour-map spec (5 bytes), x and
+    // ID length, colour-map type, image type 2 (true colour), colour-map layout (5 bytes), x and
     // y origin, width, height (little-endian), pixel depth and descriptor (alpha bits).
     uint8_t header[18] = {0, 0, 2};
     header[12] = uint8_t(w & 0xff);
