@@ -13,6 +13,7 @@
 #include "config/value_text.h"
 #include "config/xml.h"
 #include "config/xml_internal.h"
+#include "config/xml_stream.h"
 #include "core/message.h"
 
 namespace ox {
@@ -54,33 +55,6 @@ int sinkWrite(void *context, const char *buffer, int len) {
 }
 
 int sinkClose(void *) { return 0; }
-
-/// True for valid UTF-8 without the control characters XML 1.0 cannot carry.
-bool isXmlText(std::string_view s) {
-    const auto *p = reinterpret_cast<const unsigned char *>(s.data());
-    const auto *end = p + s.size();
-    while (p < end) {
-        unsigned c = *p;
-        if (c < 0x80) {
-            if (c < 0x20 && c != '\t' && c != '\n' && c != '\r') return false;
-            ++p;
-            continue;
-        }
-        int n = c >= 0xF0 ? 3 : c >= 0xE0 ? 2 : c >= 0xC2 ? 1 : -1;
-        if (n < 0 || c > 0xF4 || end - p <= n) return false;
-        uint32_t cp = c & (0x3F >> n);
-        for (int i = 1; i <= n; ++i) {
-            if ((p[i] & 0xC0) != 0x80) return false;
-            cp = (cp << 6) | (p[i] & 0x3F);
-        }
-        static constexpr uint32_t kMin[] = {0, 0x80, 0x800, 0x10000};
-        if (cp < kMin[n] || cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF) || cp == 0xFFFE ||
-            cp == 0xFFFF)
-            return false;
-        p += n + 1;
-    }
-    return true;
-}
 
 /// Writes the element forms of the value types; stops at the first failing writer call.
 class XMLWriterVisitor final : public OXCTypeVisitorConst {
@@ -156,7 +130,7 @@ public:
         end();
     }
     void visit(const OXCType<std::string> &v) override {
-        if (!isXmlText(v.get())) {
+        if (!isWritableXmlText(v.get())) {
             // The file could not be read back: refuse it rather than write it.
             problem_ = "the value of " + name_ + " is not UTF-8 text that XML can hold";
             ok_ = false;
