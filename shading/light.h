@@ -487,7 +487,7 @@ public:
     bool buildSubLights(const LightProbeImage &probe);
     const std::vector<IBLSubLight> &subLights() const { return lights_; }
     /// The specular sub-lights (one per sub-light, colour x iblSpecularBoost), for the scene to
-    /// add as lights of their own.
+    /// add as lights of their own; specular only when this light emits diffuse light.
     std::vector<std::unique_ptr<KDSpecularSubLight>> makeSpecularSubLights() const;
 
     /// 2^k sub-lights for the smallest k with 2^k >= iblSamples, at most 65536.
@@ -519,7 +519,10 @@ private:
 /// feeds diffuse, specular and ambient shading and casts shadows as the image light does.
 class KDSpecularSubLight : public LightSource {
 public:
-    KDSpecularSubLight(const Vec3 &direction, const Color &color, bool shadows);
+    /// specularOnly: the sub-light feeds specular shading only (the image light emits the
+    /// diffuse part itself).
+    KDSpecularSubLight(const Vec3 &direction, const Color &color, bool shadows,
+                       bool specularOnly = false);
     const char *className() const override { return "KDSpecularSubLight"; }
     Color illuminate(const Vec3 &p, const Vec3 &n, LightContext &ctx,
                      bool withShadow) const override;

@@ -224,15 +224,21 @@ void KDHDRLight::illuminateBoth(Color &shadowed, Color &unshadowed, const Vec3 &
 std::vector<std::unique_ptr<KDSpecularSubLight>> KDHDRLight::makeSpecularSubLights() const {
     std::vector<std::unique_ptr<KDSpecularSubLight>> out;
     out.reserve(lights_.size());
+    // When the image light itself emits diffuse light, the sub-lights feed specular shading
+    // only: otherwise every diffuse surface would receive the probe twice.
+    const bool specularOnly = hasFlag(kLightDiffuse);
     for (const IBLSubLight &l : lights_)
         out.push_back(std::make_unique<KDSpecularSubLight>(
-            l.direction, l.color * (intensity_ * specularBoost_), hasFlag(kLightShadows)));
+            l.direction, l.color * (intensity_ * specularBoost_), hasFlag(kLightShadows),
+            specularOnly));
     return out;
 }
 
-KDSpecularSubLight::KDSpecularSubLight(const Vec3 &direction, const Color &color, bool shadows)
+KDSpecularSubLight::KDSpecularSubLight(const Vec3 &direction, const Color &color, bool shadows,
+                                       bool specularOnly)
     : LightSource("SpecularSublight"), direction_(direction), color_(color) {
-    flags_ = kLightDiffuse | kLightSpecular | kLightAmbient | (shadows ? kLightShadows : 0u);
+    flags_ = (specularOnly ? kLightSpecular : kLightDiffuse | kLightSpecular | kLightAmbient) |
+             (shadows ? kLightShadows : 0u);
     bounds_ = BBox(Vec3(-3.4028235e38f, -3.4028235e38f, -3.4028235e38f),
                    Vec3(3.4028235e38f, 3.4028235e38f, 3.4028235e38f));
     shadow_.kind = ShadowSamplerSettings::kDirectional;

@@ -13,6 +13,7 @@
 #include "core/message.h"
 #include "core/random.h"
 #include "raytrace/complete_grid.h"
+#include "shading/light_loop.h"
 #include "shading/shadow_sampler.h"
 #include "tests/support/tga_file.h"
 #include "texture/texture_factory.h"
@@ -537,6 +538,44 @@ TEST(ImageBasedLight, ConstantProbeLightsEveryUpwardNormalAlike) {
         const float e =
             light.illuminate({0, 0, 0}, n, ctx, false).r * light.cosineFactor({0, 0, 0}, n);
         EXPECT_NEAR(e, 1.0f, 0.01f) << n.x << " " << n.y << " " << n.z;
+    }
+}
+
+TEST(ImageBasedLight, SpecularEmissionLeavesDiffuseLightAlone) {
+    // Diffuse light a surface receives from the image light and its specular sub-lights, each
+    // weighted as the shading loop weighs it. Turning specular emission on adds specular light
+    // only; with diffuse emission off, the sub-lights carry the diffuse part themselves.
+    const LightProbeImage probe = constantProbe(64, 32, Color(1, 1, 1, 1));
+    auto diffuseAt = [&](bool emitDiffuse, bool emitSpecular, const Vec3 &n, float &specular) {
+        EnvironmentValues v;
+        v.iblSamples = 512;
+        v.iblEmitDiffuse = emitDiffuse;
+        v.iblEmitSpecular = emitSpecular;
+        KDHDRLight light(v);
+        EXPECT_TRUE(light.buildSubLights(probe));
+        LightContext ctx;
+        // Lights that add nothing under the mask have a negative weight.
+        auto weight = [](uint32_t flags, float cosine) {
+            return std::fmax(0.0f, diffuseWeight(flags, kShadeDiffuse, cosine));
+        };
+        float diffuse = weight(light.flags(), 1.0f) * light.illuminate({0, 0, 0}, n, ctx, false).r;
+        specular = 0.0f;
+        if (emitSpecular)
+            for (const auto &sub : light.makeSpecularSubLights()) {
+                const float c = sub->illuminate({0, 0, 0}, n, ctx, false).r;
+                diffuse += weight(sub->flags(), dot(n, sub->directionToLight({0, 0, 0}))) * c;
+                if (sub->flags() & kLightSpecular) specular += c;
+            }
+        return diffuse;
+    };
+    for (const Vec3 &n : {Vec3(0, 1, 0), Vec3(1, 1, 0).normalized(), Vec3(0, 0, -1)}) {
+        float specular = 0.0f, none = 0.0f;
+        const float alone = diffuseAt(true, false, n, none);
+        EXPECT_NEAR(alone, 1.0f, 0.02f);
+        EXPECT_FLOAT_EQ(diffuseAt(true, true, n, specular), alone);
+        EXPECT_GT(specular, 0.0f);
+        EXPECT_GT(diffuseAt(false, true, n, specular), 0.0f);
+        EXPECT_EQ(diffuseAt(false, false, n, none), 0.0f);
     }
 }
 
