@@ -81,15 +81,27 @@ bool validateBakeTargets(const TextureBakeSettingsBase &settings, const Vec2i &f
     return ok;
 }
 
-int32_t defaultLightMapUvSet(const Instance &instance) {
-    const VertexList &vl = instance.shape().vertices();
-    const std::vector<std::string> &names = vl.uvSetNames();
-    for (size_t k = 0; k < names.size() && k < vl.uvSetCount(); ++k) {
+int32_t defaultLightMapUvSet(const VertexList &vertices) {
+    const std::vector<std::string> &names = vertices.uvSetNames();
+    for (size_t k = 0; k < names.size() && k < vertices.uvSetCount(); ++k) {
         std::string lower = names[k];
         for (char &ch : lower) ch = char(std::tolower(static_cast<unsigned char>(ch)));
         if (lower == "lightmap") return int32_t(k);
     }
-    return vl.uvSetCount() >= 2 ? 1 : 0;
+    return vertices.uvSetCount() >= 2 ? 1 : 0;
+}
+
+std::string bakeShapeUvSetName(const TextureBakeSettingsBase &settings,
+                               const BakeShapeBase &shape) {
+    return shape.hasUVSetOverride() ? shape.UVSetOverride() : settings.uvSet();
+}
+
+int32_t bakeShapeUvSet(const TextureBakeSettingsBase &settings, const BakeShapeBase &shape,
+                       const VertexList &vertices) {
+    const std::string name = bakeShapeUvSetName(settings, shape);
+    if (name.empty()) return defaultLightMapUvSet(vertices);
+    const int32_t set = vertices.findUvSet(name);
+    return set >= 0 && uint32_t(set) < vertices.uvSetCount() ? set : -1;
 }
 
 std::vector<ResolvedBakeShape> resolveBakeShapes(const TextureBakeSettingsBase &settings,
@@ -111,20 +123,12 @@ std::vector<ResolvedBakeShape> resolveBakeShapes(const TextureBakeSettingsBase &
         r.instance = instance;
         r.instanceIndex = indexOf[instance];
         const VertexList &vl = instance->shape().vertices();
-        std::string setName;
-        if (b.hasUVSetOverride())
-            setName = b.UVSetOverride();
-        else if (!settings.uvSet().empty())
-            setName = settings.uvSet();
-        if (setName.empty()) {
-            r.uvSet = defaultLightMapUvSet(*instance);
-        } else {
-            r.uvSet = vl.findUvSet(setName);
-            if (r.uvSet < 0 || uint32_t(r.uvSet) >= vl.uvSetCount()) {
-                message(kMsgError, 6, "Target %s: instance %s has no UV set '%s'; skipped.",
-                        target.textureName().c_str(), b.target().c_str(), setName.c_str());
-                continue;
-            }
+        r.uvSet = bakeShapeUvSet(settings, b, vl);
+        if (r.uvSet < 0) {
+            message(kMsgError, 6, "Target %s: instance %s has no UV set '%s'; skipped.",
+                    target.textureName().c_str(), b.target().c_str(),
+                    bakeShapeUvSetName(settings, b).c_str());
+            continue;
         }
         if (vl.uvSetCount() == 0) {
             message(kMsgError, 6, "Target %s: instance %s has no UV set; skipped.",

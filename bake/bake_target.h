@@ -14,6 +14,7 @@ namespace ox {
 
 class Instance;
 class Scene;
+class VertexList;
 
 /// Largest bake target edge in texels.
 constexpr int32_t kMaxBakeTargetEdge = 65535;
@@ -45,9 +46,18 @@ struct ResolvedBakeShape {
     std::string name;  ///< the bake shape's own name (light passes), else the instance name
 };
 
-/// The UV set an instance's light map uses when nothing names one: the set called "lightmap"
-/// (any case), else the second set when there are two or more, else the first.
-int32_t defaultLightMapUvSet(const Instance &instance);
+/// The UV set a light map uses when nothing names one: the set called "lightmap" (any case),
+/// else the second set when there are two or more, else the first.
+int32_t defaultLightMapUvSet(const VertexList &vertices);
+
+/// The UV set name a bake shape asks for: its UVSetOverride when hasUVSetOverride is set, else
+/// the settings' uvSet; empty when neither names one.
+std::string bakeShapeUvSetName(const TextureBakeSettingsBase &settings, const BakeShapeBase &shape);
+
+/// The UV set a bake shape's texels are laid out in: the named set (bakeShapeUvSetName), or the
+/// default light-map set when none is named. -1 when the named set does not exist.
+int32_t bakeShapeUvSet(const TextureBakeSettingsBase &settings, const BakeShapeBase &shape,
+                       const VertexList &vertices);
 
 /// Resolves the shapes of target: missing instances, unknown UV sets and non-invertible UV
 /// matrices are reported and skipped. The result may be empty.

@@ -1,6 +1,5 @@
 #include "tools/run_checks.h"
 
-#include <cctype>
 #include <cmath>
 #include <map>
 
@@ -71,10 +70,9 @@ void checkTargets(const OXConfig &config, const Scene &scene, std::vector<RunFin
                 continue;
             }
             const VertexList &vertices = instance->shape().vertices();
-            const int set = bakeUvSet(bake, shape, vertices);
+            const int set = bakeShapeUvSet(bake, shape, vertices);
             if (set < 0 || vertices.uvSetCount() == 0) {
-                const std::string wanted =
-                    shape.hasUVSetOverride() ? shape.UVSetOverride() : bake.uvSet();
+                const std::string wanted = bakeShapeUvSetName(bake, shape);
                 const std::string has = joined(vertices.uvSetNames());
                 skipped.push_back("instance " + shape.target() +
                                   (wanted.empty() ? std::string(" has no UV set")
@@ -104,22 +102,6 @@ void checkTargets(const OXConfig &config, const Scene &scene, std::vector<RunFin
 }
 
 }  // namespace
-
-int bakeUvSet(const TextureBakeSettingsBase &settings, const BakeShapeBase &shape,
-              const VertexList &vertices) {
-    const std::string name = shape.hasUVSetOverride() ? shape.UVSetOverride() : settings.uvSet();
-    if (!name.empty()) {
-        const int set = vertices.findUvSet(name);
-        return set >= 0 && uint32_t(set) < vertices.uvSetCount() ? set : -1;
-    }
-    const std::vector<std::string> &names = vertices.uvSetNames();
-    for (size_t k = 0; k < names.size() && k < vertices.uvSetCount(); ++k) {
-        std::string lower = names[k];
-        for (char &ch : lower) ch = char(std::tolower(static_cast<unsigned char>(ch)));
-        if (lower == "lightmap") return int(k);
-    }
-    return vertices.uvSetCount() >= 2 ? 1 : 0;
-}
 
 std::vector<RunFinding> checkRunAgainstScene(const OXConfig &config, const Scene &scene) {
     std::vector<RunFinding> out;

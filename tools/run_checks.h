@@ -24,12 +24,6 @@ struct RunFinding {
     std::string text;
 };
 
-/// The UV set a bake shape's texels are laid out in: UVSetOverride when hasUVSetOverride is
-/// set, else the settings' uvSet; when both are empty the set called "lightmap" (any case),
-/// else the second set, else the first. -1 when the named set does not exist.
-int bakeUvSet(const TextureBakeSettingsBase &settings, const BakeShapeBase &shape,
-              const VertexList &vertices);
-
 /// Checks the configuration against the loaded scene.
 std::vector<RunFinding> checkRunAgainstScene(const OXConfig &config, const Scene &scene);
 

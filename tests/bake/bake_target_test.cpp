@@ -87,8 +87,8 @@ TEST(BakeShapes, ResolveUvSetsAndSkipBadShapes) {
             {{{0, 0, 0}, {0, 0, 1}, {}}, {{1, 0, 0}, {0, 0, 1}, {}}, {{0, 1, 0}, {0, 0, 1}, {}}},
             {{0, 1, 2}}, {"uv", "LightMap", "x"}),
         "b");
-    EXPECT_EQ(defaultLightMapUvSet(*scene.findInstance("a")), 1);
-    EXPECT_EQ(defaultLightMapUvSet(*scene.findInstance("b")), 1);
+    EXPECT_EQ(defaultLightMapUvSet(scene.findInstance("a")->shape().vertices()), 1);
+    EXPECT_EQ(defaultLightMapUvSet(scene.findInstance("b")->shape().vertices()), 1);
 
     OXCComplexTypeInstantiator<TextureBakeSettingsBase> s;
     BakeTextureTargetBase &t = s.targets.append();
