@@ -1,11 +1,8 @@
-#include <fcntl.h>
 #include <libxml/xmlIO.h>
 #include <libxml/xmlwriter.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
-#include <atomic>
 #include <cerrno>
+#include <cstdio>
 #include <cstring>
 #include <functional>
 #include <new>
@@ -15,6 +12,7 @@
 #include "config/xml_internal.h"
 #include "config/xml_stream.h"
 #include "core/message.h"
+#include "platform/file_system.h"
 
 namespace ox {
 
@@ -24,7 +22,7 @@ const xmlChar *X(const char *s) { return reinterpret_cast<const xmlChar *>(s); }
 
 /// Where the writer's bytes go: a file descriptor or a string; remembers the first error.
 struct Sink {
-    int fd = -1;
+    std::FILE *file = nullptr;
     std::string *text = nullptr;
     int error = 0;
 };
@@ -41,15 +39,9 @@ int sinkWrite(void *context, const char *buffer, int len) {
         }
         return len;
     }
-    int done = 0;
-    while (done < len) {
-        ssize_t n = ::write(sink->fd, buffer + done, size_t(len - done));
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) {
-            sink->error = n < 0 ? errno : EIO;
-            return -1;
-        }
-        done += int(n);
+    if (std::fwrite(buffer, 1, size_t(len), sink->file) != size_t(len)) {
+        sink->error = errno ? errno : EIO;
+        return -1;
     }
     return len;
 }
@@ -374,56 +366,31 @@ bool writeDocument(Sink &sink, const char *encoding, const std::string &displayN
     return ok;
 }
 
-std::atomic<unsigned> gTempCounter{0};
-
 /// Writes a file through a temporary name in the target directory and renames it into place.
-/// On failure the temporary file is removed and errno holds the cause (0 if none).
+/// On failure the temporary file is removed, the target is unchanged and errno holds the cause
+/// (0 if none).
 bool writeFileAtomically(const std::string &fileName, const char *encoding,
                          const std::function<bool(xmlTextWriterPtr, std::string &)> &body) {
-    size_t slash = fileName.find_last_of('/');
-    std::string dir = slash == std::string::npos ? std::string() : fileName.substr(0, slash + 1);
-    std::string base = slash == std::string::npos ? fileName : fileName.substr(slash + 1);
-    std::string temp;
-    int fd = -1;
-    for (int attempt = 0; attempt < 100 && fd < 0; ++attempt) {
-        temp = dir + "." + base + ".tmp" + std::to_string(::getpid()) + "_" +
-               std::to_string(gTempCounter.fetch_add(1));
-        fd = ::open(temp.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
-        if (fd < 0 && errno != EEXIST) break;
-    }
-    if (fd < 0) {
-        int err = errno;
+    AtomicFile file(fileName);
+    Sink sink;
+    sink.file = file.file();
+    if (!sink.file) {
         message(kMsgError, 1, "Error creating xml writer");
+        errno = FileSystemUtilities::lastError();
+        return false;
+    }
+    if (!writeDocument(sink, encoding, fileName, body)) {
+        errno = sink.error;
+        return false;
+    }
+    if (!file.commit()) {
+        const int err = FileSystemUtilities::lastError();
+        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
+                std::strerror(err));
         errno = err;
         return false;
     }
-    Sink sink;
-    sink.fd = fd;
-    bool ok = writeDocument(sink, encoding, fileName, body);
-    int err = sink.error;
-    if (ok && ::fsync(fd) != 0 && errno != EINVAL && errno != EROFS) {
-        err = errno;
-        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
-                std::strerror(err));
-        ok = false;
-    }
-    if (::close(fd) != 0 && ok) {
-        err = errno;
-        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
-                std::strerror(err));
-        ok = false;
-    }
-    if (ok && ::rename(temp.c_str(), fileName.c_str()) != 0) {
-        err = errno;
-        message(kMsgError, 1, "Error writing xml file %s: %s", fileName.c_str(),
-                std::strerror(err));
-        ok = false;
-    }
-    if (!ok) {
-        ::unlink(temp.c_str());
-        errno = err;
-    }
-    return ok;
+    return true;
 }
 
 bool writeSettingsBody(xmlTextWriterPtr w, const OXCTypeBase &root, std::string &why) {

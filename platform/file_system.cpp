@@ -177,7 +177,8 @@ bool AtomicFile::commit() {
         bool ok = std::fflush(f) == 0 && !std::ferror(f);
         int code = ok ? 0 : errno;
         // The data reach the disk before the name does, so a crash never leaves a torn file.
-        if (ok && ::fsync(::fileno(f)) != 0) {
+        // A file system that cannot sync (EINVAL, EROFS) has nothing more to write out.
+        if (ok && ::fsync(::fileno(f)) != 0 && errno != EINVAL && errno != EROFS) {
             ok = false;
             code = errno;
         }
