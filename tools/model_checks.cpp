@@ -52,12 +52,26 @@ bool parseCount(std::string_view text, uint64_t &value) {
 // Every element needs at least one byte per instance (a line break in text files); each
 // property needs its size in binary files and a digit and a separator in text files.
 bool checkPly(std::string_view bytes, std::string &why) {
-    const size_t headerEnd = bytes.find("end_header");
+    // The header ends at the first line whose first word is end_header, as the library reads
+    // it; the same word elsewhere on a line does not end it.
+    size_t headerEnd = std::string_view::npos, bodyStart = std::string_view::npos;
+    for (size_t at = 0; at < bytes.size();) {
+        size_t end = bytes.find('\n', at);
+        const std::vector<std::string_view> w =
+            words(bytes.substr(at, end == std::string_view::npos ? std::string_view::npos
+                                                                 : end - at));
+        if (!w.empty() && w[0] == "end_header") {
+            headerEnd = at;
+            bodyStart = end;
+            break;
+        }
+        if (end == std::string_view::npos) break;
+        at = end + 1;
+    }
     if (headerEnd == std::string_view::npos) {
         why = "the header has no end";
         return false;
     }
-    const size_t bodyStart = bytes.find('\n', headerEnd);
     const uint64_t body = bodyStart == std::string_view::npos ? 0 : bytes.size() - bodyStart - 1;
     std::string_view header = bytes.substr(0, headerEnd);
     bool binary = false;

@@ -362,6 +362,8 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
         // The library took it for a PLY file by its first three letters and spent minutes on
         // a vertex count it read from "107~3741824", with an "end_header" spoilt.
         {data + "ply_magic_only.ply --list", ox::kImportFailed, {"the header has no end"}},
+        // "end_header" inside a property line: the library read on past it and never ended.
+        {data + "end_header_inline.ply --list", ox::kImportFailed, {"the header has no end"}},
         // Its material library sets a colour before naming any material: the library's reader
         // crashed on it.
         {data + "mtl_before_newmtl.obj --list",

@@ -50,6 +50,9 @@ TEST(ModelChecks, DeclaredSizesAgainstTheFile) {
          "the header holds a line that is no header line"},
         {"format.ply", plyHeader("binary_middle_endian", ""), "the header names an unknown format"},
         {"open.ply", "ply\nformat ascii 1.0\nelement vertex 1\n", "the header has no end"},
+        {"inline.ply", "ply\nformat ascii 1.0\nelement vertex 1\nproperty float xend_header\n0\n",
+         "the header has no end"},
+        {"spaced.ply", plyHeader("ascii", "element vertex 1\nproperty float x\n") + "0\n", ""},
         // PLY files are recognised by their first line, not by their name.
         {"text.obj", "v 0 0 0\n", ""},
         {"other.ply", "solid stl\n", ""},
