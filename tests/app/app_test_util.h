@@ -1,21 +1,16 @@
 #pragma once
 
-#include <fstream>
-#include <iterator>
 #include <string>
 #include <vector>
 
 #include "app/config_run_settings.h"
 #include "app/run.h"
+#include "tests/support/test_support.h"
 
 /// What the run tests share: a driver that remembers what it was handed, and whole files.
 namespace apptest {
 
-/// The whole content of a file ("" when it cannot be read).
-inline std::string readFile(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(in), {});
-}
+using oxtest::readFile;
 
 /// A driver that remembers the action, the context and the settings behind them; it looks at the
 /// settings while it runs, since they live only as long as the run.

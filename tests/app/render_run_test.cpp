@@ -109,11 +109,14 @@ protected:
     std::vector<std::string> inputs;
 };
 
-constexpr const char *kCamera =
-    "<Camera><Name>cam</Name><Fov><x>0.8</x><y>0.8</y></Fov>"
-    "<ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r><c>0</c><c>1</c><c>0</c><c>0</c>"
-    "</r><r><c>0</c><c>0</c><c>1</c><c>0</c></r><r><c>0</c><c>0</c><c>5</c><c>1</c></r>"
-    "</ObjectToWorld></Camera>\n";
+/// A perspective camera five units above the origin, looking down -z.
+const std::string kCamera = "<Camera><Name>cam</Name><Fov><x>0.8</x><y>0.8</y></Fov>" +
+                            oxtest::translationXml(0, 0, 5) + "</Camera>\n";
+/// An orthographic camera over the square [-4, 4]^2, five units above it.
+const std::string kTopCamera =
+    "<Camera><Name>top</Name><Type>ORTHO</Type><ImagePlaneSize><x>8</x><y>8</y>"
+    "</ImagePlaneSize>" +
+    oxtest::translationXml(0, 0, 5) + "</Camera>\n";
 
 TEST_F(RenderRun, TriangleCoversThePixelsItsProjectionCovers) {
     const ox::Vec3 tri[3] = {{-1.0f, -1.1f, 0.0f}, {1.6f, -0.4f, 0.0f}, {-0.3f, 1.25f, 0.0f}};
@@ -155,16 +158,11 @@ TEST_F(RenderRun, TriangleCoversThePixelsItsProjectionCovers) {
 TEST_F(RenderRun, PlaneUnderAPointLightFollowsTheInverseSquareCosineLaw) {
     mesh("thing.vtm", "thing",
          {{-10, -10, 0}, {10, -10, 0}, {10, 10, 0}, {-10, -10, 0}, {10, 10, 0}, {-10, 10, 0}});
-    scene(
-        "<Camera><Name>top</Name><Type>ORTHO</Type><ImagePlaneSize><x>8</x><y>8</y>"
-        "</ImagePlaneSize><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r><c>0</c><c>1</c>"
-        "<c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>1</c><c>0</c></r><r><c>0</c><c>0</c><c>5</c>"
-        "<c>1</c></r></ObjectToWorld></Camera>\n"
-        "<LightSource><Name>bulb</Name><Type>POINT</Type><Color><r>1</r><g>1</g><b>1</b><a>1</a>"
-        "</Color><FalloffExponent>2</FalloffExponent><DecayClampToOne>false</DecayClampToOne>"
-        "<CastShadows>false</CastShadows><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r>"
-        "<r><c>0</c><c>1</c><c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>1</c><c>0</c></r>"
-        "<r><c>0</c><c>0</c><c>2</c><c>1</c></r></ObjectToWorld></LightSource>\n");
+    scene(kTopCamera +
+          "<LightSource><Name>bulb</Name><Type>POINT</Type><Color><r>1</r><g>1</g><b>1</b><a>1</a>"
+          "</Color><FalloffExponent>2</FalloffExponent><DecayClampToOne>false</DecayClampToOne>"
+          "<CastShadows>false</CastShadows>" +
+          oxtest::translationXml(0, 0, 2) + "</LightSource>\n");
     config("top");
     const auto r = run({"-x", "render.xml", "-r", "-me", "-q", "-o", "plane", "-rt", "2"});
     ASSERT_EQ(r.status, 0) << r.output;
@@ -191,16 +189,12 @@ TEST_F(RenderRun, SoftShadowsGiveTheSameBytesWhateverTheThreadCount) {
           {-1, -1, 1},
           {1.5f, -0.5f, 1},
           {0, 1.5f, 1}});
-    scene(
-        "<Camera><Name>top</Name><Type>ORTHO</Type><ImagePlaneSize><x>8</x><y>8</y>"
-        "</ImagePlaneSize><ObjectToWorld><r><c>1</c><c>0</c><c>0</c><c>0</c></r><r><c>0</c><c>1</c>"
-        "<c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>1</c><c>0</c></r><r><c>0</c><c>0</c><c>5</c>"
-        "<c>1</c></r></ObjectToWorld></Camera>\n"
-        "<LightSource><Name>panel</Name><Type>AREA</Type><Color><r>4</r><g>4</g><b>4</b><a>1</a>"
-        "</Color><FalloffExponent>2</FalloffExponent><CastShadows>true</CastShadows>"
-        "<ShadowSamples>8</ShadowSamples><ObjectToWorld><r><c>0.7</c><c>0</c><c>0</c><c>0</c></r>"
-        "<r><c>0</c><c>-0.7</c><c>0</c><c>0</c></r><r><c>0</c><c>0</c><c>-1</c><c>0</c></r>"
-        "<r><c>3</c><c>0</c><c>3</c><c>1</c></r></ObjectToWorld></LightSource>\n");
+    const float panel[4][4] = {{0.7f, 0, 0, 0}, {0, -0.7f, 0, 0}, {0, 0, -1, 0}, {3, 0, 3, 1}};
+    scene(kTopCamera +
+          "<LightSource><Name>panel</Name><Type>AREA</Type><Color><r>4</r><g>4</g><b>4</b><a>1</a>"
+          "</Color><FalloffExponent>2</FalloffExponent><CastShadows>true</CastShadows>"
+          "<ShadowSamples>8</ShadowSamples>" +
+          oxtest::objectToWorldXml(panel) + "</LightSource>\n");
     std::ofstream("render.xml")
         << "<?xml version=\"1.0\"?>\n<OXConfig><FrameSettings><resolution><x>24</x><y>24</y>"
            "</resolution><tileSize><x>5</x><y>5</y></tileSize><cameraName>top</cameraName>"

@@ -10,7 +10,6 @@
 #include <array>
 #include <cmath>
 #include <filesystem>
-#include <fstream>
 #include <map>
 #include <string>
 #include <vector>
@@ -90,16 +89,6 @@ void writeMesh(const std::string &path, const std::string &name, const std::vect
     ASSERT_TRUE(vtm::writeTempMesh(path, m, 2, &error)) << error;
 }
 
-std::string matrix(const float rows[4][4]) {
-    std::string s = "<ObjectToWorld>";
-    for (int r = 0; r < 4; ++r) {
-        s += "<r>";
-        for (int c = 0; c < 4; ++c) s += "<c>" + std::to_string(rows[r][c]) + "</c>";
-        s += "</r>";
-    }
-    return s + "</ObjectToWorld>";
-}
-
 std::string sceneXml(const std::string &light, const std::string &instances) {
     return "<?xml version=\"1.0\" encoding=\"ISO-8859-1\"?>\n<OXScene>"
            "<Material><Name>paint</Name><Diffuse><Color><r>0.8</r><g>0.5</g><b>0.25</b>"
@@ -111,12 +100,12 @@ std::string instanceXml(const std::string &name) {
     return "<Instance><Name>" + name + "</Name><Shape>" + name + "</Shape></Instance>";
 }
 
-std::string pointLight(float h) {
-    const float m[4][4] = {{1, 0, 0, 0}, {0, 1, 0, 0}, {0, 0, 1, 0}, {0, 0, h, 1}};
+/// A white point light at (x, y, z) with (1 / d)^2 falloff.
+std::string pointLight(float x, float y, float z) {
     return "<LightSource><Name>lamp</Name><Type>POINT</Type><Color><r>1</r><g>1</g><b>1</b>"
            "<a>1</a></Color><FalloffExponent>2</FalloffExponent><DecayClampToOne>false"
            "</DecayClampToOne><AttenuationType>STANDARD</AttenuationType>" +
-           matrix(m) + "</LightSource>";
+           oxtest::translationXml(x, y, z) + "</LightSource>";
 }
 
 /// A directional light whose light arrives from the direction `towards` (unit).
@@ -130,7 +119,7 @@ std::string sunLight(float tx, float ty, float tz) {
     const float m[4][4] = {{xx, xy, xz, 0}, {tx, ty, tz, 0}, {zx, zy, zz, 0}, {0, 0, 0, 1}};
     return "<LightSource><Name>sun</Name><Type>DIRECTIONAL</Type><Color><r>1</r><g>1</g>"
            "<b>1</b><a>1</a></Color>" +
-           matrix(m) + "</LightSource>";
+           oxtest::objectToWorldXml(m) + "</LightSource>";
 }
 
 struct Target {
@@ -159,22 +148,8 @@ std::string configXml(const std::vector<Target> &targets, const std::string &bak
            "</targets></TextureBakeSettings></OXConfig>\n";
 }
 
-size_t countOf(const std::string &text, const std::string &what) {
-    size_t n = 0;
-    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
-    return n;
-}
-
-void writeText(const std::string &path, const std::string &text) { std::ofstream(path) << text; }
-
-class TextureBakeTest : public oxtest::TempDirTest {
-protected:
-    TextureBakeTest() : TempDirTest("ox_bake_") {}
-    oxtest::RunResult bake(const std::string &args) {
-        return oxtest::runProgram(OX_BINARY_DIR "/app/thevorn",
-                                  "scene.xml plane.vtm -x bake.xml -b -q " + args);
-    }
-};
+using oxtest::countOf;
+using oxtest::writeFile;
 
 // The plane [-1, 1]^2 laid onto UVs [0.125, 0.875]^2 of a 64 x 64 target: 48 x 48 texels
 // covered, the rest background.
@@ -188,11 +163,24 @@ bool planePoint(int x, int y, float &px, float &py) {
     return std::fabs(px) <= 1.0f && std::fabs(py) <= 1.0f;
 }
 
+class TextureBakeTest : public oxtest::TempDirTest {
+protected:
+    TextureBakeTest() : TempDirTest("ox_bake_") {}
+    /// kPlane under a point light one unit above its centre.
+    void planeUnderLamp() {
+        writeMesh("plane.vtm", "plane", {kPlane}, "paint");
+        writeFile("scene.xml", sceneXml(pointLight(0, 0, 1), instanceXml("plane")));
+    }
+    oxtest::RunResult bake(const std::string &args) {
+        return oxtest::runProgram(OX_BINARY_DIR "/app/thevorn",
+                                  "scene.xml plane.vtm -x bake.xml -b -q " + args);
+    }
+};
+
 TEST_F(TextureBakeTest, PointLightOverAPlaneFollowsTheInverseSquareCosineLaw) {
     const float h = 1.0f;
-    writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeText("scene.xml", sceneXml(pointLight(h), instanceXml("plane")));
-    writeText("bake.xml",
+    planeUnderLamp();
+    writeFile("bake.xml",
               configXml({{"plane", {"plane"}}},
                         "<edgeDilation>0</edgeDilation><bilinearFilter>false</bilinearFilter>",
                         "<illumination>true</illumination><albedo>true</albedo>"
@@ -239,8 +227,8 @@ TEST_F(TextureBakeTest, PointLightOverAPlaneFollowsTheInverseSquareCosineLaw) {
 TEST_F(TextureBakeTest, DirectionalLightAtSixtyDegreesGivesOneHalf) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     const float s = std::sqrt(3.0f) / 2.0f;
-    writeText("scene.xml", sceneXml(sunLight(s, 0.0f, 0.5f), instanceXml("plane")));
-    writeText("bake.xml",
+    writeFile("scene.xml", sceneXml(sunLight(s, 0.0f, 0.5f), instanceXml("plane")));
+    writeFile("bake.xml",
               configXml({{"plane", {"plane"}}}, "<bilinearFilter>false</bilinearFilter>",
                         "<illumination>true</illumination>"));
     const oxtest::RunResult r = bake("-e -o lm");
@@ -303,15 +291,8 @@ TEST_F(TextureBakeTest, SeamsOfACubeAgreeUnderBilinearLookups) {
     // A light on the diagonal between the +x and +y faces lights their shared edge alike from
     // both sides: cos = 2 / d on either face.
     writeMesh("plane.vtm", "plane", cubeFaces(), "paint");
-    // The light at (3, 3, 0).
-    const float m[4][4] = {{1, 0, 0, 0}, {0, 1, 0, 0}, {0, 0, 1, 0}, {3, 3, 0, 1}};
-    writeText("scene.xml",
-              sceneXml("<LightSource><Name>lamp</Name><Type>POINT</Type><Color><r>1</r><g>1</g>"
-                       "<b>1</b><a>1</a></Color><FalloffExponent>2</FalloffExponent>"
-                       "<DecayClampToOne>false</DecayClampToOne>" +
-                           matrix(m) + "</LightSource>",
-                       instanceXml("plane")));
-    writeText("bake.xml", configXml({{"cube", {"plane"}, 128}}, "<edgeDilation>2</edgeDilation>",
+    writeFile("scene.xml", sceneXml(pointLight(3, 3, 0), instanceXml("plane")));
+    writeFile("bake.xml", configXml({{"cube", {"plane"}, 128}}, "<edgeDilation>2</edgeDilation>",
                                     "<illumination>true</illumination>"));
     const oxtest::RunResult r = bake("-e -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
@@ -333,8 +314,7 @@ TEST_F(TextureBakeTest, SeamsOfACubeAgreeUnderBilinearLookups) {
 }
 
 TEST_F(TextureBakeTest, BadTargetsFailBeforeAnythingIsBaked) {
-    writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
+    planeUnderLamp();
     struct Case {
         std::vector<Target> targets;
         std::string components;
@@ -346,10 +326,6 @@ TEST_F(TextureBakeTest, BadTargetsFailBeforeAnythingIsBaked) {
          "<illumination>true</illumination>",
          8,
          "BakeTextureTarget 'plane' with invalid dimension 0x0."},
-        {{{"plane", {"plane"}, 70000}},
-         "<illumination>true</illumination>",
-         8,
-         "with invalid dimension 70000x70000."},
         {{{"default", {"plane"}}, {"default", {"plane"}}},
          "<illumination>true</illumination>",
          8,
@@ -362,7 +338,7 @@ TEST_F(TextureBakeTest, BadTargetsFailBeforeAnythingIsBaked) {
          "No shapes to bake, aborting baking"},
     };
     for (const Case &c : cases) {
-        writeText("bake.xml", configXml(c.targets, "", c.components));
+        writeFile("bake.xml", configXml(c.targets, "", c.components));
         const oxtest::RunResult r = bake("-e -o lm");
         EXPECT_EQ(r.status, c.status) << r.output;
         EXPECT_NE(r.output.find(c.text), std::string::npos) << r.output;
@@ -380,7 +356,8 @@ TEST_F(TextureBakeTest, PassesOuterTargetsInnerAndSkippedShapes) {
     writeMesh("plane.vtm", "plane", {kPlane}, "paint");
     writeMesh("other.vtm", "other", {planeQuad(2, -1, 4, 1, 0.125f, 0.125f, 0.875f, 0.875f)},
               "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane") + instanceXml("other")));
+    writeFile("scene.xml",
+              sceneXml(pointLight(0, 0, 1), instanceXml("plane") + instanceXml("other")));
     std::string config = configXml(
         {{"a", {"plane"}, 16}, {"b", {"missing", "other", "plane"}, 16}, {"c", {"plane"}, 16}}, "",
         "<albedo>true</albedo><fullShading>true</fullShading>");
@@ -390,26 +367,16 @@ TEST_F(TextureBakeTest, PassesOuterTargetsInnerAndSkippedShapes) {
     config.replace(at, third.size(),
                    "<element><target>plane</target><UVScale><x>0</x><y>1</y></UVScale></element>"
                    "</targetSurfaces>");
-    writeText("bake.xml", config);
+    writeFile("bake.xml", config);
     const oxtest::RunResult r = oxtest::runProgram(
         OX_BINARY_DIR "/app/thevorn", "scene.xml plane.vtm other.vtm -x bake.xml -b -q -t -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
-    size_t last = 0;
-    const char *steps[] = {
-        "[1/6] Rendering a [Target 1/3] [Pass 1/2]", "[2/6] Rendering b [Target 2/3] [Pass 1/2]",
-        "[3/6] Rendering c [Target 3/3] [Pass 1/2]", "[4/6] Rendering a [Target 1/3] [Pass 2/2]",
-        "[5/6] Rendering b [Target 2/3] [Pass 2/2]", "[6/6] Rendering c [Target 3/3] [Pass 2/2]"};
-    for (const char *s : steps) {
-        const size_t p = r.output.find(s, last);
-        ASSERT_NE(p, std::string::npos) << s << "\n" << r.output;
-        last = p;
-    }
-    EXPECT_NE(r.output.find("Instance missing not found, make sure it exists in the scene"),
-              std::string::npos);
-    EXPECT_NE(r.output.find("Target b with instance plane has a non-invertible UV-matrix!"),
-              std::string::npos);
-    // Shapes are resolved once per target, not once per pass.
-    EXPECT_EQ(countOf(r.output, "Instance missing not found"), 1u);
+    // The step order itself is the driver's (see its tests); here all six steps ran.
+    EXPECT_NE(r.output.find("[6/6] Rendering c [Target 3/3] [Pass 2/2]"), std::string::npos)
+        << r.output;
+    // Shapes are resolved once per target, not once per pass; the skipped shapes' messages
+    // are the bake's own (see its tests).
+    EXPECT_EQ(countOf(r.output, "Instance missing not found"), 1);
     for (const char *f : {"lm_a_tpAlbedo.tga", "lm_b_tpAlbedo.tga", "lm_c_tpAlbedo.tga",
                           "lm_a_beauty.tga", "lm_b_beauty.tga", "lm_c_beauty.tga"})
         EXPECT_TRUE(std::filesystem::exists(f)) << f;
@@ -420,22 +387,21 @@ TEST_F(TextureBakeTest, OverlappingChartsAreReportedOncePerTarget) {
     writeMesh("plane.vtm", "plane",
               {planeQuad(-1, -1, 1, 1, 0, 0, 0.5f, 0.5f), planeQuad(2, -1, 4, 1, 0, 0, 0.5f, 0.5f)},
               "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
-    writeText("bake.xml", configXml({{"plane", {"plane"}, 16}}, "",
+    writeFile("scene.xml", sceneXml(pointLight(0, 0, 1), instanceXml("plane")));
+    writeFile("bake.xml", configXml({{"plane", {"plane"}, 16}}, "",
                                     "<illumination>true</illumination><albedo>true</albedo>"));
     const oxtest::RunResult r = bake("-e -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
     // Centres on the quads' diagonals lie on shared edges, which alone are no overlap.
-    EXPECT_EQ(countOf(r.output, "overlapping UV triangles"), 1u) << r.output;
+    EXPECT_EQ(countOf(r.output, "overlapping UV triangles"), 1) << r.output;
     EXPECT_NE(r.output.find("Target plane: 56 of 64 covered texels lie under overlapping UV"),
               std::string::npos)
         << r.output;
 }
 
 TEST_F(TextureBakeTest, CameraSideWithoutACameraUsesTheSceneCentre) {
-    writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
-    writeText("bake.xml",
+    planeUnderLamp();
+    writeFile("bake.xml",
               configXml({{"plane", {"plane"}, 16}}, "<normalDirection>Camera</normalDirection>",
                         "<illumination>true</illumination>"));
     const oxtest::RunResult r = bake("-e -o lm");
@@ -447,9 +413,8 @@ TEST_F(TextureBakeTest, CameraSideWithoutACameraUsesTheSceneCentre) {
 }
 
 TEST_F(TextureBakeTest, UnwritableOutputFailsWithoutPartialFiles) {
-    writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
-    writeText("bake.xml",
+    planeUnderLamp();
+    writeFile("bake.xml",
               configXml({{"plane", {"plane"}, 16}}, "", "<illumination>true</illumination>"));
     // A directory where the light map would go: the finished file cannot take its name.
     std::filesystem::create_directory("lm_plane.exr");
@@ -494,18 +459,18 @@ TEST_F(TextureBakeTest, SameBytesOnAnyThreadCount) {
             {{{0, 0}, {1, 0}, {1, 1}, {0, 1}}}}},
         "paint");
     const float m[4][4] = {{0.3f, 0, 0, 0}, {0, -0.3f, 0, 0}, {0, 0, -1, 0}, {0, 0, 1.5f, 1}};
-    writeText("scene.xml",
+    writeFile("scene.xml",
               sceneXml("<LightSource><Name>panel</Name><Type>AREA</Type><Color><r>4</r><g>4</g>"
                        "<b>4</b><a>1</a></Color><CastShadows>true</CastShadows><ShadowSamples>8"
                        "</ShadowSamples><FalloffExponent>2</FalloffExponent>" +
-                           matrix(m) + "</LightSource>",
+                           oxtest::objectToWorldXml(m) + "</LightSource>",
                        instanceXml("plane") + instanceXml("blocker")));
     std::string config =
         configXml({{"plane", {"plane"}, 64}}, "<shadows>true</shadows>",
                   "<illumination>true</illumination><fullShading>true</fullShading>");
     config.replace(config.find("<FrameSettings>"), 15,
                    "<AASettings><maxSampleRate>2</maxSampleRate></AASettings><FrameSettings>");
-    writeText("bake.xml", config);
+    writeFile("bake.xml", config);
     std::string first;
     for (const char *threads : {"1", "2", "3"}) {
         const oxtest::RunResult r =
@@ -514,8 +479,7 @@ TEST_F(TextureBakeTest, SameBytesOnAnyThreadCount) {
                                            "-me -o lm -rt ") +
                                    threads);
         ASSERT_EQ(r.status, 0) << r.output;
-        std::ifstream in("lm_plane.exr", std::ios::binary);
-        const std::string bytes((std::istreambuf_iterator<char>(in)), {});
+        const std::string bytes = oxtest::readFile("lm_plane.exr");
         if (first.empty()) first = bytes;
         EXPECT_TRUE(bytes == first) << threads << " threads";
     }
@@ -525,16 +489,14 @@ TEST_F(TextureBakeTest, SameBytesOnAnyThreadCount) {
 }
 
 TEST_F(TextureBakeTest, NormalizedBakeWritesItsRangeAndStaysContinuousAtChartEdges) {
-    writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
-    writeText("bake.xml",
+    planeUnderLamp();
+    writeFile("bake.xml",
               configXml({{"plane", {"plane"}}},
                         "<Normalize><normalizeValues>true</normalizeValues></Normalize>",
                         "<illumination>true</illumination>"));
     const oxtest::RunResult r = bake("-e -o lm");
     ASSERT_EQ(r.status, 0) << r.output;
-    std::ifstream in("lm_plane_tpIllumination.xml");
-    const std::string xml((std::istreambuf_iterator<char>(in)), {});
+    const std::string xml = oxtest::readFile("lm_plane_tpIllumination.xml");
     EXPECT_NE(xml.find("MinMaxRoot"), std::string::npos) << xml;
     EXPECT_NE(xml.find("plane"), std::string::npos) << xml;
     // Max mode: [0, max] -> [0, 1]; the brightest texel is the one under the light.
@@ -552,12 +514,11 @@ TEST_F(TextureBakeTest, NormalizedBakeWritesItsRangeAndStaysContinuousAtChartEdg
 }
 
 TEST_F(TextureBakeTest, RadiosityNormalMapsWriteOneFilePerBasisLayer) {
-    writeMesh("plane.vtm", "plane", {kPlane}, "paint");
-    writeText("scene.xml", sceneXml(pointLight(1.0f), instanceXml("plane")));
+    planeUnderLamp();
     for (const bool mono : {false, true}) {
         for (int k = 0; k < 4; ++k)
             std::filesystem::remove("lm_plane_tpRnm" + std::to_string(k) + ".exr");
-        writeText("bake.xml",
+        writeFile("bake.xml",
                   configXml({{"plane", {"plane"}, 16}}, "",
                             std::string("<rnm>true</rnm><RNMSettings><monochrome>") +
                                 (mono ? "true" : "false") + "</monochrome></RNMSettings>"));

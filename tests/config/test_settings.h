@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <fstream>
-#include <sstream>
 #include <string>
 
 #include "config/type.h"
@@ -14,22 +12,9 @@
 // object, both vector kinds, two enumerations that share a type name.
 namespace cfgtest {
 
-inline int countOf(const std::string &text, const std::string &what) {
-    int n = 0;
-    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
-    return n;
-}
-
-inline std::string readFile(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
-
-inline void writeFile(const std::string &path, const std::string &text) {
-    std::ofstream(path, std::ios::binary) << text;
-}
+using oxtest::countOf;
+using oxtest::readFile;
+using oxtest::writeFile;
 
 /// The tree as the writer puts it in a file.
 inline std::string xmlOf(const ox::OXCTypeBase &v) {

@@ -7,7 +7,6 @@
 #include <cerrno>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 
 #include "core/message.h"
 #include "platform/system.h"
@@ -25,11 +24,6 @@ protected:
         std::vector<std::string> out;
         for (const auto &e : fs::directory_iterator(dir_)) out.push_back(e.path().filename());
         return out;
-    }
-    static std::string read(const std::string &p) {
-        std::stringstream s;
-        s << std::ifstream(p, std::ios::binary).rdbuf();
-        return s.str();
     }
 };
 
@@ -70,7 +64,7 @@ TEST_F(FileSystemTest, ReadsOnlyReadableFilesAndOpensInEveryMode) {
         ASSERT_TRUE(f);
         std::fputs(line, f.get());
     }
-    EXPECT_EQ(read(path("log")), "one\ntwo\n");
+    EXPECT_EQ(oxtest::readFile(path("log")), "one\ntwo\n");
     EXPECT_FALSE(FileSystemUtilities::open(path("none/x"), ox::FileAccess::kRead));
     EXPECT_EQ(FileSystemUtilities::lastError(), ENOENT);
 }
@@ -82,11 +76,11 @@ TEST_F(FileSystemTest, AtomicWritesReplaceWholeOrNothing) {
         std::fputs("half", f);
         return false;
     }));
-    EXPECT_EQ(read(target), "old");
+    EXPECT_EQ(oxtest::readFile(target), "old");
     EXPECT_EQ(entries(), std::vector<std::string>{"out.txt"});  // no temporary left behind
 
     EXPECT_TRUE(ox::writeFileAtomically(target, std::string("new contents")));
-    EXPECT_EQ(read(target), "new contents");
+    EXPECT_EQ(oxtest::readFile(target), "new contents");
     EXPECT_EQ(entries(), std::vector<std::string>{"out.txt"});
 
     {
@@ -99,7 +93,7 @@ TEST_F(FileSystemTest, AtomicWritesReplaceWholeOrNothing) {
         EXPECT_FALSE(fs::exists(path("image.tga")));
         EXPECT_TRUE(file.commit());
     }
-    EXPECT_EQ(read(path("image.tga")), "pixels");
+    EXPECT_EQ(oxtest::readFile(path("image.tga")), "pixels");
     {
         ox::AtomicFile abandoned(path("never.bin"));
         std::fputs("data", abandoned.file());

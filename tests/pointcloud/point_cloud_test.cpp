@@ -18,18 +18,8 @@ using ox::PointCloud;
 using ox::PointCloudEncoding;
 namespace fs = std::filesystem;
 
-int countOf(const std::string &text, const std::string &what) {
-    int n = 0;
-    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
-    return n;
-}
-
-std::string readFile(const fs::path &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
+using oxtest::countOf;
+using oxtest::readFile;
 
 std::string toBytes(const PointCloud &cloud, PointCloudEncoding e = PointCloudEncoding::Binary) {
     std::string out;
@@ -233,44 +223,18 @@ TEST(PointCloud, XmlCarriesEveryFieldInItsElements) {
     const std::string xml = toBytes(cloud, PointCloudEncoding::Xml);
     EXPECT_EQ(xml.rfind("<?xml version=\"1.0\" encoding=\"ISO-8859-1\"?>", 0), 0u) << xml;
     // Header children in order, then the sample with every variable, normals included.
-    const char *order[] = {"<header>",
-                           "<version>1</version>",
-                           "<description>",
-                           "<type>radiancePoint</type>",
-                           "<typeId>10</typeId>",
-                           "<compression>",
-                           "<boundingBoxMinCorner>",
-                           "<boundingBoxMaxCorner>",
-                           "<objectToWorldMatrix>",
-                           "<r>",
-                           "<c>",
-                           "<numPoints>1</numPoints>",
-                           "<pointSize>248</pointSize>",
-                           "<numVariables>12</numVariables>",
-                           "<variableDefinition>",
-                           "<variableName>position</variableName>",
-                           "<dataTypeSize>4</dataTypeSize>",
-                           "<dataTypeCount>3</dataTypeCount>",
-                           "<body>",
-                           "<radiancePoint>",
-                           "<position>",
-                           "<x>",
-                           "<normal>",
-                           "<faceNormal>",
-                           "<radius>",
-                           "<uGrad>",
-                           "<vGrad>",
-                           "<redValues>",
-                           "<element>",
-                           "<greenValues>",
-                           "<blueValues>",
-                           "<uGradValues>",
-                           "<vGradValues>",
-                           "<occlusion>",
-                           "</radiancePoint>"};
+    std::istringstream order(
+        "<header> <version>1</version> <description> <type>radiancePoint</type> "
+        "<typeId>10</typeId> <compression> <boundingBoxMinCorner> <boundingBoxMaxCorner> "
+        "<objectToWorldMatrix> <r> <c> <numPoints>1</numPoints> <pointSize>248</pointSize> "
+        "<numVariables>12</numVariables> <variableDefinition> "
+        "<variableName>position</variableName> <dataTypeSize>4</dataTypeSize> "
+        "<dataTypeCount>3</dataTypeCount> <body> <radiancePoint> <position> <x> <normal> "
+        "<faceNormal> <radius> <uGrad> <vGrad> <redValues> <element> <greenValues> <blueValues> "
+        "<uGradValues> <vGradValues> <occlusion> </radiancePoint>");
     size_t at = 0;
-    for (const char *want : order) {
-        size_t found = xml.find(want, at);
+    for (std::string want; order >> want;) {
+        const size_t found = xml.find(want, at);
         ASSERT_NE(found, std::string::npos) << want << "\n" << xml;
         at = found;
     }

@@ -16,9 +16,7 @@ namespace {
 using ox::Color;
 using ox::Region;
 
-bool has(const std::string &text, const std::string &part) {
-    return text.find(part) != std::string::npos;
-}
+using oxtest::contains;
 
 /// A colour that encodes its pixel, so that any misplaced copy shows.
 Color code(int x, int y, float tag = 0.0f) { return Color(float(x), float(y), tag, 1.0f); }
@@ -94,7 +92,7 @@ TEST(LayerTest, PasteReadStrideZeroFillAndRefusedRegions) {
                 std::vector<Color> sink(200 * 200);
                 EXPECT_FALSE(layer->read(r, sink.data(), stride));
             });
-            EXPECT_TRUE(has(out, "[ERROR]")) << out;
+            EXPECT_TRUE(contains(out, "[ERROR]")) << out;
         }
         std::vector<Color> again(100 * 70);
         ASSERT_TRUE(layer->read(Region(0, 0, 100, 70), again.data()));
@@ -115,8 +113,8 @@ TEST(LayerTest, SizesAreCheckedBeforeAnythingIsAllocated) {
         ox::TiledMemoryLayerT<float> badTile("t", 10, 10, 0, 64);
         EXPECT_FALSE(badTile.hasStorage());
     });
-    EXPECT_TRUE(has(out, "Failed to initialize linear memory layer")) << out;
-    EXPECT_TRUE(has(out, "Failed to initialize Tiled memory layer")) << out;
+    EXPECT_TRUE(contains(out, "Failed to initialize linear memory layer")) << out;
+    EXPECT_TRUE(contains(out, "Failed to initialize Tiled memory layer")) << out;
     ox::Frame frame(10, 10);
     oxtest::captureOutput([&] {
         EXPECT_FALSE(
@@ -349,7 +347,7 @@ TEST(FrameTest, LayerManagementAndItsMessages) {
         bool ok = true;
         std::string out = oxtest::captureOutput([&] { ok = c.call(); });
         EXPECT_FALSE(ok) << c.text;
-        EXPECT_TRUE(has(out, std::string("[ERROR]")) && has(out, c.text)) << out;
+        EXPECT_TRUE(contains(out, std::string("[ERROR]")) && contains(out, c.text)) << out;
     }
     // The refused float paste left the colour layer unchanged.
     Color c(9, 9, 9, 9);
@@ -378,7 +376,7 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
         EXPECT_TRUE(frame.registerObserver("beauty", &obs));
         EXPECT_TRUE(frame.registerObserver("beauty", &obs));
     });
-    EXPECT_TRUE(has(out, "Layer observer double registred for layer beauty")) << out;
+    EXPECT_TRUE(contains(out, "Layer observer double registred for layer beauty")) << out;
     EXPECT_EQ(frame.getLayer("beauty")->observers().size(), 1u);
     const Color px[2] = {Color(1, 2, 3), Color(4, 5, 6)};
     ASSERT_TRUE(frame.pasteRegion<Color>("beauty", Region(2, 3, 4, 4), px));
@@ -390,7 +388,7 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
     EXPECT_EQ(obs.syncs, 1);
     frame.unregisterObserver("beauty", &obs);
     out = oxtest::captureOutput([&] { frame.unregisterObserver("beauty", &obs); });
-    EXPECT_TRUE(has(out, "Deleted layer observer didn't exist in layer beauty")) << out;
+    EXPECT_TRUE(contains(out, "Deleted layer observer didn't exist in layer beauty")) << out;
     ASSERT_TRUE(frame.pasteRegion<Color>("beauty", Region(2, 3, 4, 4), px));
     EXPECT_EQ(obs.regions.size(), 1u);
 
@@ -402,7 +400,7 @@ TEST(FrameTest, ObserversAreNotifiedOncePerPaste) {
     frame.registerObserver("Z", &bare);
     const float z = 1.0f;
     out = oxtest::captureOutput([&] { frame.pasteRegion<float>("Z", Region(0, 0, 1, 1), &z); });
-    EXPECT_TRUE(has(out, "Non implemented notify called")) << out;
+    EXPECT_TRUE(contains(out, "Non implemented notify called")) << out;
     // Deleting the layer drops its registrations along with it.
     EXPECT_TRUE(frame.deleteLayer("Z"));
 }
@@ -448,7 +446,7 @@ TEST(FrameTest, RetiredStorageServesTheNextScratchLayerOnly) {
     // A taken name is refused as for any new layer.
     std::string out =
         oxtest::captureOutput([&] { EXPECT_EQ(frame.addScratchColorLayer("temp"), nullptr); });
-    EXPECT_TRUE(has(out, "Layer temp already exists in the frame")) << out;
+    EXPECT_TRUE(contains(out, "Layer temp already exists in the frame")) << out;
     frame.retireLayer("temp1");
     frame.releaseRetiredLayers();
     EXPECT_EQ(frame.retiredLayerCount(), 0u);
@@ -466,7 +464,7 @@ TEST(LayerViewTest, ColourAndCustomFloatViews) {
     EXPECT_EQ(c[4], Color(8, 9, 0, 1));
     std::string out =
         oxtest::captureOutput([&] { EXPECT_FALSE(view.paste(Region(0, 0, 1, 1), c.data())); });
-    EXPECT_TRUE(has(out, "Use ColorFromCFLayerRW instead")) << out;
+    EXPECT_TRUE(contains(out, "Use ColorFromCFLayerRW instead")) << out;
 
     // The writable view stores the channels that exist, from offset 1.
     ox::ColorFromCFLayerRW rw("temp", cf, 1);
@@ -485,8 +483,8 @@ TEST(LayerViewTest, ColourAndCustomFloatViews) {
     ASSERT_TRUE(asCF.read(Region(0, 0, 2, 1), f));
     EXPECT_EQ(f[5], 6.0f);
     out = oxtest::captureOutput([&] { EXPECT_FALSE(asCF.paste(Region(0, 0, 1, 1), f)); });
-    EXPECT_TRUE(has(out, "CFFromColorLayer.pasteRegion not implemented")) << out;
-    EXPECT_TRUE(has(out, "Use CFFromColorLayerRW instead")) << out;
+    EXPECT_TRUE(contains(out, "CFFromColorLayer.pasteRegion not implemented")) << out;
+    EXPECT_TRUE(contains(out, "Use CFFromColorLayerRW instead")) << out;
 
     ox::TiledMemoryLayerT<float> z("Z", 4, 4);
     ox::CFFromFloatLayerRW zcf("Z", z);
@@ -527,10 +525,10 @@ TEST(FrameTest, CropCopiesEveryKind) {
     std::string out = oxtest::captureOutput([&] {
         EXPECT_EQ(ox::FrameUtils::crop(frame, Region(0, 0, 2, 2), {"beauty", "no"}), nullptr);
     });
-    EXPECT_TRUE(has(out, "Crop failed, layer no is not present in frame")) << out;
+    EXPECT_TRUE(contains(out, "Crop failed, layer no is not present in frame")) << out;
     out = oxtest::captureOutput(
         [&] { EXPECT_EQ(ox::FrameUtils::crop(frame, Region(15, 0, 25, 2), {"beauty"}), nullptr); });
-    EXPECT_TRUE(has(out, "Failed to crop layer beauty in FrameUtils::crop")) << out;
+    EXPECT_TRUE(contains(out, "Failed to crop layer beauty in FrameUtils::crop")) << out;
 }
 
 TEST(LayerCacheTest, ModesAndWriteBack) {

@@ -29,14 +29,8 @@ namespace {
 using ox::Color;
 using ox::Region;
 
-bool has(const std::string &text, const std::string &part) {
-    return text.find(part) != std::string::npos;
-}
-
-std::string readBytes(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(in), {});
-}
+using oxtest::contains;
+using oxtest::readFile;
 
 /// The test picture: every value tells its pixel and layer.
 Color beautyAt(int x, int y) { return Color(x * 0.01f, y * 0.02f, 0.25f + x * y * 1e-4f, 0.5f); }
@@ -86,6 +80,21 @@ std::map<std::string, std::vector<float>> readEXR(const std::string &path,
     return out;
 }
 
+/// The channels prefix + R, G, B (and A) of a file read by readEXR hold beautyAt; the file's
+/// first line is the top row.
+void expectBeauty(std::map<std::string, std::vector<float>> px, const std::string &prefix, int w,
+                  int h, bool alpha) {
+    for (int line = 0; line < h; ++line)
+        for (int x = 0; x < w; ++x) {
+            const Color c = beautyAt(x, h - 1 - line);
+            const size_t i = size_t(line) * w + x;
+            ASSERT_EQ(px[prefix + "R"][i], c.r) << x << "," << line;
+            ASSERT_EQ(px[prefix + "G"][i], c.g) << x << "," << line;
+            ASSERT_EQ(px[prefix + "B"][i], c.b) << x << "," << line;
+            if (alpha) ASSERT_EQ(px[prefix + "A"][i], c.a) << x << "," << line;
+        }
+}
+
 class ImageWriterTest : public oxtest::TempDirTest {
 protected:
     ImageWriterTest() : TempDirTest("oximgw_test_") {}
@@ -132,16 +141,11 @@ TEST_F(ImageWriterTest, MultiLayerEXRRoundTrip) {
         auto px = readEXR("ml.exr", names, fw, fh);
         ASSERT_EQ(fw, w);
         ASSERT_EQ(fh, h);
+        expectBeauty(px, "beauty.", w, h, true);
         for (int line = 0; line < h; ++line)
             for (int x = 0; x < w; ++x) {
-                // The first line of the file is the top row: layer row h - 1.
                 const int y = h - 1 - line;
                 const size_t i = size_t(line) * w + x;
-                const Color c = beautyAt(x, y);
-                ASSERT_EQ(px["beauty.R"][i], c.r);
-                ASSERT_EQ(px["beauty.G"][i], c.g);
-                ASSERT_EQ(px["beauty.B"][i], c.b);
-                ASSERT_EQ(px["beauty.A"][i], c.a);
                 ASSERT_EQ(px["Z"][i], zAt(x, y));
                 ASSERT_EQ(px["mask"][i], (x + y) % 3 == 0 ? 1.0f : 0.0f);
                 ASSERT_EQ(px["irr5"][i], float(5000 + x + y * 0.5));
@@ -155,28 +159,6 @@ TEST_F(ImageWriterTest, MultiLayerEXRRoundTrip) {
     EXPECT_EQ(in.header().channels().findChannel("beauty.A"), nullptr);
     EXPECT_EQ(in.header().typedAttribute<Imf::StringAttribute>(ox::kActiveTilesAttribute).value(),
               "111111111111");
-}
-
-TEST_F(ImageWriterTest, MultiLayerEXROpensInTheCommandLineTools) {
-    auto frame = testFrame(100, 70);
-    ASSERT_TRUE(ox::writeMultiLayerEXR("ml.exr", *frame, true));
-    bool ran = false;
-    if (fs::exists("/usr/bin/exrheader")) {
-        ran = true;
-        auto r = oxtest::runProgram("/usr/bin/exrheader", "ml.exr");
-        EXPECT_EQ(r.status, 0) << r.output;
-        for (const char *s : {"beauty.R", "irr5", "mask", "QUENDAL_ACTIVETILES_PLAIN_TEXT",
-                              "110011001100", "tiledimage"})
-            EXPECT_TRUE(has(r.output, s)) << s << "\n" << r.output;
-    }
-    if (fs::exists("/usr/bin/oiiotool")) {
-        ran = true;
-        auto r = oxtest::runProgram("/usr/bin/oiiotool", "--info -v ml.exr");
-        EXPECT_EQ(r.status, 0) << r.output;
-        for (const char *s : {"100 x   70", "beauty.R", "irr0", "QUENDAL_ACTIVETILES_PLAIN_TEXT"})
-            EXPECT_TRUE(has(r.output, s)) << s << "\n" << r.output;
-    }
-    if (!ran) GTEST_SKIP() << "neither exrheader nor oiiotool is installed";
 }
 
 TEST_F(ImageWriterTest, CollidingChannelNamesAreRefused) {
@@ -201,8 +183,8 @@ TEST_F(ImageWriterTest, CollidingChannelNamesAreRefused) {
         c.add(frame);
         std::string out = oxtest::captureOutput(
             [&] { EXPECT_FALSE(ox::writeMultiLayerEXR("c.exr", frame, true)); });
-        EXPECT_TRUE(has(out, "Error writing exr file: ")) << out;
-        EXPECT_TRUE(has(out, std::string("channel ") + c.channel)) << out;
+        EXPECT_TRUE(contains(out, "Error writing exr file: ")) << out;
+        EXPECT_TRUE(contains(out, std::string("channel ") + c.channel)) << out;
         EXPECT_FALSE(fs::exists("c.exr"));
     }
 }
@@ -219,15 +201,7 @@ TEST_F(ImageWriterTest, SingleImageEXRRoundTrip) {
             EXPECT_EQ(in.header().dataWindow(), in.header().displayWindow());
             EXPECT_EQ(in.header().channels().findChannel("A") != nullptr, alpha);
             int fw, fh;
-            auto px = readEXR("one.exr", {"R", "G", "B"}, fw, fh);
-            for (int line = 0; line < h; ++line)
-                for (int x = 0; x < w; ++x) {
-                    const Color c = beautyAt(x, h - 1 - line);
-                    const size_t i = size_t(line) * w + x;
-                    ASSERT_EQ(px["R"][i], c.r);
-                    ASSERT_EQ(px["G"][i], c.g);
-                    ASSERT_EQ(px["B"][i], c.b);
-                }
+            expectBeauty(readEXR("one.exr", {"R", "G", "B"}, fw, fh), "", w, h, false);
         }
 }
 
@@ -236,7 +210,7 @@ TEST_F(ImageWriterTest, TGABytesBottomRowFirst) {
         for (bool alpha : {false, true}) {
             auto frame = testFrame(w, h);
             ASSERT_TRUE(ox::writeTGA("t.tga", *frame->getColorLayer("beauty"), alpha, nil_, false));
-            const std::string b = readBytes("t.tga");
+            const std::string b = readFile("t.tga");
             const int bpp = alpha ? 4 : 3;
             ASSERT_EQ(b.size(), 18u + size_t(w) * h * bpp);
             const std::string header("\0\0\2\0\0\0\0\0\0\0\0\0", 12);
@@ -289,7 +263,7 @@ TEST_F(ImageWriterTest, EightBitConversionAndCorrections) {
         bad->correct(in, out);
     });
     EXPECT_EQ(out[0].b, 0.5f);
-    EXPECT_TRUE(has(msg, "[WARNING]")) << msg;
+    EXPECT_TRUE(contains(msg, "[WARNING]")) << msg;
 
     // Through a writer: corrected, and the same bytes on every run with dither.
     ox::LinearMemoryLayerT<Color> layer("beauty", 3, 1);
@@ -297,13 +271,13 @@ TEST_F(ImageWriterTest, EightBitConversionAndCorrections) {
                          Color(0.3f, 0.3f, 0.3f, 1)};
     layer.paste(Region(0, 0, 3, 1), px);
     ASSERT_TRUE(ox::writeTGA("g.tga", layer, false, *gamma, false));
-    const std::string b = readBytes("g.tga");
+    const std::string b = readFile("g.tga");
     EXPECT_EQ(uint8_t(b[18 + 2]), uint8_t(std::sqrt(0.5f) * 255.0f));
     EXPECT_EQ(uint8_t(b[18 + 3]), 255);  // blue 2 clamps
     EXPECT_EQ(uint8_t(b[18 + 5]), 0);    // red NaN
     ASSERT_TRUE(ox::writeTGA("d1.tga", layer, true, nil_, true));
     ASSERT_TRUE(ox::writeTGA("d2.tga", layer, true, nil_, true));
-    EXPECT_EQ(readBytes("d1.tga"), readBytes("d2.tga"));
+    EXPECT_EQ(readFile("d1.tga"), readFile("d2.tga"));
 }
 
 /// Decodes a JPEG file with libjpeg: RGB bytes, file line 0 first.
@@ -379,8 +353,8 @@ TEST_F(ImageWriterTest, FailedWritesLeaveExistingFilesIntact) {
         std::string out = oxtest::captureOutput([&] { ok = c.write(); });
         setrlimit(RLIMIT_FSIZE, &old);
         EXPECT_FALSE(ok);
-        EXPECT_TRUE(has(out, "[ERROR]")) << out;
-        EXPECT_EQ(readBytes(c.name), "precious");
+        EXPECT_TRUE(contains(out, "[ERROR]")) << out;
+        EXPECT_EQ(readFile(c.name), "precious");
     }
     signal(SIGXFSZ, SIG_DFL);
     // No temporary file is left behind.
@@ -403,9 +377,9 @@ TEST_F(ImageWriterTest, FailedWritesLeaveExistingFilesIntact) {
         bool ok = true;
         std::string out = oxtest::captureOutput([&, &w = write] { ok = w(); });
         EXPECT_FALSE(ok) << text;
-        EXPECT_TRUE(has(out, text)) << out;
+        EXPECT_TRUE(contains(out, text)) << out;
     }
-    EXPECT_EQ(readBytes("keep.tga"), "precious");
+    EXPECT_EQ(readFile("keep.tga"), "precious");
 }
 
 TEST_F(ImageWriterTest, SaveLayerNamesFilesAndSplitsCustomFloatLayers) {
@@ -424,7 +398,7 @@ TEST_F(ImageWriterTest, SaveLayerNamesFilesAndSplitsCustomFloatLayers) {
     ASSERT_TRUE(ox::saveLayer(ox::kSaveTGA24, "out", "box", "irr", *frame, nil_, false, "o/"));
     ASSERT_TRUE(fs::exists("o/out_box_irr 0.tga"));
     // The second image holds channels 4 and 5 in red and green, 0 in blue.
-    const std::string b = readBytes("o/out_box_irr 1.tga");
+    const std::string b = readFile("o/out_box_irr 1.tga");
     ASSERT_EQ(b.size(), 18u + 15 * 3);
     EXPECT_EQ(uint8_t(b[18]), 0);
     EXPECT_EQ(uint8_t(b[19]), 255);  // 5000 clamps
@@ -437,7 +411,7 @@ TEST_F(ImageWriterTest, SaveLayerNamesFilesAndSplitsCustomFloatLayers) {
     EXPECT_EQ(std::distance(fs::directory_iterator("o"), fs::directory_iterator()), 3);
     std::string out = oxtest::captureOutput(
         [&] { EXPECT_FALSE(ox::saveLayer(9, "x", "box", "beauty", *frame, nil_, false, "o/")); });
-    EXPECT_TRUE(has(out, "[ERROR]")) << out;
+    EXPECT_TRUE(contains(out, "[ERROR]")) << out;
     // A single-group custom-float layer keeps its plain name.
     frame->addCustomFloatLayer("ao", 2);
     ASSERT_TRUE(ox::saveLayer(ox::kSaveJPEG, "", "box", "ao", *frame, nil_, false, "o/"));

@@ -111,7 +111,7 @@ TEST(ZPXLoader, LoadsAWholeScene) {
     EXPECT_EQ(test::countOf(r.out,
                             "Provided more than one material override for instance wall1, "
                             "using only the first for the entire shape"),
-              1u);
+              1);
 
     ASSERT_EQ(scene.shapes().size(), 2u);
     EXPECT_EQ(scene.shapes()[0]->name(), "plane");  // in the order of the inputs
@@ -326,8 +326,8 @@ TEST(ZPXLoader, GobosProbesAndGeneratedLights) {
     Scene scene;
     LoadResult r = load(f.inputs, scene, s);
     ASSERT_TRUE(r.ok) << r.error << r.out;
-    EXPECT_EQ(test::countOf(r.out, "Gobo file " + bad + " failed to load"), 1u) << r.out;
-    EXPECT_EQ(test::countOf(r.out, "Duplicate light name"), 1u) << r.out;  // the second lamp
+    EXPECT_EQ(test::countOf(r.out, "Gobo file " + bad + " failed to load"), 1) << r.out;
+    EXPECT_EQ(test::countOf(r.out, "Duplicate light name"), 1) << r.out;  // the second lamp
 
     // The gobo over a cone of 45 degrees each side: u = 0.5 + x / 2, v = 0.5 + z / 2 one unit
     // below the light; near the cone's edge the edge texels, never the opposite side.

@@ -65,9 +65,9 @@ TEST(MeshBuilder, SkipsEmptyAndDegeneratedTriangles) {
     auto [status, shape, failure, out] = buildMesh(m.mesh);
     ASSERT_EQ(status, ShapeBuildStatus::kBuilt);
     EXPECT_EQ(shape->triangleCount(), 2u);  // the first and the reversed last
-    EXPECT_EQ(countOf(out, "[DEBUG]    Empty triangle found, skipping it"), 1u) << out;
+    EXPECT_EQ(countOf(out, "[DEBUG]    Empty triangle found, skipping it"), 1) << out;
     // The warning is printed once, then counted for the shape.
-    EXPECT_EQ(countOf(out, "[WARNING]  Degenerated triangle found, skipping it"), 1u) << out;
+    EXPECT_EQ(countOf(out, "[WARNING]  Degenerated triangle found, skipping it"), 1) << out;
     EXPECT_NE(out.find("Repeated 1 more times in shape s: Degenerated triangle found"),
               std::string::npos);
     // Only used vertices survive, welded: a, b, c.
@@ -92,9 +92,9 @@ TEST(MeshBuilder, RepairsNormalsAndUvs) {
     ASSERT_EQ(status, ShapeBuildStatus::kBuilt);
     EXPECT_EQ(shape->triangleCount(), 2u);
     EXPECT_EQ(countOf(out, "[WARNING]  Degenerated normal found, setting it to the face normal"),
-              1u);
+              1);
     EXPECT_NE(out.find("Repeated 1 more times in shape s: Degenerated normal"), std::string::npos);
-    EXPECT_EQ(countOf(out, "[WARNING]  Invalid UV added to meshificator, setting it to 0"), 1u);
+    EXPECT_EQ(countOf(out, "[WARNING]  Invalid UV added to meshificator, setting it to 0"), 1);
     const VertexList &v = shape->vertices();
     EXPECT_EQ(v.size(), 5u);
     const Triangle &t0 = shape->triangles()[0], &t1 = shape->triangles()[1];

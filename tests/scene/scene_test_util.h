@@ -49,11 +49,7 @@ std::string captureMessages(F &&f) {
     return oxtest::captureOutput(f, kMsgDebug | kMsgVerbose);
 }
 
-inline size_t countOf(const std::string &text, const std::string &what) {
-    size_t n = 0;
-    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
-    return n;
-}
+using oxtest::countOf;
 
 /// A mesh in file order: vertex i at (x, y, 0) with normal +z, frame zero, UV (x, y) per set.
 struct MeshMaker {

@@ -22,10 +22,6 @@ TEST(Attenuation, ModelsAndRamps) {
     EXPECT_FLOAT_EQ(clamped.attenuate(0.5f), 1.0f);
     EXPECT_FLOAT_EQ(standard.attenuate(0.5f), 4.0f);
     EXPECT_FLOAT_EQ(clamped.attenuate(2.0f), 0.25f);
-    UnrealAttenuation unreal(1.0f, 10.0f);
-    EXPECT_FLOAT_EQ(unreal.attenuate(5.0f), 0.75f);
-    EXPECT_EQ(unreal.attenuate(10.0f), 0.0f);
-    EXPECT_EQ(unreal.attenuate(20.0f), 0.0f);
 
     // Entries out of order are sorted by position; a NaN position is dropped.
     LightRamp ramp({{0, 0, 1, 1.0f}, {1, 0, 0, 0.0f}, {9, 9, 9, NAN}, {0, 1, 0, 0.5f}});
@@ -166,38 +162,6 @@ TEST(Lights, ImageBasedLightParameters) {
     KDHDRLight light(v);
     EXPECT_EQ(light.flags(), kLightDiffuse | kLightShadows);
     EXPECT_NEAR(light.intensity(), 6.2831853f, 1e-5f);
-}
-
-TEST(Environment, GradientConstantAndSharing) {
-    GradientEnvironmentShader g("g", Color(1, 1, 1, 1), Color(0, 0, 0, 1));
-    EXPECT_EQ(g.evaluateDirection({0, 1, 0}), Color(1, 1, 1, 1));
-    EXPECT_FLOAT_EQ(g.evaluateDirection({1, 0, 0}).r, 0.25f);
-    ConstantEnvironmentShader c("c", Color(0.25f, 0.25f, 0.25f, 1), 2.0f);
-    EXPECT_FLOAT_EQ(c.color().r, 0.5f);
-
-    Environment env;
-    EnvironmentValues v;
-    v.rtEnvironment = 2;
-    v.giEnvironment = 2;
-    v.skyLightColor = Color(0.5f, 0.25f, 1, 1);
-    std::string error;
-    ASSERT_TRUE(env.create(v, error));
-    ASSERT_NE(env.rtShader(), nullptr);
-    EXPECT_EQ(env.rtShader(), env.giShader());  // shared by name
-    EXPECT_EQ(env.rtShader()->name(), "ConstantEnvShader((0.5000, 0.2500, 1.0000, 1.0000))");
-
-    Environment none;
-    v.rtEnvironment = 0;
-    v.giEnvironment = 1;
-    ASSERT_TRUE(none.create(v, error));
-    EXPECT_EQ(none.rtShader(), nullptr);
-    EXPECT_EQ(none.giShader(), nullptr);
-
-    Environment ibl;
-    v.giEnvironment = 3;
-    v.iblImageFile = "/no/such/probe.hdr";
-    EXPECT_FALSE(ibl.create(v, error));
-    EXPECT_NE(error.find("/no/such/probe.hdr"), std::string::npos);
 }
 
 std::unique_ptr<Material> makeMaterial(const std::string &name, const PhongParameters &p = {}) {

@@ -1,3 +1,5 @@
+#include "shading/pass.h"
+
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -5,9 +7,9 @@
 #include "raytrace/complete_grid.h"
 #include "shading/environment.h"
 #include "shading/light.h"
-#include "shading/pass.h"
 #include "shading/trace.h"
 #include "tests/shading/shading_fixture.h"
+#include "tests/support/test_support.h"
 
 namespace ox {
 namespace {
@@ -122,9 +124,7 @@ public:
     bool intersect(const Ray &, Hit &, float, RayCounter *) const override { return false; }
     bool intersectSecond(const Ray &, Hit &, float, RayCounter *) const override { return false; }
     BBox bounds() const override { return {}; }
-    bool occluded(const Ray &r, float, RayCounter *) const override {
-        return r.direction.x > 0.0f;
-    }
+    bool occluded(const Ray &r, float, RayCounter *) const override { return r.direction.x > 0.0f; }
 };
 
 TEST(Passes, ShadowRatioAndShadowedMasks) {
@@ -289,6 +289,11 @@ TEST(Environment, RaysLeavingTheSceneSeeTheirEnvironment) {
     ASSERT_TRUE(env.create(v, error));
     EXPECT_EQ(env.rtShader(), env.giShader());
     EXPECT_EQ(env.rtShader()->name(), "ConstantEnvShader((0.5000, 0.5000, 0.5000, 1.0000))");
+    // A probe that cannot be read fails the environment, naming the file.
+    v.giEnvironment = int32_t(EnvironmentKind::kIBL);
+    v.iblImageFile = "/no/such/probe.hdr";
+    oxtest::captureOutput([&] { EXPECT_FALSE(Environment().create(v, error)); });
+    EXPECT_NE(error.find("/no/such/probe.hdr"), std::string::npos) << error;
 }
 
 TEST(Environment, ProbeLookupAndGIBlur) {

@@ -6,6 +6,8 @@
 
 #include <cstdio>
 #include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <string>
 
 #include "core/message.h"
@@ -43,6 +45,46 @@ std::string captureOutput(F &&f, uint32_t extraTypes = 0) {
     std::string out = ::testing::internal::GetCapturedStdout();
     if (extraTypes != 0) ox::resetMessageFilters();
     return out;
+}
+
+/// The whole content of a file ("" when it cannot be read).
+inline std::string readFile(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(in), {});
+}
+
+/// Replaces a file's content with text.
+inline void writeFile(const std::string &path, const std::string &text) {
+    std::ofstream(path, std::ios::binary) << text;
+}
+
+/// How often `what` occurs in text (overlapping occurrences count).
+inline int countOf(const std::string &text, const std::string &what) {
+    int n = 0;
+    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
+    return n;
+}
+
+/// Whether text contains part.
+inline bool contains(const std::string &text, const std::string &part) {
+    return text.find(part) != std::string::npos;
+}
+
+/// The <ObjectToWorld> element of a scene file for a row-vector matrix (translation last).
+inline std::string objectToWorldXml(const float (&rows)[4][4]) {
+    std::string s = "<ObjectToWorld>";
+    for (const auto &row : rows) {
+        s += "<r>";
+        for (float v : row) s += "<c>" + std::to_string(v) + "</c>";
+        s += "</r>";
+    }
+    return s + "</ObjectToWorld>";
+}
+
+/// The <ObjectToWorld> element of a translation.
+inline std::string translationXml(float x, float y, float z) {
+    const float m[4][4] = {{1, 0, 0, 0}, {0, 1, 0, 0}, {0, 0, 1, 0}, {x, y, z, 1}};
+    return objectToWorldXml(m);
 }
 
 /// A fixture whose tests each run in a fresh temporary directory with the message filters of a

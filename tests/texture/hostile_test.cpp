@@ -62,23 +62,9 @@ std::vector<std::pair<std::string, Bytes>> samples() {
     auto g = [](int x, int y, int c) { return uint16_t(x * y + c); };
     if (oxtest::writeTIFF<uint16_t>(dir + "/b.tif", 40, 20, 2, SAMPLEFORMAT_UINT, true, g))
         s.push_back({"tif", oxtest::readBytes(dir + "/b.tif")});
-    {
-        std::vector<float> px(13 * 9 * 4, 0.5f);
-        Imf::Header h(13, 9);
-        for (const char *c : {"R", "G", "B", "A"}) h.channels().insert(c, Imf::Channel(Imf::FLOAT));
-        h.setTileDescription(Imf::TileDescription(8, 8, Imf::ONE_LEVEL));
-        Imf::FrameBuffer fb;
-        const char *names[4] = {"R", "G", "B", "A"};
-        for (int c = 0; c < 4; ++c)
-            fb.insert(names[c], Imf::Slice(Imf::FLOAT, reinterpret_cast<char *>(&px[size_t(c)]), 16,
-                                           16 * 13));
-        {
-            Imf::TiledOutputFile out((dir + "/c.exr").c_str(), h);
-            out.setFrameBuffer(fb);
-            out.writeTiles(0, out.numXTiles() - 1, 0, out.numYTiles() - 1);
-        }
-        s.push_back({"exr", oxtest::readBytes(dir + "/c.exr")});
-    }
+    oxtest::writeEXR(dir + "/c.exr", 13, 9, {"R", "G", "B", "A"}, Imf::FLOAT, 8,
+                     [](int, int, int) { return 0.5f; });
+    s.push_back({"exr", oxtest::readBytes(dir + "/c.exr")});
     std::filesystem::remove_all(dir);
     return s;
 }

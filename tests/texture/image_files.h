@@ -331,6 +331,39 @@ bool writeTIFF(const std::string &path, int w, int h, int spp, int format, bool 
     return ok;
 }
 
+/// An EXR file of the named channels, value(x, yTop, c) each, stored as `type` in scan lines
+/// (tile 0) or in tiles of tile x tile texels; `activeTiles`, when given, is written as the
+/// active-tiles attribute.
+template <typename F>
+void writeEXR(const std::string &path, int w, int h, const std::vector<std::string> &channels,
+              Imf::PixelType type, int tile, F value, const char *activeTiles = nullptr) {
+    Imf::Header hd(w, h);
+    if (tile > 0) hd.setTileDescription(Imf::TileDescription(tile, tile, Imf::ONE_LEVEL));
+    if (activeTiles) hd.insert("QUENDAL_ACTIVETILES_PLAIN_TEXT", Imf::StringAttribute(activeTiles));
+    const size_t n = size_t(w) * size_t(h);
+    std::vector<std::vector<float>> floats(channels.size(), std::vector<float>(n));
+    std::vector<std::vector<Imath::half>> halves(channels.size(), std::vector<Imath::half>(n));
+    Imf::FrameBuffer fb;
+    for (size_t c = 0; c < channels.size(); ++c) {
+        for (size_t i = 0; i < n; ++i)
+            halves[c][i] = floats[c][i] = value(int(i % size_t(w)), int(i / size_t(w)), int(c));
+        hd.channels().insert(channels[c], Imf::Channel(type));
+        char *base = type == Imf::HALF ? reinterpret_cast<char *>(halves[c].data())
+                                       : reinterpret_cast<char *>(floats[c].data());
+        const size_t size = type == Imf::HALF ? sizeof(Imath::half) : sizeof(float);
+        fb.insert(channels[c], Imf::Slice(type, base, size, size * size_t(w)));
+    }
+    if (tile > 0) {
+        Imf::TiledOutputFile out(path.c_str(), hd);
+        out.setFrameBuffer(fb);
+        out.writeTiles(0, out.numXTiles() - 1, 0, out.numYTiles() - 1);
+    } else {
+        Imf::OutputFile out(path.c_str(), hd);
+        out.setFrameBuffer(fb);
+        out.writePixels(h);
+    }
+}
+
 /// Reads a whole file.
 inline Bytes readBytes(const std::string &path) {
     std::ifstream in(path, std::ios::binary);

@@ -18,20 +18,13 @@ protected:
     ImportMessages() : TempDirTest("thevorn_import_messages_") {}
 };
 
-void writeBytes(const fs::path &p, const std::string &bytes) {
-    std::ofstream(p, std::ios::binary) << bytes;
-}
-
-int countOf(const std::string &text, const std::string &what) {
-    int n = 0;
-    for (size_t p = text.find(what); p != std::string::npos; p = text.find(what, p + 1)) ++n;
-    return n;
-}
+using oxtest::countOf;
+using oxtest::writeFile;
 
 // One triangle and a point light above it, as glTF with its buffer in tri.bin.
 std::string gltfTriangleWithLight() {
     const float pos[] = {0, 0, 0, 1, 0, 0, 0, 1, 0};
-    writeBytes("tri.bin", std::string(reinterpret_cast<const char *>(pos), sizeof pos));
+    writeFile("tri.bin", std::string(reinterpret_cast<const char *>(pos), sizeof pos));
     return R"({"asset":{"version":"2.0"},"scene":0,"scenes":[{"nodes":[0,1]}],
 "nodes":[{"mesh":0},{"name":"Lamp","translation":[0,0,3],
  "extensions":{"KHR_lights_punctual":{"light":0}}}],
@@ -49,14 +42,14 @@ std::string gltfTriangleWithLight() {
 
 TEST_F(ImportMessages, EachSituationGetsOneFittingMessage) {
     const std::string quad = "v 0 0 0\nv 1 0 0\nv 1 1 0\nv 0 1 0\nf 1 2 3 4\n";
-    writeBytes("quad.obj", quad);
-    writeBytes("with_missing_mtl.obj", "mtllib missing.mtl\nusemtl red\n" + quad);
-    writeBytes("lit.gltf", gltfTriangleWithLight());
+    writeFile("quad.obj", quad);
+    writeFile("with_missing_mtl.obj", "mtllib missing.mtl\nusemtl red\n" + quad);
+    writeFile("lit.gltf", gltfTriangleWithLight());
     // Machine code under a model's name: the OBJ reader finds nothing in it.
     std::string binary(4096, '\0');
     for (size_t i = 0; i < binary.size(); ++i) binary[i] = char((i * 7919u) >> 3);
-    writeBytes("binary.obj", binary);
-    writeBytes("lines.obj", "v 0 0 0\nv 1 0 0\nl 1 2\n");
+    writeFile("binary.obj", binary);
+    writeFile("lines.obj", "v 0 0 0\nv 1 0 0\nl 1 2\n");
 
     const struct {
         const char *what;

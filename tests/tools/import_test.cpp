@@ -31,14 +31,8 @@ using oxtest::RunResult;
 // Runs thevorn-import with the arguments; stdout and stderr together.
 RunResult runImport(const std::string &args) { return oxtest::runProgram(kImport, args); }
 
-std::string readBytes(const fs::path &p) {
-    std::ifstream f(p, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(f), {});
-}
-
-void writeText(const fs::path &p, const std::string &text) {
-    std::ofstream(p, std::ios::binary) << text;
-}
+using oxtest::readFile;
+using oxtest::writeFile;
 
 // Exactly one error line in a program's output.
 bool oneError(const std::string &out) {
@@ -65,7 +59,7 @@ std::string gltfQuad(const std::string &imageUri = "tiles.png", bool twice = fal
     auto add = [&](const void *d, size_t n) { bin.append(static_cast<const char *>(d), n); };
     add(pos, sizeof pos), add(nrm, sizeof nrm), add(uv0, sizeof uv0), add(uv1, sizeof uv1);
     add(col, sizeof col), add(idx, sizeof idx);
-    writeText("quad.bin", bin);
+    writeFile("quad.bin", bin);
     std::ostringstream g;
     g << R"({"asset":{"version":"2.0"},"scene":0,"scenes":[{"nodes":[0,1,2)" << (twice ? ",3" : "")
       << R"(]}],
@@ -114,7 +108,7 @@ bool loadImported(const std::string &out, std::vector<std::string> inputs, ox::S
 // One triangle with a UV set and a normal: every value of the mesh file, and the scene file
 // byte for byte.
 TEST_F(ImportTest, WritesTheMeshAndSceneFiles) {
-    writeText("tri.obj",
+    writeFile("tri.obj",
               "o tri\nv 0 0 0\nv 2 0 0\nv 0 1 0\nvt 0 0\nvt 1 0\nvt 0 1\nvn 0 0 1\n"
               "f 1/1/1 2/2/1 3/3/1\n");
     RunResult r = runImport("tri.obj -o out");
@@ -140,15 +134,15 @@ TEST_F(ImportTest, WritesTheMeshAndSceneFiles) {
 
     // The scene file, as the settings writer lays out the scene objects: the default material
     // of the reader (grey diffuse) and one instance placing the shape with the identity.
-    EXPECT_EQ(readBytes("out/tri.xml"),
-              readBytes(std::string(OX_TEST_DATA_DIR) + "/tools/tri_scene.xml"));
+    EXPECT_EQ(readFile("out/tri.xml"),
+              readFile(std::string(OX_TEST_DATA_DIR) + "/tools/tri_scene.xml"));
 }
 
 // Two UV sets in order, vertex colours (version 2 file), a texture reference, node placement,
 // a camera and a spot light from a glTF scene.
 TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
-    writeText("quad.gltf", gltfQuad());
-    writeText("tiles.png", "not really an image");
+    writeFile("quad.gltf", gltfQuad());
+    writeFile("tiles.png", "not really an image");
     RunResult r = runImport("quad.gltf -o out --prefix lvl_");
     ASSERT_EQ(r.status, 0) << r.output;
 
@@ -182,7 +176,7 @@ TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
 
     // The scene file: the material with its texture, the placement (translation (1, 2, 3) in
     // the last row of the instance matrix), the camera and the light.
-    const std::string xml = readBytes("out/quad.xml");
+    const std::string xml = readFile("out/quad.xml");
     for (const std::string &want :
          {"<Name>lvl_Tiles</Name>"s,
           "<FileTexture>" + fs::canonical("tiles.png").string() + "</FileTexture>",
@@ -217,12 +211,12 @@ TEST_F(ImportTest, KeepsUvSetsColoursTexturesCamerasAndLights) {
 // An image stored inside the model is written beside the scene, byte for byte, and the material
 // names that file.
 TEST_F(ImportTest, EmbeddedImagesBecomeFiles) {
-    writeText("packed.gltf", gltfQuad("data:image/png;base64,iVBORy1pc2g="));  // "\x89PNG-ish"
+    writeFile("packed.gltf", gltfQuad("data:image/png;base64,iVBORy1pc2g="));  // "\x89PNG-ish"
     RunResult r = runImport("packed.gltf -o out");
     ASSERT_EQ(r.status, 0) << r.output;
     const fs::path image = fs::path("out") / "textures" / "packed_texture0.png";
-    EXPECT_EQ(readBytes(image), "\x89PNG-ish");
-    EXPECT_NE(readBytes("out/packed.xml")
+    EXPECT_EQ(readFile(image), "\x89PNG-ish");
+    EXPECT_NE(readFile("out/packed.xml")
                   .find("<FileTexture>" + fs::canonical(image).string() + "</FileTexture>"),
               std::string::npos);
     // The image is an output like the others: kept unless --force.
@@ -235,7 +229,7 @@ TEST_F(ImportTest, EmbeddedImagesBecomeFiles) {
 
 // Vertex colours of a PLY scan give a version 2 file and a material that uses them.
 TEST_F(ImportTest, PlyVertexColours) {
-    writeText("scan.ply",
+    writeFile("scan.ply",
               "ply\nformat ascii 1.0\nelement vertex 3\nproperty float x\nproperty float y\n"
               "property float z\nproperty uchar red\nproperty uchar green\nproperty uchar blue\n"
               "element face 1\nproperty list uchar int vertex_indices\nend_header\n"
@@ -250,13 +244,13 @@ TEST_F(ImportTest, PlyVertexColours) {
     EXPECT_FLOAT_EQ(mesh.vertices[16 + 13], 1.0f);
     EXPECT_FLOAT_EQ(mesh.vertices[32 + 14], 0.2f);
     EXPECT_TRUE(mesh.uvSetNames.empty());
-    EXPECT_NE(readBytes("out/scan.xml").find("<UseVertexColor>true</UseVertexColor>"),
+    EXPECT_NE(readFile("out/scan.xml").find("<UseVertexColor>true</UseVertexColor>"),
               std::string::npos);
 }
 
 // Bad faces are dropped or triangulated with counts; the rest of the model comes through.
 TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
-    writeText("bad.obj",
+    writeFile("bad.obj",
               "v 0 0 0\nv 1 0 0\nv 1 1 0\nv 0 1 0\nv nan 0 1\n"
               "f 1 2 3 4\n"  // a quad: two triangles
               "f 1 2 9\n"    // index out of range
@@ -273,7 +267,7 @@ TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
         EXPECT_NE(r.output.find(want), std::string::npos) << want << "\n" << r.output;
 
     // Nothing usable at all: no crash; the listing shows an empty model, the import refuses it.
-    writeText("none.obj", "v 0 0 0\nv 1 0 0\nf 1 2 7\n");
+    writeFile("none.obj", "v 0 0 0\nv 1 0 0\nf 1 2 7\n");
     r = runImport("none.obj --list");
     EXPECT_EQ(r.status, 0) << r.output;
     EXPECT_NE(r.output.find("Shapes: 0"), std::string::npos) << r.output;
@@ -284,7 +278,7 @@ TEST_F(ImportTest, DegenerateInputIsCountedNotFatal) {
 
 // A file that is no model: one error, a non-zero status, nothing written.
 TEST_F(ImportTest, UnreadableModelGivesOneError) {
-    writeText("junk.fbx", std::string(300, '\x17') + "not a model");
+    writeFile("junk.fbx", std::string(300, '\x17') + "not a model");
     const std::string out = " -o out";
     const struct {
         std::string args;
@@ -317,7 +311,7 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
         for (int i = 0; i < 10000; ++i)
             g << R"({"translation":[0,1,0],"children":[)" << i + 1 << "]},";
         g << R"({"name":"Deep","camera":0}]})";
-        writeText("deep.gltf", g.str());
+        writeFile("deep.gltf", g.str());
     }
     // One face of 100,000 corners.
     {
@@ -327,7 +321,7 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
                    std::to_string(std::sin(i * 6.2831853e-5)) + " 0\n";
         obj += "v 0 0 1\nv 1 0 1\nv 0 1 1\nf 100001 100002 100003\nf";
         for (int i = 1; i <= 100000; ++i) obj += " " + std::to_string(i);
-        writeText("huge_face.obj", obj + "\n");
+        writeFile("huge_face.obj", obj + "\n");
     }
     const std::string kTooLarge = "more than the file's";
     const struct {
@@ -387,8 +381,8 @@ TEST_F(ImportTest, HostileModelsFailCleanly) {
 TEST_F(ImportTest, PipesAreRefusedNotWaitedOn) {
     for (const char *pipe : {"pipe.obj", "pipe.mtl", "pipe.bin"})
         ASSERT_EQ(mkfifo(pipe, 0600), 0) << pipe;
-    writeText("tri.obj", "mtllib pipe.mtl\nv 0 0 0\nv 1 0 0\nv 0 1 0\nusemtl red\nf 1 2 3\n");
-    writeText("buf.gltf",
+    writeFile("tri.obj", "mtllib pipe.mtl\nv 0 0 0\nv 1 0 0\nv 0 1 0\nusemtl red\nf 1 2 3\n");
+    writeFile("buf.gltf",
               R"({"asset":{"version":"2.0"},"buffers":[{"uri":"pipe.bin","byteLength":36}],)"
               R"("bufferViews":[{"buffer":0,"byteLength":36}],"accessors":[{"bufferView":0,)"
               R"("componentType":5126,"count":3,"type":"VEC3","min":[0,0,0],"max":[1,1,0]}],)"
@@ -410,9 +404,9 @@ TEST_F(ImportTest, PipesAreRefusedNotWaitedOn) {
 // A model read from memory never touches the disk: its side files come from the given reader
 // only, whatever exists in the working directory.
 TEST_F(ImportTest, ReadingFromMemoryReadsNoSideFileFromTheDisk) {
-    writeText("side.mtl", "newmtl red\nKd 1 0 0\n");
+    writeFile("side.mtl", "newmtl red\nKd 1 0 0\n");
     const std::string obj = "mtllib side.mtl\nv 0 0 0\nv 1 0 0\nv 0 1 0\nusemtl red\nf 1 2 3\n";
-    writeText("side.obj", obj);
+    writeFile("side.obj", obj);
     ox::ImportedModel fromDisk, alone, withReader;
     ox::ImportStats stats;
     ASSERT_TRUE(ox::readModel("side.obj", {}, fromDisk, stats));
@@ -462,7 +456,7 @@ TEST_F(ImportTest, MemoryLimit) {
     for (int i = 1; i + 2 <= 500000; i += 3)
         obj += "f " + std::to_string(i) + " " + std::to_string(i + 1) + " " +
                std::to_string(i + 2) + "\n";
-    writeText("big.obj", obj);
+    writeFile("big.obj", obj);
     RunResult r = runImport("big.obj -o out --max-memory 64");
     EXPECT_EQ(r.status, ox::kImportFailed) << r.output;
     EXPECT_TRUE(oneError(r.output)) << r.output;
@@ -473,25 +467,25 @@ TEST_F(ImportTest, MemoryLimit) {
 
 // Existing files are kept unless --force is given; a refusal writes nothing at all.
 TEST_F(ImportTest, RefusesToOverwrite) {
-    writeText("a.obj",
+    writeFile("a.obj",
               "o a\nv 0 0 0\nv 1 0 0\nv 0 1 0\nf 1 2 3\no b\nv 0 0 1\nv 1 0 1\n"
               "v 0 1 1\nf 4 5 6\n");
     ASSERT_EQ(runImport("a.obj -o out").status, 0);
-    writeText("out/b.vtm", "mine");
-    const std::string sceneBefore = readBytes("out/a.xml");
+    writeFile("out/b.vtm", "mine");
+    const std::string sceneBefore = readFile("out/a.xml");
     fs::remove("out/a.vtm");
     RunResult r = runImport("a.obj -o out --scale 2");
     EXPECT_EQ(r.status, ox::kImportWouldOverwrite) << r.output;
     EXPECT_NE(r.output.find("Refusing to overwrite"), std::string::npos);
     EXPECT_FALSE(fs::exists("out/a.vtm"));
-    EXPECT_EQ(readBytes("out/b.vtm"), "mine");
+    EXPECT_EQ(readFile("out/b.vtm"), "mine");
 
     r = runImport("a.obj -o out --scale 2 --force");
     EXPECT_EQ(r.status, 0) << r.output;
     vtm::TempMesh mesh;
     ASSERT_TRUE(vtm::readTempMesh("out/b.vtm", mesh));
     EXPECT_EQ(mesh.bounds.max, ox::Vec3(2, 2, 2));
-    EXPECT_EQ(readBytes("out/a.xml"), sceneBefore);
+    EXPECT_EQ(readFile("out/a.xml"), sceneBefore);
     // No temporary files stay behind.
     for (const auto &e : fs::directory_iterator("out"))
         EXPECT_NE(e.path().filename().string()[0], '.') << e.path();
@@ -499,7 +493,7 @@ TEST_F(ImportTest, RefusesToOverwrite) {
 
 // Unit scale, up axis, handedness and welding change the geometry as a user expects.
 TEST_F(ImportTest, UnitsAxesHandednessAndWelding) {
-    writeText("m.obj", "o m\nv 0 0 0\nv 10 0 0\nv 10 20 30\nv 0 20 30\nf 1 2 3\nf 1 3 4\n");
+    writeFile("m.obj", "o m\nv 0 0 0\nv 10 0 0\nv 10 20 30\nv 0 20 30\nf 1 2 3\nf 1 3 4\n");
     ox::ImportOptions o;
     ox::ImportedModel model;
     ox::ImportStats stats;
@@ -531,12 +525,12 @@ TEST_F(ImportTest, UnitsAxesHandednessAndWelding) {
 // Round trip: the written files hold as many triangles, the same box and the same UV sets as
 // the asset library reports for the model itself.
 TEST_F(ImportTest, RoundTripMatchesTheLibrary) {
-    writeText("tiles.png", "x");
-    writeText("boxes.obj",
+    writeFile("tiles.png", "x");
+    writeFile("boxes.obj",
               "o box\nv -1 -1 -1\nv 1 -1 -1\nv 1 1 -1\nv -1 1 -1\nv -1 -1 1\nv 1 -1 1\nv 1 1 1\n"
               "v -1 1 1\nf 1 4 3 2\nf 5 6 7 8\nf 1 2 6 5\nf 3 4 8 7\nf 2 3 7 6\nf 1 5 8 4\n"
               "o plane\nv -5 -1 -5\nv 5 -1 -5\nv 5 -1 5\nv -5 -1 5\nf 9 12 11 10\n");
-    writeText("twice.gltf", gltfQuad("tiles.png", true));  // one shape, two instances
+    writeFile("twice.gltf", gltfQuad("tiles.png", true));  // one shape, two instances
     for (const std::string file : {"boxes.obj", "twice.gltf"}) {
         // What the library reports, with every node's placement applied.
         Assimp::Importer importer;
@@ -614,12 +608,12 @@ TEST_F(ImportTest, CornellExampleLoads) {
 // An opacity map that is the diffuse image makes the diffuse alpha the transparency; another
 // opacity map goes into the transparency channel with a warning.
 TEST_F(ImportTest, OpacityMaps) {
-    writeText("op.mtl",
+    writeFile("op.mtl",
               "newmtl leaf\nKd 1 1 1\nmap_Kd leaf.png\nmap_d leaf.png\n"
               "newmtl glass\nKd 1 1 1\nmap_d mask.png\n");
-    writeText("leaf.png", "x");
-    writeText("mask.png", "x");
-    writeText("op.obj",
+    writeFile("leaf.png", "x");
+    writeFile("mask.png", "x");
+    writeFile("op.obj",
               "mtllib op.mtl\nv 0 0 0\nv 1 0 0\nv 0 1 0\nvt 0 0\nvt 1 0\nvt 0 1\n"
               "usemtl leaf\nf 1/1 2/2 3/3\nusemtl glass\nf 1/1 3/3 2/2\n");
     ox::ImportedModel model;

@@ -17,12 +17,7 @@ using oxtest::RunResult;
 
 RunResult runPtc(const std::string &args) { return oxtest::runProgram(kPtc, args); }
 
-std::string readFile(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
+using oxtest::readFile;
 
 class PtcTest : public oxtest::TempDirTest {
 protected:

@@ -1,6 +1,8 @@
+// thevorn-inspect run as a user runs it: the summary of a scene, the checks of a configuration
+// against it, and its failures.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
-#include <fstream>
 #include <string>
 #include <vector>
 
@@ -11,21 +13,27 @@ namespace {
 
 const std::string kInspect = std::string(OX_BINARY_DIR) + "/tools/thevorn-inspect";
 
-class InspectChecks : public oxtest::TempDirTest {
-protected:
-    InspectChecks() : TempDirTest("oxchecks") {}
+using oxtest::RunResult;
 
-    /// A unit quad at height z with the given UV sets (all the same layout).
-    std::string quad(const std::string &shape, const std::vector<std::string> &sets, float z) {
+RunResult runInspect(const std::string &args) { return oxtest::runProgram(kInspect, args); }
+
+class InspectTest : public oxtest::TempDirTest {
+protected:
+    InspectTest() : TempDirTest("oxinspect") {}
+
+    /// A quad from (-1, -1, z) to (1, 1, z) of material "m" with the given UV sets (all the
+    /// same layout).
+    std::string quad(const std::string &shape, float z = 0,
+                     const std::vector<std::string> &sets = {"map1"}) {
         vtm::TempMesh m;
         m.name = shape;
         m.uvSetNames = sets;
-        const float corners[4][2] = {{0, 0}, {1, 0}, {1, 1}, {0, 1}};
+        const float corners[4][2] = {{-1, -1}, {1, -1}, {1, 1}, {-1, 1}};
         for (auto &c : corners) {
             m.vertices.insert(m.vertices.end(), {c[0], c[1], z, 0, 0, 1, 0, 0, 0, 0, 0, 0});
             for (size_t k = 0; k < sets.size(); ++k) m.uvs.insert(m.uvs.end(), {c[0], c[1]});
         }
-        m.bounds = ox::BBox(ox::Vec3(0, 0, z), ox::Vec3(1, 1, z));
+        m.bounds = ox::BBox(ox::Vec3(-1, -1, z), ox::Vec3(1, 1, z));
         m.groups = {{"m", 2}};
         m.indices = {0, 1, 2, 0, 2, 3};
         const std::string path = (dir_ / (shape + ".vtm")).string();
@@ -34,10 +42,66 @@ protected:
     }
     std::string file(const std::string &name, const std::string &text) {
         const std::string path = (dir_ / name).string();
-        std::ofstream(path) << text;
+        oxtest::writeFile(path, text);
         return path;
     }
 };
+
+TEST_F(InspectTest, SummarisesALoadedScene) {
+    std::string a = quad("low", -1), b = quad("high", 1);
+    std::string xml = file("s.xml",
+                           "<OXScene><Material><Name>m</Name></Material>"
+                           "<Instance><Name>i1</Name><Shape>low</Shape></Instance>"
+                           "<Instance><Name>i2</Name><Shape>high</Shape>"
+                           "<RenderStats><PrimaryVisibility>false</PrimaryVisibility></RenderStats>"
+                           "</Instance>"
+                           "<LightSource><Name>sun</Name><Type>DIRECTIONAL</Type></LightSource>"
+                           "</OXScene>");
+    std::string config =
+        file("c.xml", "<OXConfig><RenderSettings><bias>0</bias></RenderSettings></OXConfig>");
+    RunResult r = runInspect(xml + " " + a + " " + b + " -x " + config);
+    EXPECT_EQ(r.status, 0) << r.output;
+    for (const char *want : {"Shapes: 2\n  low: 2 triangles, 4 vertices, 1 UV sets (map1)\n",
+                             "  i2: shape high, flags 0x4EDFE\n", "Materials: 1\n  m\n",
+                             "Cameras: 1\n  camera1: perspective at (0, 2, 10)\n",
+                             "Lights: 1\n  sun: SimpleDirectionalLight\n",
+                             "Light links: 2 instances x 1 lights (16 bytes)",
+                             "Scene box: (-1, -1, -1) - (1, 1, 1)", "Bias: 3.4641e-05"})
+        EXPECT_NE(r.output.find(want), std::string::npos) << want << "\n" << r.output;
+}
+
+TEST_F(InspectTest, FailuresGiveTheRunsStatuses) {
+    // A shape that no mesh file gives, a damaged mesh file, a configuration that cannot be
+    // loaded, syntax errors: one message each, the run's status, and no summary.
+    std::string xml = file("s.xml",
+                           "<OXScene><Instance><Name>i</Name><Shape>ghost</Shape>"
+                           "</Instance></OXScene>");
+    std::string bad = file("bad.vtm", std::string("VTM\0\3\0\0\0", 8));
+    // A named pipe given as a mesh file is refused at once; a device is no scene at all.
+    const std::string pipe = (dir_ / "pipe.vtm").string();
+    ASSERT_EQ(mkfifo(pipe.c_str(), 0600), 0);
+    const struct {
+        std::string args;
+        int status;
+        std::string text;
+    } cases[] = {
+        {xml, 1, "Unable to load the scene: Missing shapes"},
+        {bad, 1, "[ERROR]    Failed to preopen file " + bad},
+        {bad, 1, "unsupported temporary mesh version 3"},
+        {pipe, 1, pipe + ": not a regular file"},
+        {"/dev/zero", 1, "Unable to load the scene: No scene or mesh file among the inputs"},
+        {xml + " -x " + (dir_ / "missing.xml").string(), 3, "Unable to load settings from file"},
+        {"", 2, "Usage: thevorn-inspect"},
+        {xml + " -q", 2, "Usage: thevorn-inspect"},
+        {xml + " -x", 2, "Usage: thevorn-inspect"},
+    };
+    for (const auto &c : cases) {
+        RunResult r = oxtest::runProgram("timeout 120 " + kInspect, c.args);
+        EXPECT_EQ(r.status, c.status) << c.args;
+        EXPECT_NE(r.output.find(c.text), std::string::npos) << c.text << "\n" << r.output;
+        EXPECT_EQ(r.output.find("Shapes:"), std::string::npos);
+    }
+}
 
 std::string target(const std::string &name, const std::string &shapes) {
     return "<BakeTextureTarget><hasResolutionOverride>true</hasResolutionOverride>"
@@ -65,9 +129,9 @@ const char *const kTwoPasses = "<albedo>true</albedo><illumination>true</illumin
 
 }  // namespace
 
-TEST_F(InspectChecks, TheConfigurationIsCheckedAgainstTheScene) {
-    const std::string ground = quad("ground", {"map1", "LightMap"}, 0);
-    const std::string roof = quad("roof", {"map1"}, 2);
+TEST_F(InspectTest, TheConfigurationIsCheckedAgainstTheScene) {
+    const std::string ground = quad("ground", 0, {"map1", "LightMap"});
+    const std::string roof = quad("roof", 2);
     const std::string lit = file("lit.xml",
                                  "<OXScene><Material><Name>m</Name></Material>"
                                  "<Camera><Name>cam</Name></Camera>"
@@ -166,8 +230,7 @@ TEST_F(InspectChecks, TheConfigurationIsCheckedAgainstTheScene) {
     };
     for (const auto &c : cases) {
         const std::string config = file("c.xml", c.config);
-        const oxtest::RunResult r =
-            oxtest::runProgram(kInspect, c.scene + meshes + " -x " + config);
+        const RunResult r = runInspect(c.scene + meshes + " -x " + config);
         EXPECT_EQ(r.status, c.status) << c.what << "\n" << r.output;
         for (const std::string &line : c.lines)
             EXPECT_NE(r.output.find(line), std::string::npos) << c.what << ": " << line << "\n"
@@ -178,12 +241,12 @@ TEST_F(InspectChecks, TheConfigurationIsCheckedAgainstTheScene) {
     }
 
     // Without a configuration the summary ends with the next step too; --help is no error.
-    oxtest::RunResult r = oxtest::runProgram(kInspect, dark + meshes);
+    RunResult r = runInspect(dark + meshes);
     EXPECT_EQ(r.status, 0) << r.output;
     EXPECT_NE(r.output.find("\nNext: the scene has no lights; add one (README, \"Adding lights\")"),
               std::string::npos)
         << r.output;
-    r = oxtest::runProgram(kInspect, "--help");
+    r = runInspect("--help");
     EXPECT_EQ(r.status, 0);
     EXPECT_EQ(r.output.rfind("Usage: thevorn-inspect", 0), 0u) << r.output;
 }
