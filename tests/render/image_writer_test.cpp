@@ -91,7 +91,9 @@ void expectBeauty(std::map<std::string, std::vector<float>> px, const std::strin
             ASSERT_EQ(px[prefix + "R"][i], c.r) << x << "," << line;
             ASSERT_EQ(px[prefix + "G"][i], c.g) << x << "," << line;
             ASSERT_EQ(px[prefix + "B"][i], c.b) << x << "," << line;
-            if (alpha) ASSERT_EQ(px[prefix + "A"][i], c.a) << x << "," << line;
+            if (alpha) {
+                ASSERT_EQ(px[prefix + "A"][i], c.a) << x << "," << line;
+            }
         }
 }
 
