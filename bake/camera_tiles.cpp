@@ -113,7 +113,10 @@ protected:
     void release() override { threads_.clear(); }
 
 private:
-    struct Thread {
+    // Each thread's state on cache lines of its own: the shading context, the ray counters and
+    // the sampler's pixel stamp are written for every sample, and a line shared with the
+    // neighbouring thread's state would bounce between the cores.
+    struct alignas(64) Thread {
         CameraSampleShader shader;
         ImageSampler::Scratch scratch;
         std::vector<Color> beauty;
