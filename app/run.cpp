@@ -17,6 +17,7 @@
 #include "core/run_statistics.h"
 #include "platform/file_system.h"
 #include "platform/system.h"
+#include "render/image_writer.h"
 
 namespace ox {
 namespace {
@@ -142,6 +143,8 @@ int32_t run(const std::vector<std::string> &args, const RunEnvironment &env) {
         return kStatusUnsupported;
     }
     const int64_t threads = resolveRenderThreads(options.renderThreads, *settings, processors);
+    // Image files are compressed on as many threads as the run renders with.
+    setImageWriterThreads(int32_t(std::min<int64_t>(threads, 64)));
     // Inputs are checked before any work starts, so a bad run fails fast.
     if (const int32_t status = checkInputs(action, *settings); status != 0) return status;
     const int32_t format = resolveFileFormat(options.fileFormat, settings->imageFormat());

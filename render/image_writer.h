@@ -38,6 +38,10 @@ inline constexpr const char *kActiveTilesAttribute = "QUENDAL_ACTIVETILES_PLAIN_
 /// The edge of the tiles of the active-tiles attribute.
 constexpr int32_t kActiveTileSize = 32;
 
+/// Lets the EXR writers compress on `threads` threads (the library's global thread pool;
+/// 1 or less: on the writing thread only). The files are the same for any count.
+void setImageWriterThreads(int32_t threads);
+
 /// Writes every layer of the frame into one tiled, ZIP-compressed EXR file of 32-bit float
 /// channels: colour layers as name.R, name.G, name.B (and name.A with alpha), boolean and
 /// float layers as one channel named after the layer, custom-float layers as name0 .. nameN-1.

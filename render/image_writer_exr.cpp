@@ -182,6 +182,12 @@ bool activeTiles(Frame &frame, std::string &text) {
 
 }  // namespace
 
+void setImageWriterThreads(int32_t threads) {
+    const int count = threads > 1 ? int(std::min<int32_t>(threads, 64)) : 0;
+    // The pool is rebuilt on every change; leave it alone when the count stays.
+    if (Imf::globalThreadCount() != count) Imf::setGlobalThreadCount(count);
+}
+
 bool writeMultiLayerEXR(const std::string &fileName, Frame &frame, bool alpha) {
     const int32_t w = frame.width(), h = frame.height();
     auto fail = [&](const std::string &reason) {
@@ -245,13 +251,22 @@ bool writeEXR(const std::string &fileName, LayerT<Color> &layer, bool alpha) {
         return false;
     };
     if (w < 1 || h < 1) return fail(fileName + ": the layer is empty");
-    constexpr int32_t kStrip = 16;
+    // ZIP compresses blocks of 16 lines, and the library compresses the blocks of one write
+    // in parallel on its threads: each write hands over two blocks per thread (within a
+    // buffer of about 32 MiB). The file is the same whatever the block count per write.
+    constexpr int32_t kBlock = 16;
+    constexpr int64_t kStripBytes = int64_t(32) << 20;
+    const int64_t rowBytes = int64_t(w) * int64_t(sizeof(Color));
+    const int64_t blocks = std::clamp<int64_t>(
+        std::min<int64_t>(2 * int64_t(Imf::globalThreadCount()), kStripBytes / (rowBytes * kBlock)),
+        1, 64);
+    const int32_t kStrip = int32_t(blocks) * kBlock;
     LayerStrip s;
     s.layer = &layer;
     s.units = 4;
     s.channelNames = {"R", "G", "B"};
     if (alpha) s.channelNames.push_back("A");
-    s.data.assign(size_t(w) * kStrip * 4, 0.0f);
+    s.data.assign(size_t(w) * size_t(kStrip) * 4, 0.0f);
     AtomicFile file(fileName);
     std::FILE *f = file.file();
     if (!f) return fail("Failed to open file: " + fileName + " (" + fileError() + ")");
