@@ -245,7 +245,9 @@ protected:
     }
 
 private:
-    struct Thread {
+    // Each thread's state on cache lines of its own: its counters and shading context are
+    // written for every texel, and the records are allocated one after the other.
+    struct alignas(64) Thread {
         Thread(const RenderWorld &w, const TextureBakeRun::Shared &s,
                const TextureBakeRun::Target &tg, const RenderPass &p)
             : shader(w, s, tg, p) {}
