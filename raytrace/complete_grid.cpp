@@ -268,6 +268,7 @@ bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,
                 std::vector<uint32_t> shapeCodes;
                 skipped =
                     addTriangles(owned->store, shapeCodes, in.mesh, Mtx4(), false, 0u, kNoInstance);
+                if (gp.sse) owned->store.sortForPackets(shapeCodes, gp.density);
                 if (!owned->grid.build(owned->store, shapeCodes, unionOf(owned->store, shapeCodes),
                                        gp, 0, true))
                     return false;
@@ -315,6 +316,10 @@ bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,
     }
 
     message(kMsgProgress, 1, "Building ADS structure");
+    if (gp.sse) {
+        store_.sortForPackets(codes, gp.density);
+        secondStore_.sortForPackets(secondCodes, gp.density);
+    }
     box_ = unionOf(store_, codes);
     if (!grid_.build(store_, codes, box_, gp, 0, true)) return false;
     if (!second_.build(secondStore_, secondCodes, unionOf(secondStore_, secondCodes), gp, 0, true))
@@ -369,14 +374,9 @@ bool CompleteGrid::query(const Grid &grid, const PrimitiveStore &store, const Ra
                 break;
             }
             default: {
-                // Packet hits carry their identifiers: the triangle record is not read.
+                // The triangle was just tested: its record is still in the cache.
                 const IntersectTriangle *t = &store.triangles[s.prim];
-                if (s.fromPacket) {
-                    hit->id = s.id, hit->instance = s.instance;
-                    hit->flags = s.flags;
-                } else {
-                    hit->id = t->id, hit->instance = t->instance, hit->flags = t->flags;
-                }
+                hit->id = t->id, hit->instance = t->instance, hit->flags = t->flags;
                 hit->primitive = t;
                 break;
             }

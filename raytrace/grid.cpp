@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <limits>
 #include <stdexcept>
 #include <string>
 
@@ -60,6 +61,33 @@ bool triangleBoxOverlap(const Vec3 &a, const Vec3 &b, const Vec3 &c, const BBox 
     return std::fabs(d) <= r;
 }
 
+// Interleaves the low 21 bits of x, y and z.
+uint64_t morton3x21(uint64_t x, uint64_t y, uint64_t z) {
+    auto spread = [](uint64_t v) {
+        v &= 0x1FFFFF;
+        v = (v | v << 32) & 0x1F00000000FFFFull;
+        v = (v | v << 16) & 0x1F0000FF0000FFull;
+        v = (v | v << 8) & 0x100F00F00F00F00Full;
+        v = (v | v << 4) & 0x10C30C30C30C30C3ull;
+        v = (v | v << 2) & 0x1249249249249249ull;
+        return v;
+    };
+    return spread(x) | spread(y) << 1 | spread(z) << 2;
+}
+
+// Interleaves the low ten bits of x, y and z.
+uint32_t morton3(uint32_t x, uint32_t y, uint32_t z) {
+    auto spread = [](uint32_t v) {
+        v &= 0x3FF;
+        v = (v | (v << 16)) & 0x030000FF;
+        v = (v | (v << 8)) & 0x0300F00F;
+        v = (v | (v << 4)) & 0x030C30C3;
+        v = (v | (v << 2)) & 0x09249249;
+        return v;
+    };
+    return spread(x) | (spread(y) << 1) | (spread(z) << 2);
+}
+
 std::string boxText(const BBox &b) {
     char buf[256];
     std::snprintf(buf, sizeof buf, "min (%g, %g, %g) max (%g, %g, %g)", b.min.x, b.min.y, b.min.z,
@@ -87,6 +115,62 @@ size_t PrimitiveStore::sizeBytes() const {
     return triangles.capacity() * sizeof(IntersectTriangle) +
            motion.capacity() * sizeof(MotionTriangle) + motionCorners.capacity() * sizeof(Vec3) +
            instances.capacity() * sizeof(IntersectInstanceGrid);
+}
+
+void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density) {
+    size_t n = triangles.size();
+    if (n < 2) return;
+    BBox box;
+    for (const IntersectTriangle &t : triangles) box.extend(t.bounds());
+    if (!Grid::boxUsable(box)) return;
+    box = Grid::widen(box);
+    Vec3 ext = box.extent();
+    GridResolution res = Grid::resolution(n, ext.x, ext.y, ext.z, density);
+    const double cells[3] = {double(res.nx), double(res.ny), double(res.nz)};
+    // Order: the triangle's home cell (the cell of its box's lower corner) along the curve;
+    // inside one, the triangles that reach into the same neighbours together, then the curve
+    // over the centres. Neighbouring triangles share packets, a packet rarely spans two cells,
+    // and a neighbour that a few of a cell's triangles reach finds them in few packets.
+    struct Keyed {
+        uint64_t cell;
+        uint32_t reach, inside, tri;
+        bool operator<(const Keyed &o) const {
+            if (cell != o.cell) return cell < o.cell;
+            if (reach != o.reach) return reach < o.reach;
+            return inside != o.inside ? inside < o.inside : tri < o.tri;
+        }
+    };
+    // Position in cell units along an axis, clamped (NaN to 0) before any integer conversion.
+    auto unit = [&](float v, int a) {
+        double f = ext[a] > 0.0f ? (double(v) - box.min[a]) / ext[a] * cells[a] : 0.0;
+        return f >= 0.0 ? (f < cells[a] ? f : cells[a] - 0.5) : 0.0;
+    };
+    std::vector<Keyed> keyed(n);
+    for (size_t i = 0; i < n; ++i) {
+        const IntersectTriangle &t = triangles[i];
+        Vec3 centre = t.p0 + (t.e1 + t.e2) * (1.0f / 3.0f);
+        BBox b = t.bounds();
+        uint64_t c[3];
+        uint32_t q[3], reach = 0;
+        for (int a = 0; a < 3; ++a) {
+            c[a] = uint64_t(unit(b.min[a], a));
+            double f = unit(centre[a], a) - double(c[a]);
+            q[a] = uint32_t(std::min(f, 1.0) * 1023.0);
+            reach |= uint32_t(uint64_t(unit(b.max[a], a)) > c[a]) << a;
+        }
+        keyed[i] = {morton3x21(c[0], c[1], c[2]), reach, morton3(q[0], q[1], q[2]), uint32_t(i)};
+    }
+    std::sort(keyed.begin(), keyed.end());
+    std::vector<uint32_t> newIndex(n);
+    decltype(triangles) sorted(n);
+    for (size_t i = 0; i < n; ++i) {
+        sorted[i] = triangles[keyed[i].tri];
+        newIndex[keyed[i].tri] = uint32_t(i);
+    }
+    triangles.swap(sorted);
+    for (uint32_t &code : codes)
+        if ((code >> kItemIndexBits) == kItemTriangle)
+            code = itemCode(kItemTriangle, newIndex[code & kItemIndexMask]);
 }
 
 BBox Grid::widen(const BBox &box) {
@@ -155,7 +239,6 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     depth_ = depth;
     cells_.clear();
     items_.clear();
-    packets_.clear();
     groups_.clear();
     children_.clear();
     stats_ = GridStats();
@@ -298,9 +381,7 @@ void Grid::finalize() {
     if (refinedChild_.size() != ncells) refinedChild_.assign(ncells, 0xFFFFFFFFu);
     std::vector<uint32_t> cellBegin(ncells + 1, 0);
     items_.clear();
-    packets_.clear();
     groups_.clear();
-    if (params_.sse) packTriangles();
     stats_ = GridStats();
     stats_.voxels = ncells;
     std::vector<uint32_t> tris, others;
@@ -354,151 +435,17 @@ void Grid::finalize() {
     computeDistances(occupied);
     items_.shrink_to_fit();
     groups_.shrink_to_fit();
-    std::vector<std::pair<uint32_t, uint32_t>>().swap(packetOf_);
-    std::vector<uint32_t>().swap(packetOfDense_);
     std::vector<uint32_t>().swap(buildBegin_);
     std::vector<uint32_t>().swap(buildItems_);
     std::vector<uint32_t>().swap(refinedChild_);
 }
 
-namespace {
-
-// Interleaves the low 21 bits of x, y and z.
-uint64_t morton3x21(uint64_t x, uint64_t y, uint64_t z) {
-    auto spread = [](uint64_t v) {
-        v &= 0x1FFFFF;
-        v = (v | v << 32) & 0x1F00000000FFFFull;
-        v = (v | v << 16) & 0x1F0000FF0000FFull;
-        v = (v | v << 8) & 0x100F00F00F00F00Full;
-        v = (v | v << 4) & 0x10C30C30C30C30C3ull;
-        v = (v | v << 2) & 0x1249249249249249ull;
-        return v;
-    };
-    return spread(x) | spread(y) << 1 | spread(z) << 2;
-}
-
-// Interleaves the low ten bits of x, y and z.
-uint32_t morton3(uint32_t x, uint32_t y, uint32_t z) {
-    auto spread = [](uint32_t v) {
-        v &= 0x3FF;
-        v = (v | (v << 16)) & 0x030000FF;
-        v = (v | (v << 8)) & 0x0300F00F;
-        v = (v | (v << 4)) & 0x030C30C3;
-        v = (v | (v << 2)) & 0x09249249;
-        return v;
-    };
-    return spread(x) | (spread(y) << 1) | (spread(z) << 2);
-}
-
-}  // namespace
-
-void Grid::packTriangles() {
-    // Every triangle of an unrefined cell with the first such cell (its home).
-    size_t ncells = size_t(nx_ * ny_ * nz_);
-    std::vector<std::pair<uint32_t, uint32_t>> home;
-    // Large grids mark the triangles seen in an array over the store; small ones sort.
-    bool dense = size_t(buildItems_.size()) * 8 >= store_->triangles.size();
-    std::vector<bool> seen(dense ? store_->triangles.size() : 0);
-    for (size_t c = 0; c < ncells; ++c) {
-        if (refinedChild_[c] != 0xFFFFFFFFu) continue;
-        for (uint32_t k = buildBegin_[c]; k < buildBegin_[c + 1]; ++k) {
-            if ((buildItems_[k] >> kItemIndexBits) != kItemTriangle) continue;
-            uint32_t t = buildItems_[k] & kItemIndexMask;
-            if (dense) {
-                if (seen[t]) continue;
-                seen[t] = true;
-            }
-            home.emplace_back(t, uint32_t(c));
-        }
-    }
-    if (!dense) {
-        std::sort(home.begin(), home.end());
-        home.erase(std::unique(home.begin(), home.end(),
-                               [](const auto &a, const auto &b) { return a.first == b.first; }),
-                   home.end());
-    }
-    // Order: Morton order of the home cells; inside one, the triangles that reach the same
-    // neighbours together, then Morton order of their centres. Neighbouring triangles share
-    // packets, a packet rarely spans two cells, and a neighbour that a few of a cell's
-    // triangles reach finds them in few packets.
-    struct Keyed {
-        uint64_t cell;
-        uint32_t reach, inside, tri;
-        bool operator<(const Keyed &o) const {
-            if (cell != o.cell) return cell < o.cell;
-            if (reach != o.reach) return reach < o.reach;
-            return inside != o.inside ? inside < o.inside : tri < o.tri;
-        }
-    };
-    std::vector<Keyed> keyed;
-    keyed.reserve(home.size());
-    for (const auto &[t, c] : home) {
-        int64_t z = int64_t(c / size_t(nx_ * ny_)), rem = int64_t(c % size_t(nx_ * ny_));
-        int64_t x = rem % nx_, y = rem / nx_;
-        BBox cell = cellBox(x, y, z);
-        Vec3 ext = cell.extent();
-        const IntersectTriangle &tri = store_->triangles[t];
-        Vec3 centre = tri.p0 + (tri.e1 + tri.e2) * (1.0f / 3.0f);
-        uint32_t q[3];
-        for (int a = 0; a < 3; ++a) {
-            float f = ext[a] > 0.0f ? (centre[a] - cell.min[a]) / ext[a] * 1023.0f : 0.0f;
-            f = f >= 0.0f ? (f <= 1023.0f ? f : 1023.0f) : 0.0f;
-            q[a] = uint32_t(f);
-        }
-        // Which side of the home cell the triangle's box reaches beyond, per axis.
-        BBox b = tri.bounds();
-        const int64_t at[3] = {x, y, z};
-        uint32_t reach = 0;
-        for (int a = 0; a < 3; ++a) {
-            uint32_t below = cellCoord(b.min[a] - margin_, a) < at[a];
-            uint32_t above = cellCoord(b.max[a] + margin_, a) > at[a];
-            reach |= (below | above << 1) << (2 * a);
-        }
-        keyed.push_back({morton3x21(uint64_t(x), uint64_t(y), uint64_t(z)), reach,
-                         morton3(q[0], q[1], q[2]), t});
-    }
-    std::sort(keyed.begin(), keyed.end());
-    const float nan = std::numeric_limits<float>::quiet_NaN();
-    packets_.assign((keyed.size() + 3) / 4, IntersectSSETriangle());
-    packetOf_.clear();
-    packetOf_.reserve(keyed.size());
-    for (size_t i = 0; i < packets_.size() * 4; ++i) {
-        IntersectSSETriangle &pk = packets_[i / 4];
-        int lane = int(i % 4);
-        bool used = i < keyed.size();
-        uint32_t index = used ? keyed[i].tri : 0xFFFFFFFFu;
-        const IntersectTriangle *t = used ? &store_->triangles[index] : nullptr;
-        for (int a = 0; a < 3; ++a) {
-            pk.p0[a][lane] = used ? t->p0[a] : nan;
-            pk.e1[a][lane] = used ? t->e1[a] : 0.0f;
-            pk.e2[a][lane] = used ? t->e2[a] : 0.0f;
-        }
-        pk.flags[lane] = used ? t->flags : 0u;
-        pk.prim[lane] = index;
-        pk.id[lane] = used ? t->id : 0u;
-        pk.instance[lane] = used ? t->instance : kNoInstance;
-        if (used) packetOf_.emplace_back(index, uint32_t(i / 4));
-    }
-    if (dense) {
-        packetOfDense_.assign(store_->triangles.size(), 0);
-        for (const auto &[t, p] : packetOf_) packetOfDense_[t] = p;
-        std::vector<std::pair<uint32_t, uint32_t>>().swap(packetOf_);
-    } else {
-        std::sort(packetOf_.begin(), packetOf_.end());
-    }
-}
-
-uint32_t Grid::packetOf(uint32_t triangle) const {
-    if (!packetOfDense_.empty()) return packetOfDense_[triangle];
-    return std::lower_bound(packetOf_.begin(), packetOf_.end(), std::make_pair(triangle, 0u))
-        ->second;
-}
 
 void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
     // The packets holding the cell's triangles, each with the box of those triangles.
     std::vector<std::pair<uint32_t, uint32_t>> byPacket;
     byPacket.reserve(tris.size());
-    for (uint32_t t : tris) byPacket.emplace_back(packetOf(t), t);
+    for (uint32_t t : tris) byPacket.emplace_back(t >> 2, t);
     std::sort(byPacket.begin(), byPacket.end());
     std::vector<std::pair<uint32_t, BBox>> used;
     for (const auto &[p, t] : byPacket) {
@@ -611,7 +558,7 @@ uint32_t Grid::nestingDepth() const {
 
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cells_.capacity() * sizeof(uint32_t) + items_.capacity() * 4 +
-               distance_.capacity() + packets_.capacity() * sizeof(IntersectSSETriangle) +
+               distance_.capacity() +
                groups_.capacity() * sizeof(PacketGroup) + children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
@@ -638,10 +585,30 @@ bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, Trace
 
 namespace {
 
-// Runs the packet kernel and keeps the closest lane hit in the state.
+// Runs the packet kernel on packet k of the store and keeps the closest lane hit in the state.
+// The last packet of a store whose size is not a multiple of four is completed with lanes that
+// never hit.
 template <bool kAny>
-__attribute__((always_inline)) inline bool testPacket(const IntersectSSETriangle &pk,
+__attribute__((always_inline)) inline bool testPacket(const PrimitiveStore &store, uint32_t k,
                                                       const TraceRay &r, TraceState &s) {
+    const IntersectTriangle *tri = store.triangles.data() + size_t(k) * 4;
+    IntersectSSETriangle pk;
+    size_t left = store.triangles.size() - size_t(k) * 4;
+    if (__builtin_expect(left >= 4, 1)) {
+        pk = IntersectSSETriangle::load(tri);
+    } else {
+        alignas(16) IntersectTriangle last[4];
+        const float nan = std::numeric_limits<float>::quiet_NaN();
+        for (size_t i = 0; i < 4; ++i) {
+            if (i < left) {
+                last[i] = tri[i];
+            } else {
+                last[i].p0 = Vec3(nan, nan, nan);
+                last[i].flags = 0;
+            }
+        }
+        pk = IntersectSSETriangle::load(last);
+    }
     float4 t, u, v;
     int mask = intersectPacket(pk, r, s.limit, t, u, v);
     if (!mask) return false;
@@ -656,13 +623,17 @@ __attribute__((always_inline)) inline bool testPacket(const IntersectSSETriangle
     s.limit = ts[lane];
     s.u = us[lane], s.v = vs[lane];
     s.kind = kItemTriangle;
-    s.prim = pk.prim[lane];
-    s.id = pk.id[lane];
-    s.instance = pk.instance[lane];
-    s.flags = pk.flags[lane];
-    s.fromPacket = true;
+    s.prim = k * 4 + uint32_t(lane);
     s.found = true;
     return true;
+}
+
+// Starts fetching packet k (three cache lines when the store is line-aligned).
+inline void prefetchPacket(const PrimitiveStore &store, uint32_t k) {
+    const char *p = reinterpret_cast<const char *>(store.triangles.data() + size_t(k) * 4);
+    __builtin_prefetch(p);
+    __builtin_prefetch(p + 64);
+    __builtin_prefetch(p + 128);
 }
 
 // Lanes of the group whose box the ray passes through between 0 and the limit, and the
@@ -698,15 +669,11 @@ bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s) const {
         float4 tnear;
         int mask = groupMask(*g, r, s.limit, tnear);
         // Start fetching every packet the ray may test, so their misses overlap.
-        for (int m = mask; m; m &= m - 1) {
-            const char *p = reinterpret_cast<const char *>(&packets_[g->packet[__builtin_ctz(m)]]);
-            for (int line = 0; line < int(sizeof(IntersectSSETriangle)); line += 64)
-                __builtin_prefetch(p + line);
-        }
+        for (int m = mask; m; m &= m - 1) prefetchPacket(*store_, g->packet[__builtin_ctz(m)]);
         while (mask) {
             int lane = __builtin_ctz(mask);
             mask &= mask - 1;
-            if (testPacket<kAny>(packets_[g->packet[lane]], r, s)) {
+            if (testPacket<kAny>(*store_, g->packet[lane], r, s)) {
                 if constexpr (kAny) return true;
                 hit = true;
                 // Boxes entered beyond the new closest hit cannot hold a closer one.
@@ -726,7 +693,7 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
         uint32_t index = code & kItemIndexMask;
         switch (code >> kItemIndexBits) {
             case kItemPacket: {
-                if (testPacket<kAny>(packets_[index], r, s)) {
+                if (testPacket<kAny>(*store_, index, r, s)) {
                     if constexpr (kAny) return true;
                     hit = true;
                 }
@@ -746,7 +713,6 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 s.limit = t, s.u = u, s.v = v;
                 s.kind = kItemTriangle;
                 s.prim = index;
-                s.fromPacket = false;
                 s.found = hit = true;
                 break;
             }
@@ -763,7 +729,6 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 s.limit = t, s.u = u, s.v = v;
                 s.kind = kItemMotion;
                 s.prim = index;
-                s.fromPacket = false;
                 s.found = hit = true;
                 break;
             }
@@ -782,8 +747,7 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 s.kind = kItemInstance;
                 s.prim = ls.prim;
                 s.inst = index;
-                s.id = ls.fromPacket ? ls.id : inst.store->triangles[ls.prim].id;
-                s.fromPacket = false;
+                s.id = inst.store->triangles[ls.prim].id;
                 s.found = hit = true;
                 break;
             }
@@ -908,7 +872,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                     if (kind == kItemGroup)
                         p = reinterpret_cast<const char *>(&groups_[*k & kItemIndexMask]);
                     else if (kind == kItemPacket)
-                        p = reinterpret_cast<const char *>(&packets_[*k & kItemIndexMask]);
+                        p = reinterpret_cast<const char *>(store_->triangles.data() +
+                                                           size_t(*k & kItemIndexMask) * 4);
                     if (p) {
                         __builtin_prefetch(p);
                         __builtin_prefetch(p + 64);
@@ -928,7 +893,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 if (kind == kItemGroup)
                     p = reinterpret_cast<const char *>(groups_.data() + (word & kItemIndexMask));
                 else if (kind == kItemPacket)
-                    p = reinterpret_cast<const char *>(packets_.data() + (word & kItemIndexMask));
+                    p = reinterpret_cast<const char *>(store_->triangles.data() +
+                                                       size_t(word & kItemIndexMask) * 4);
                 else if (kind == kItemList)
                     p = reinterpret_cast<const char *>(items + (word & kItemIndexMask));
                 if (p) __builtin_prefetch(p);

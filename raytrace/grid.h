@@ -16,7 +16,7 @@ struct PrimitiveStore;
 
 /// Primitive kinds a grid cell refers to; the kind sits in the top three bits of an item code.
 enum ItemKind : uint32_t {
-    kItemPacket = 0,    ///< An IntersectSSETriangle of the grid itself (index into its packets).
+    kItemPacket = 0,    ///< Four store triangles tested together: index k names 4k to 4k + 3.
     kItemTriangle = 1,  ///< An IntersectTriangle of the store.
     kItemMotion = 2,    ///< A MotionTriangle of the store.
     kItemInstance = 3,  ///< An IntersectInstanceGrid of the store.
@@ -70,9 +70,10 @@ struct IntersectInstanceGrid {
 };
 
 /// Everything a hierarchy of grids indexes: world (or object) triangles, moving triangles and
-/// instances.
+/// instances. With SSE packing, triangles 4k to 4k + 3 form packet k: the triangles are stored
+/// in an order that keeps each packet's four close together (sortForPackets).
 struct PrimitiveStore {
-    std::vector<IntersectTriangle> triangles;
+    std::vector<IntersectTriangle, LargeArrayAllocator<IntersectTriangle>> triangles;
     std::vector<MotionTriangle> motion;
     std::vector<Vec3> motionCorners;
     std::vector<IntersectInstanceGrid> instances;
@@ -81,6 +82,11 @@ struct PrimitiveStore {
     BBox bounds(uint32_t code) const;
     /// Bytes held.
     size_t sizeBytes() const;
+    /// Reorders the triangles along a space-filling curve over the cells of a grid of the given
+    /// density (inside one cell along the same curve), so that four consecutive triangles lie
+    /// close together, and renames the triangle codes in codes to match. Deterministic: ties
+    /// keep the earlier triangle first.
+    void sortForPackets(std::vector<uint32_t> &codes, float density);
 };
 
 /// Parameters shared by a grid and its nested grids.
@@ -201,17 +207,9 @@ private:
     std::vector<uint8_t, LargeArrayAllocator<uint8_t>> distance_;
     void computeDistances(const std::vector<uint32_t> &occupied);
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> items_;
-    // Packets: every triangle of the grid's cells once, packed four to a packet in the order of
-    // its first cell and its place there, so that one cell's triangles share few packets. Cells
-    // name them through groups (or directly when a cell needs a single packet).
-    std::vector<IntersectSSETriangle, LargeArrayAllocator<IntersectSSETriangle>> packets_;
+    // Packets are the store's triangles four by four; cells name them through groups (or
+    // directly when a cell needs a single packet).
     std::vector<PacketGroup, LargeArrayAllocator<PacketGroup>> groups_;
-    // Build-time map from store triangle to packet: dense over the store for large grids,
-    // else (triangle, packet) pairs sorted by triangle.
-    std::vector<uint32_t> packetOfDense_;
-    std::vector<std::pair<uint32_t, uint32_t>> packetOf_;
-    uint32_t packetOf(uint32_t triangle) const;
-    void packTriangles();
     std::vector<std::unique_ptr<Grid>> children_;
     GridStats stats_;
     // Build-time lists, released by finalize.

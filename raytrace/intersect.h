@@ -66,22 +66,23 @@ struct TraceState {
     uint8_t kind = 0;   ///< Item kind of the hit (see Grid::ItemKind).
     uint32_t prim = 0;  ///< Index of the triangle (or motion triangle) in its store.
     uint32_t inst = 0;  ///< For hits through an instance: the instance's index in the store.
-    uint32_t id = 0;    ///< Packet or instance hit: the triangle's index inside its shape.
-    uint32_t instance = kNoInstance;  ///< Triangle hit: its scene instance (from the packet).
-    uint32_t flags = 0;               ///< Triangle hit: its flag word (from the packet).
-    bool fromPacket = false;          ///< A packet hit: id, instance and flags are its lane's.
+    uint32_t id = 0;    ///< Instance hit: the triangle's index inside its shape.
 };
 
 /// True when an object with these flags is seen by rays that need one of the required bits.
 inline bool flagsVisible(uint32_t flags, uint32_t required) { return (flags & required) != 0; }
 
 /// One triangle as p0 and the edges e1 = p1 - p0, e2 = p2 - p0, with the object's flag word.
-struct IntersectTriangle {
-    Vec3 p0, e1, e2;
+/// Three rows of four words, each 16-byte aligned, so that four consecutive triangles load as a
+/// packed packet: the rows transpose into p0, e1 and e2 per axis, and the fourth lane of the p0
+/// rows into the flags.
+struct alignas(16) IntersectTriangle {
+    Vec3 p0;
     uint32_t flags = 0;
-    uint32_t id = 0;                  ///< Triangle index inside its shape.
+    Vec3 e1;
+    uint32_t id = 0;  ///< Triangle index inside its shape.
+    Vec3 e2;
     uint32_t instance = kNoInstance;  ///< Scene instance the triangle came from.
-    uint32_t reserved = 0;
 
     /// Bounding box of the three corners.
     BBox bounds() const {
@@ -92,6 +93,7 @@ struct IntersectTriangle {
         return b;
     }
 };
+static_assert(sizeof(IntersectTriangle) == 48, "three rows of four words");
 
 /// The single-triangle test. Returns true for 1e-6 < t < tmax with t, u, v set. Back faces are
 /// culled unless DoubleSided; Opposite culls the front instead. The sign of det decides the side
@@ -133,28 +135,39 @@ inline bool intersectTriangle(const IntersectTriangle &tri, const TraceRay &r, f
                              tmax, t, u, v);
 }
 
-/// Four triangles in structure-of-arrays form. Unused lanes have NaN corners and never hit.
-struct alignas(16) IntersectSSETriangle {
-    float p0[3][4];
-    float e1[3][4];
-    float e2[3][4];
-    uint32_t flags[4];
-    uint32_t prim[4];      ///< Store index of each lane's triangle (0xFFFFFFFF for unused lanes).
-    uint32_t id[4];        ///< Triangle index inside its shape.
-    uint32_t instance[4];  ///< Scene instance of each lane.
+/// Four triangles in structure-of-arrays form, as the packed test reads them.
+struct IntersectSSETriangle {
+    float4 p0[3], e1[3], e2[3];
+    int4 flags;
+
+    /// Loads four consecutive triangles (16-byte aligned).
+    __attribute__((always_inline)) static IntersectSSETriangle load(const IntersectTriangle *t) {
+        IntersectSSETriangle pk;
+        const float *f = reinterpret_cast<const float *>(t);
+        for (int row = 0; row < 3; ++row) {
+            __m128 r0 = _mm_load_ps(f + 4 * row), r1 = _mm_load_ps(f + 12 + 4 * row),
+                   r2 = _mm_load_ps(f + 24 + 4 * row), r3 = _mm_load_ps(f + 36 + 4 * row);
+            _MM_TRANSPOSE4_PS(r0, r1, r2, r3);
+            float4 *dst = row == 0 ? pk.p0 : row == 1 ? pk.e1 : pk.e2;
+            dst[0] = r0, dst[1] = r1, dst[2] = r2;
+            if (row == 0) pk.flags = _mm_castps_si128(r3);
+        }
+        return pk;
+    }
 };
 
-/// Tests the four lanes; returns the lane bit mask of hits with 1e-6 < t < tmax.
+/// Tests the four lanes; returns the lane bit mask of hits with 1e-6 < t < tmax. Lanes with NaN
+/// corners never hit.
 __attribute__((always_inline)) inline int intersectPacket(const IntersectSSETriangle &pk,
                                                           const TraceRay &r, float tmax,
                                                           float4 &tOut, float4 &uOut,
                                                           float4 &vOut) {
-    int4 flags = (int4::load(pk.flags) & r.flagKeep) | r.flagSet;
+    int4 flags = (pk.flags & r.flagKeep) | r.flagSet;
     int4 zero(0);
     // Lanes whose flags lack every required bit are invisible.
     float4 invisible = asFloat(cmpeq(flags & r.required4, zero));
-    float4 e1x = float4::load(pk.e1[0]), e1y = float4::load(pk.e1[1]), e1z = float4::load(pk.e1[2]);
-    float4 e2x = float4::load(pk.e2[0]), e2y = float4::load(pk.e2[1]), e2z = float4::load(pk.e2[2]);
+    float4 e1x = pk.e1[0], e1y = pk.e1[1], e1z = pk.e1[2];
+    float4 e2x = pk.e2[0], e2y = pk.e2[1], e2z = pk.e2[2];
     float4 px = r.dy * e2z - r.dz * e2y;
     float4 py = r.dz * e2x - r.dx * e2z;
     float4 pz = r.dx * e2y - r.dy * e2x;
@@ -165,9 +178,9 @@ __attribute__((always_inline)) inline int intersectPacket(const IntersectSSETria
     float4 sdet = det ^ asFloat(shiftLeft(flags & int4(int32_t(kFlagOpposite)), 22));
     float4 miss = invisible | (singleSided & (sdet < float4::zero()));
     float4 inv = float4(1.0f) / det;
-    float4 qx = r.ox - float4::load(pk.p0[0]);
-    float4 qy = r.oy - float4::load(pk.p0[1]);
-    float4 qz = r.oz - float4::load(pk.p0[2]);
+    float4 qx = r.ox - pk.p0[0];
+    float4 qy = r.oy - pk.p0[1];
+    float4 qz = r.oz - pk.p0[2];
     float4 u = (qx * px + qy * py + qz * pz) * inv;
     miss = miss | (u < float4::zero());
     float4 rx = qy * e1z - qz * e1y;

@@ -15,7 +15,9 @@ template <class T>
 struct LargeArrayAllocator {
     using value_type = T;
     static constexpr size_t kHugePage = size_t(2) << 20;
-    static constexpr std::align_val_t kSmallAlign{alignof(T) < 16 ? 16 : alignof(T)};
+    /// Smaller blocks start on a cache line, so that fixed-size records never straddle one more
+    /// line than they must.
+    static constexpr std::align_val_t kSmallAlign{alignof(T) < 64 ? 64 : alignof(T)};
 
     LargeArrayAllocator() = default;
     template <class U>
