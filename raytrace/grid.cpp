@@ -503,10 +503,11 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
     // its seven neighbours ahead, or kEmptyAhead when every cell ahead of it (the whole octant
     // of cells whose coordinates lie on the ray's side) is empty.
     size_t ncells = occupied.size();
-    distance_.assign(8 * ncells, 255);
+    constexpr uint32_t kAhead = 255;
+    std::vector<uint8_t> distance(8 * ncells, kAhead);
     const int64_t n[3] = {nx_, ny_, nz_};
     for (int octant = 0; octant < 8; ++octant) {
-        uint8_t *d = distance_.data() + size_t(octant) * ncells;
+        uint8_t *d = distance.data() + size_t(octant) * ncells;
         int64_t s[3], start[3], stride[3] = {1, nx_, nx_ * ny_};
         for (int a = 0; a < 3; ++a) {
             s[a] = (octant >> a & 1) ? -1 : 1;
@@ -527,7 +528,7 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                     // Neighbours ahead on each axis, or none beyond the grid.
                     bool in[3] = {x + s[0] >= 0 && x + s[0] < nx_, y + s[1] >= 0 && y + s[1] < ny_,
                                   z + s[2] >= 0 && z + s[2] < nz_};
-                    uint32_t best = kEmptyAhead;
+                    uint32_t best = kAhead;
                     if (in[0] && in[1] && in[2]) {
                         for (int m = 1; m < 8; ++m)
                             best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
@@ -537,10 +538,23 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                                 !((m & 4) && !in[2]))
                                 best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
                     }
-                    d[c] = uint8_t(best == kEmptyAhead
-                                       ? kEmptyAhead
-                                       : std::min<uint32_t>(best + 1, kEmptyAhead - 1));
+                    d[c] = uint8_t(best == kAhead ? kAhead
+                                                  : std::min<uint32_t>(best + 1, kAhead - 1));
                 }
+    }
+    // Empty cells' words: each octant's side rounded down to a coded one.
+    for (size_t c = 0; c < ncells; ++c) {
+        if (occupied[c]) continue;
+        uint32_t word = 0;
+        for (int octant = 0; octant < 8; ++octant) {
+            uint32_t side = distance[size_t(octant) * ncells + c], code = kEmptyAhead;
+            if (side != kAhead) {
+                code = 0;
+                while (code + 1 < kEmptyAhead && kCubeSide[code + 1] <= side) ++code;
+            }
+            word |= code << (3 * octant);
+        }
+        cells_[c] = itemCode(kItemEmpty, word);
     }
 }
 
@@ -558,7 +572,6 @@ uint32_t Grid::nestingDepth() const {
 
 size_t Grid::sizeBytes() const {
     size_t n = sizeof(Grid) + cells_.capacity() * sizeof(uint32_t) + items_.capacity() * 4 +
-               distance_.capacity() +
                groups_.capacity() * sizeof(PacketGroup) + children_.capacity() * sizeof(void *);
     for (const auto &c : children_) n += c->sizeBytes();
     return n;
@@ -567,8 +580,8 @@ size_t Grid::sizeBytes() const {
 std::vector<uint32_t> Grid::cellItems(int64_t x, int64_t y, int64_t z) const {
     if (empty() || x < 0 || y < 0 || z < 0 || x >= nx_ || y >= ny_ || z >= nz_) return {};
     size_t c = size_t((z * ny_ + y) * nx_ + x);
-    if (distance_[c] != 0) return {};
     uint32_t word = cells_[c];
+    if ((word >> kItemIndexBits) == kItemEmpty) return {};
     if ((word >> kItemIndexBits) != kItemList) return {word};
     const uint32_t *list = items_.data() + (word & kItemIndexMask);
     return {list + 1, list + 1 + list[0]};
@@ -806,17 +819,14 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
         delta[a] = step[a] ? cellSize_[a] * std::fabs(r.inv[a]) : kInfiniteDistance;
     }
-    // The distances of the ray's direction octant.
-    const uint8_t *distance =
-        distance_.data() +
-        size_t((step[0] < 0) | (step[1] < 0) << 1 | (step[2] < 0) << 2) * size_t(nx_ * ny_ * nz_);
+    // Where empty cells keep the distance code of the ray's direction octant.
+    const uint32_t shift = 3 * uint32_t((step[0] < 0) | (step[1] < 0) << 1 | (step[2] < 0) << 2);
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
-    // The walk waits on each cell's distance before it knows where to go next. In grids whose
-    // distances do not stay in a core's cache, start fetching the cells at a few points ahead
-    // along the ray now, so that those waits overlap.
+    // The walk waits on each cell's word before it knows where to go next. In grids whose
+    // words do not stay in a core's cache, start fetching the cells at a few points ahead along
+    // the ray now, so that those waits overlap.
     if (nx_ * ny_ * nz_ >= kFetchAheadMinCells) {
-        __builtin_prefetch(distance + cell);
         __builtin_prefetch(cells + cell);
         // The points in cell units, stepped by 2 crossings of the smallest cell side; the cell
         // counts fit 32 bits.
@@ -840,7 +850,6 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             // (Above 2^24 cells a coordinate may round one or two past the last cell.)
             int64_t c =
                 std::min(at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2], lastCell);
-            __builtin_prefetch(distance + c);
             __builtin_prefetch(cells + c);
         }
     }
@@ -851,12 +860,12 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         // The axis of the nearest cell plane; while this cell is looked at, fetch the cell the
         // walk is likely to enter next.
         int a = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2) : (tNext[1] < tNext[2] ? 1 : 2);
-        if (next[a] + step[a] != beyond[a]) {
-            int64_t nc = cell + cellStep[a];
-            __builtin_prefetch(distance + nc);
-            __builtin_prefetch(cells + nc);
-        }
-        uint32_t dist = distance[cell];
+        if (next[a] + step[a] != beyond[a]) __builtin_prefetch(cells + cell + cellStep[a]);
+        const uint32_t word = cells[cell];
+        const uint32_t dist = (word >> kItemIndexBits) == kItemEmpty
+                                  ? (word >> shift & 7) == kEmptyAhead ? 255u
+                                                                       : kCubeSide[word >> shift & 7]
+                                  : 0u;
         if (dist == 0) {
             const uint32_t *first = cells + cell, *last = first + 1;
             if ((*first >> kItemIndexBits) == kItemList) {
@@ -885,23 +894,20 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             }
             // The next cell's word has arrived meanwhile: start fetching what it names.
             if (next[a] + step[a] != beyond[a] && tNext[a] < s.limit) {
-                uint32_t word = cells[cell + cellStep[a]];
-                uint32_t kind = word >> kItemIndexBits;
+                uint32_t nextWord = cells[cell + cellStep[a]];
+                uint32_t kind = nextWord >> kItemIndexBits, index = nextWord & kItemIndexMask;
                 const char *p = nullptr;
-                // An empty cell's word (0) names packet 0, which need not exist: address
-                // arithmetic only, the prefetch reads nothing.
                 if (kind == kItemGroup)
-                    p = reinterpret_cast<const char *>(groups_.data() + (word & kItemIndexMask));
+                    p = reinterpret_cast<const char *>(groups_.data() + index);
                 else if (kind == kItemPacket)
-                    p = reinterpret_cast<const char *>(store_->triangles.data() +
-                                                       size_t(word & kItemIndexMask) * 4);
+                    p = reinterpret_cast<const char *>(store_->triangles.data() + size_t(index) * 4);
                 else if (kind == kItemList)
-                    p = reinterpret_cast<const char *>(items + (word & kItemIndexMask));
+                    p = reinterpret_cast<const char *>(items + index);
                 if (p) __builtin_prefetch(p);
             }
         } else if (dist >= 2) {
             // Nothing lies ahead of this cell the way the ray goes: the walk is over.
-            if (dist == kEmptyAhead) break;
+            if (dist == 255) break;
             // Every cell within dist - 1 of this one is empty: leave that cube in one jump
             // through its nearest far face. The other axes move to the cell the ray is in
             // there (at most dist - 1 cells on), with the plane ahead not before the exit.

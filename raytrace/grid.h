@@ -22,6 +22,7 @@ enum ItemKind : uint32_t {
     kItemInstance = 3,  ///< An IntersectInstanceGrid of the store.
     kItemChild = 4,     ///< A DynamicVoxel: a nested grid of the grid itself.
     kItemGroup = 5,     ///< The first of a cell's packet groups (index into the grid's groups).
+    kItemEmpty = 6,     ///< A cell word only: an empty cell with its distances (see Grid).
     kItemList = 7,      ///< A cell word only: offset of the cell's count and codes in the list.
 };
 
@@ -191,20 +192,19 @@ private:
     float margin_ = 0.0f;
     BBox box_;
     // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
-    // the cell's item count followed by its codes; most cells reach their data without the list.
-    // Empty cells hold 0.
-    std::vector<uint32_t, LargeArrayAllocator<uint32_t>> cells_;
-    // Per direction octant (bit a set when the ray goes down axis a), per cell: 0 when the cell
-    // holds items, else the side (in cells, at most 254) of the largest empty cube that starts
-    // at the cell and extends the way such rays go, or kEmptyAhead when no cell the ray can
-    // still reach holds items. The walk jumps over the cube, or stops. A ray reads only its own
-    // octant's array.
-    static constexpr uint32_t kEmptyAhead = 255;
+    // the cell's item count followed by its codes (most cells reach their data without the
+    // list), or for an empty cell a kItemEmpty code with three bits per direction octant (bits
+    // 3o to 3o + 2 for octant o; bit a of o set when the ray goes down axis a): the code of the
+    // side, in cells, of the largest empty cube that starts at the cell and extends the way such
+    // rays go (kCubeSide, rounded down), or kEmptyAhead when no cell such a ray can still reach
+    // holds items. The walk jumps over the cube, or stops; one load per cell tells it both.
+    static constexpr uint32_t kEmptyAhead = 7;
+    static constexpr uint8_t kCubeSide[7] = {1, 2, 3, 5, 8, 13, 21};
     /// Points along a ray whose cells the walk fetches before it starts, in grids of at least
-    /// kFetchAheadMinCells cells (2 MiB of distances).
+    /// kFetchAheadMinCells cells (1 MiB of cell words).
     static constexpr int kFetchAhead = 6;
     static constexpr int64_t kFetchAheadMinCells = int64_t(1) << 18;
-    std::vector<uint8_t, LargeArrayAllocator<uint8_t>> distance_;
+    std::vector<uint32_t, LargeArrayAllocator<uint32_t>> cells_;
     void computeDistances(const std::vector<uint32_t> &occupied);
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> items_;
     // Packets are the store's triangles four by four; cells name them through groups (or
