@@ -344,7 +344,17 @@ template <bool kAny>
 bool CompleteGrid::query(const Grid &grid, const PrimitiveStore &store, const Ray &ray, Hit *hit,
                          float tmax, RayCounter *counter) const {
     if (counter) counter->add(ray.type);
-    if (hit) *hit = Hit();
+    // The record is written field by field: a whole-record copy of a fresh Hit stalls on its
+    // overlapping stores in every query.
+    if constexpr (!kAny) {
+        hit->t = -1.0f;
+        hit->u = hit->v = hit->w = 0.0f;
+        hit->id = 0;
+        hit->instance = kNoInstance;
+        hit->flags = 0;
+        hit->primitive = nullptr;
+        hit->moving = false;
+    }
     if (ray.type == kRayEnvironment || !(tmax > 0.0f)) return false;
     TraceRay r;
     if (!r.prepare(ray.origin, ray.direction, rayTypeRequiredFlags(ray.type), ray.time))
@@ -356,7 +366,6 @@ bool CompleteGrid::query(const Grid &grid, const PrimitiveStore &store, const Ra
         hit->t = s.limit;
         hit->u = s.u;
         hit->v = s.v;
-        hit->w = 0.0f;
         switch (s.kind) {
             case kItemMotion: {
                 const MotionTriangle &m = store.motion[s.prim];
