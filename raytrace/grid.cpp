@@ -31,35 +31,53 @@ D3 crossD(const D3 &a, const D3 &b) {
 }
 double dotD(const D3 &a, const D3 &b) { return a.x * b.x + a.y * b.y + a.z * b.z; }
 
-// Separating-axis test of a triangle against a box (the nine edge cross axes, the box faces and
-// the triangle plane), in double precision.
-bool triangleBoxOverlap(const Vec3 &a, const Vec3 &b, const Vec3 &c, const BBox &box) {
-    D3 center{0.5 * (double(box.min.x) + box.max.x), 0.5 * (double(box.min.y) + box.max.y),
-              0.5 * (double(box.min.z) + box.max.z)};
-    D3 h{0.5 * (double(box.max.x) - box.min.x), 0.5 * (double(box.max.y) - box.min.y),
-         0.5 * (double(box.max.z) - box.min.z)};
-    D3 v[3] = {sub({a.x, a.y, a.z}, center), sub({b.x, b.y, b.z}, center),
-               sub({c.x, c.y, c.z}, center)};
-    // Box faces.
-    for (int axis = 0; axis < 3; ++axis) {
-        double lo = std::min({v[0][axis], v[1][axis], v[2][axis]});
-        double hi = std::max({v[0][axis], v[1][axis], v[2][axis]});
-        if (lo > h[axis] || hi < -h[axis]) return false;
-    }
-    D3 e[3] = {sub(v[1], v[0]), sub(v[2], v[1]), sub(v[0], v[2])};
-    const D3 axes[3] = {{1, 0, 0}, {0, 1, 0}, {0, 0, 1}};
-    for (const D3 &edge : e)
-        for (const D3 &u : axes) {
-            D3 l = crossD(u, edge);
-            double p0 = dotD(v[0], l), p1 = dotD(v[1], l), p2 = dotD(v[2], l);
-            double r = h.x * std::fabs(l.x) + h.y * std::fabs(l.y) + h.z * std::fabs(l.z);
-            if (std::min({p0, p1, p2}) > r || std::max({p0, p1, p2}) < -r) return false;
+// Separating-axis test of a triangle against boxes (the box faces, the nine edge cross axes and
+// the triangle plane), in double precision. What depends only on the triangle is computed once:
+// the projections of its corners on every axis.
+class TriangleBoxTest {
+public:
+    TriangleBoxTest(const Vec3 &a, const Vec3 &b, const Vec3 &c) {
+        const D3 v[3] = {{a.x, a.y, a.z}, {b.x, b.y, b.z}, {c.x, c.y, c.z}};
+        for (int axis = 0; axis < 3; ++axis) {
+            lo_[axis] = std::min({v[0][axis], v[1][axis], v[2][axis]});
+            hi_[axis] = std::max({v[0][axis], v[1][axis], v[2][axis]});
         }
-    D3 n = crossD(e[0], e[1]);
-    double d = dotD(n, v[0]);
-    double r = h.x * std::fabs(n.x) + h.y * std::fabs(n.y) + h.z * std::fabs(n.z);
-    return std::fabs(d) <= r;
-}
+        const D3 e[3] = {sub(v[1], v[0]), sub(v[2], v[1]), sub(v[0], v[2])};
+        const D3 units[3] = {{1, 0, 0}, {0, 1, 0}, {0, 0, 1}};
+        int k = 0;
+        for (const D3 &edge : e)
+            for (const D3 &u : units) setAxis(k++, crossD(u, edge), v);
+        setAxis(9, crossD(e[0], e[1]), v);
+    }
+
+    /// True when the triangle and the box overlap.
+    bool overlaps(const BBox &box) const {
+        const D3 lo{box.min.x, box.min.y, box.min.z}, hi{box.max.x, box.max.y, box.max.z};
+        for (int axis = 0; axis < 3; ++axis)
+            if (lo_[axis] > hi[axis] || hi_[axis] < lo[axis]) return false;
+        const D3 center{0.5 * (lo.x + hi.x), 0.5 * (lo.y + hi.y), 0.5 * (lo.z + hi.z)};
+        const D3 h{0.5 * (hi.x - lo.x), 0.5 * (hi.y - lo.y), 0.5 * (hi.z - lo.z)};
+        for (int k = 0; k < 10; ++k) {
+            const D3 &l = axis_[k];
+            double c = dotD(center, l);
+            double r = h.x * std::fabs(l.x) + h.y * std::fabs(l.y) + h.z * std::fabs(l.z);
+            if (min_[k] - c > r || max_[k] - c < -r) return false;
+        }
+        return true;
+    }
+
+private:
+    void setAxis(int k, const D3 &l, const D3 *v) {
+        axis_[k] = l;
+        double p0 = dotD(v[0], l), p1 = dotD(v[1], l), p2 = dotD(v[2], l);
+        min_[k] = std::min({p0, p1, p2});
+        max_[k] = std::max({p0, p1, p2});
+    }
+
+    double lo_[3], hi_[3];
+    D3 axis_[10];
+    double min_[10], max_[10];
+};
 
 // Interleaves the low 21 bits of x, y and z.
 uint64_t morton3x21(uint64_t x, uint64_t y, uint64_t z) {
@@ -298,17 +316,6 @@ BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
     return c;
 }
 
-bool Grid::overlaps(uint32_t code, const BBox &b, const BBox &cell) const {
-    BBox grown(cell.min - Vec3(margin_, margin_, margin_),
-               cell.max + Vec3(margin_, margin_, margin_));
-    if (!boxesOverlap(b, grown)) return false;
-    if ((code >> kItemIndexBits) == kItemTriangle) {
-        const IntersectTriangle &t = store_->triangles[code & kItemIndexMask];
-        return triangleBoxOverlap(t.p0, t.p0 + t.e1, t.p0 + t.e2, grown);
-    }
-    return true;
-}
-
 void Grid::insertAll(const std::vector<uint32_t> &prims) {
     size_t ncells = size_t(nx_ * ny_ * nz_);
     std::vector<std::pair<uint32_t, uint32_t>> pairs;
@@ -324,11 +331,28 @@ void Grid::insertAll(const std::vector<uint32_t> &prims) {
             pairs.emplace_back(uint32_t((lo[2] * ny_ + lo[1]) * nx_ + lo[0]), code);
             continue;
         }
+        // Each covered cell, grown by the margin, is tested against the primitive (a triangle
+        // exactly, anything else by its box).
+        const Vec3 m(margin_, margin_, margin_);
+        if ((code >> kItemIndexBits) == kItemTriangle) {
+            const IntersectTriangle &t = store_->triangles[code & kItemIndexMask];
+            const TriangleBoxTest test(t.p0, t.p0 + t.e1, t.p0 + t.e2);
+            for (int64_t z = lo[2]; z <= hi[2]; ++z)
+                for (int64_t y = lo[1]; y <= hi[1]; ++y)
+                    for (int64_t x = lo[0]; x <= hi[0]; ++x) {
+                        BBox cell = cellBox(x, y, z);
+                        if (test.overlaps(BBox(cell.min - m, cell.max + m)))
+                            pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
+                    }
+            continue;
+        }
         for (int64_t z = lo[2]; z <= hi[2]; ++z)
             for (int64_t y = lo[1]; y <= hi[1]; ++y)
-                for (int64_t x = lo[0]; x <= hi[0]; ++x)
-                    if (overlaps(code, b, cellBox(x, y, z)))
+                for (int64_t x = lo[0]; x <= hi[0]; ++x) {
+                    BBox cell = cellBox(x, y, z);
+                    if (boxesOverlap(b, BBox(cell.min - m, cell.max + m)))
                         pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
+                }
     }
     // Cell lists are indexed with 32 bits.
     if (pairs.size() > 0xFFFFFFFFull) throw std::length_error("too many cell references");
@@ -460,8 +484,10 @@ void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
             used.emplace_back(p, BBox(lo, hi));
         } else {
             BBox &b = used.back().second;
-            b.min = vmin(b.min, lo);
-            b.max = vmax(b.max, hi);
+            for (int a = 0; a < 3; ++a) {
+                b.min[a] = std::min(b.min[a], lo[a]);
+                b.max[a] = std::max(b.max[a], hi[a]);
+            }
         }
     }
     // Groups address packets with 29 bits; a structure that large keeps the remaining
@@ -487,8 +513,10 @@ void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
         group.run = uint32_t(groupCount - g);
         for (uint32_t j = 0; j < 4; ++j) {
             const auto &[p, b] = used[4 * g + std::min(j, group.count - 1)];
-            Vec3 lo = vmax(b.min - vpad, clip.min), hi = vmin(b.max + vpad, clip.max);
-            for (int a = 0; a < 3; ++a) group.lo[a][j] = lo[a], group.hi[a][j] = hi[a];
+            for (int a = 0; a < 3; ++a) {
+                group.lo[a][j] = std::max(b.min[a] - pad, clip.min[a]);
+                group.hi[a][j] = std::min(b.max[a] + pad, clip.max[a]);
+            }
             group.packet[j] = p;
         }
         groups_.push_back(group);

@@ -171,7 +171,6 @@ private:
     bool prepare(const PrimitiveStore &store, const std::vector<uint32_t> &prims, const BBox &box,
                  const GridParams &params, uint32_t depth, bool widenBox);
     void insertAll(const std::vector<uint32_t> &prims);
-    bool overlaps(uint32_t code, const BBox &b, const BBox &cellBox) const;
     BBox cellBox(int64_t x, int64_t y, int64_t z) const;
     void refine();
     void finalize();

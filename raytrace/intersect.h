@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <cmath>
 #include <cstdint>
 #include <limits>
@@ -84,13 +85,13 @@ struct alignas(16) IntersectTriangle {
     Vec3 e2;
     uint32_t instance = kNoInstance;  ///< Scene instance the triangle came from.
 
-    /// Bounding box of the three corners.
+    /// Bounding box of the three corners (stored triangles are finite).
     BBox bounds() const {
-        BBox b;
-        b.extend(p0);
-        b.extend(p0 + e1);
-        b.extend(p0 + e2);
-        return b;
+        const Vec3 p1 = p0 + e1, p2 = p0 + e2;
+        return {{std::min({p0.x, p1.x, p2.x}), std::min({p0.y, p1.y, p2.y}),
+                 std::min({p0.z, p1.z, p2.z})},
+                {std::max({p0.x, p1.x, p2.x}), std::max({p0.y, p1.y, p2.y}),
+                 std::max({p0.z, p1.z, p2.z})}};
     }
 };
 static_assert(sizeof(IntersectTriangle) == 48, "three rows of four words");
