@@ -293,6 +293,11 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
                              std::fabs(b.max.x), std::fabs(b.max.y), std::fabs(b.max.z)});
     float minCell = std::min({cellSize_.x, cellSize_.y, cellSize_.z});
     margin_ = std::min(tolerance_, 0.01f * minCell) + 4e-7f * maxAbs;
+    // Group boxes are padded by the margin plus a thousandth of the cell diagonal against
+    // rounding in the slab test; their frames leave room for twice that.
+    framePad_ = 2.0f * (margin_ + 1e-3f * cellSize_.length());
+    frameStep_ = (cellSize_ + Vec3(2.0f * framePad_, 2.0f * framePad_, 2.0f * framePad_)) *
+                 (1.0f / 255.0f);
     insertAll(prims);
     return true;
 }
@@ -428,7 +433,7 @@ void Grid::finalize() {
             }
             if (!tris.empty()) {
                 int64_t z = int64_t(c / size_t(nx_ * ny_)), rem = int64_t(c % size_t(nx_ * ny_));
-                groupCell(tris, cellBox(rem % nx_, rem / nx_, z));
+                groupCell(tris, rem % nx_, rem / nx_, z);
             }
             items_.insert(items_.end(), others.begin(), others.end());
         }
@@ -465,7 +470,7 @@ void Grid::finalize() {
 }
 
 
-void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
+void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z) {
     // The packets holding the cell's triangles, each with the box of those triangles.
     std::vector<std::pair<uint32_t, uint32_t>> byPacket;
     byPacket.reserve(tris.size());
@@ -502,10 +507,17 @@ void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
         return;
     }
     // Boxes are clipped to the cell (a hit is always found in the cell that holds its point)
-    // and padded beyond the cell margin against rounding in the slab test.
-    float pad = margin_ + 1e-3f * cell.extent().length();
-    Vec3 vpad(pad, pad, pad);
-    BBox clip(cell.min - vpad, cell.max + vpad);
+    // and padded beyond the cell margin against rounding in the slab test, then stored in
+    // steps of the cell's frame, rounded outwards by one step more (the frame holds the clip
+    // box, so clamping to it keeps every box whole).
+    const BBox cell = cellBox(x, y, z);
+    const float pad = 0.5f * framePad_;
+    const Vec3 frame = frameOrigin(x, y, z);
+    auto quantise = [&](float v, int a, bool up) {
+        double q = (double(v) - double(frame[a])) / double(frameStep_[a]);
+        q = up ? std::ceil(q) + 1.0 : std::floor(q) - 1.0;
+        return uint8_t(q >= 0.0 ? (q <= 255.0 ? q : 255.0) : 0.0);
+    };
     uint32_t first = uint32_t(groups_.size());
     for (size_t g = 0; g < groupCount; ++g) {
         PacketGroup group;
@@ -514,8 +526,8 @@ void Grid::groupCell(std::vector<uint32_t> &tris, const BBox &cell) {
         for (uint32_t j = 0; j < 4; ++j) {
             const auto &[p, b] = used[4 * g + std::min(j, group.count - 1)];
             for (int a = 0; a < 3; ++a) {
-                group.lo[a][j] = std::max(b.min[a] - pad, clip.min[a]);
-                group.hi[a][j] = std::min(b.max[a] + pad, clip.max[a]);
+                group.lo[a][j] = quantise(std::max(b.min[a] - pad, cell.min[a] - pad), a, false);
+                group.hi[a][j] = quantise(std::min(b.max[a] + pad, cell.max[a] + pad), a, true);
             }
             group.packet[j] = p;
         }
@@ -678,11 +690,26 @@ inline void prefetchPacket(const PrimitiveStore &store, uint32_t k) {
 }
 
 // Lanes of the group whose box the ray passes through between 0 and the limit, and the
-// distances at which it enters them.
-inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit, float4 &tnear) {
-    float4 t0x = (float4::load(g.lo[0]) - r.ox) * r.ix, t1x = (float4::load(g.hi[0]) - r.ox) * r.ix;
-    float4 t0y = (float4::load(g.lo[1]) - r.oy) * r.iy, t1y = (float4::load(g.hi[1]) - r.oy) * r.iy;
-    float4 t0z = (float4::load(g.lo[2]) - r.oz) * r.iz, t1z = (float4::load(g.hi[2]) - r.oz) * r.iz;
+// distances at which it enters them. Box planes lie at q * step + frame along each axis: the
+// ray meets them at q * a + b with a = step / d and b = (frame - o) / d.
+struct GroupFrame {
+    float4 ax, ay, az, bx, by, bz;
+};
+
+inline int groupMask(const PacketGroup &g, const GroupFrame &f, float limit, float4 &tnear) {
+    const __m128i zero = _mm_setzero_si128();
+    // lo x, y, z, hi x in the first 16 bytes; hi y, z in the next 8.
+    __m128i v0 = _mm_load_si128(reinterpret_cast<const __m128i *>(&g));
+    __m128i v1 = _mm_loadl_epi64(reinterpret_cast<const __m128i *>(&g.hi[1][0]));
+    __m128i w0 = _mm_unpacklo_epi8(v0, zero), w1 = _mm_unpackhi_epi8(v0, zero);
+    __m128i w2 = _mm_unpacklo_epi8(v1, zero);
+    auto lanes = [&](__m128i w, bool high) {
+        return float4(_mm_cvtepi32_ps(high ? _mm_unpackhi_epi16(w, zero)
+                                           : _mm_unpacklo_epi16(w, zero)));
+    };
+    float4 t0x = lanes(w0, false) * f.ax + f.bx, t0y = lanes(w0, true) * f.ay + f.by;
+    float4 t0z = lanes(w1, false) * f.az + f.bz, t1x = lanes(w1, true) * f.ax + f.bx;
+    float4 t1y = lanes(w2, false) * f.ay + f.by, t1z = lanes(w2, true) * f.az + f.bz;
     tnear = _mm_max_ps(_mm_max_ps(_mm_min_ps(t0x, t1x), _mm_min_ps(t0y, t1y)),
                        _mm_max_ps(_mm_min_ps(t0z, t1z), float4::zero()));
     float4 tfar = _mm_min_ps(_mm_min_ps(_mm_max_ps(t0x, t1x), _mm_max_ps(t0y, t1y)),
@@ -693,22 +720,25 @@ inline int groupMask(const PacketGroup &g, const TraceRay &r, float limit, float
 }  // namespace
 
 template <bool kAny>
-bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s) const {
+bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s,
+                      const Vec3 &frame) const {
     const PacketGroup *g = groups_.data() + index;
-    // Most cells have several groups: fetch the next two headers before the first arrives.
-    for (int i = 0; i < 3; ++i) {
-        __builtin_prefetch(g + i);
-        __builtin_prefetch(reinterpret_cast<const char *>(g + i) + 64);
-    }
+    // Most cells have several groups: fetch the lines of the next two before the first arrives.
+    const char *bytes = reinterpret_cast<const char *>(g);
+    __builtin_prefetch(bytes);
+    __builtin_prefetch(bytes + 64);
+    __builtin_prefetch(bytes + 128);
     uint32_t n = g->run;
-    for (uint32_t i = 3; i < n; ++i) {
-        __builtin_prefetch(g + i);
-        __builtin_prefetch(reinterpret_cast<const char *>(g + i) + 64);
-    }
+    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    GroupFrame f;
+    f.ax = float4(frameStep_.x) * r.ix, f.ay = float4(frameStep_.y) * r.iy;
+    f.az = float4(frameStep_.z) * r.iz;
+    f.bx = (float4(frame.x) - r.ox) * r.ix, f.by = (float4(frame.y) - r.oy) * r.iy;
+    f.bz = (float4(frame.z) - r.oz) * r.iz;
     bool hit = false;
     for (; n > 0; --n, ++g) {
         float4 tnear;
-        int mask = groupMask(*g, r, s.limit, tnear);
+        int mask = groupMask(*g, f, s.limit, tnear);
         // Start fetching every packet the ray may test, so their misses overlap.
         for (int m = mask; m; m &= m - 1) prefetchPacket(*store_, g->packet[__builtin_ctz(m)]);
         while (mask) {
@@ -727,7 +757,7 @@ bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s) const {
 
 template <bool kAny>
 bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
-                     const uint32_t *last) const {
+                     const uint32_t *last, const Vec3 &frame) const {
     bool hit = false;
     for (const uint32_t *k = first; k != last; ++k) {
         uint32_t code = *k;
@@ -741,7 +771,7 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 break;
             }
             case kItemGroup: {
-                if (testGroups<kAny>(index, r, s)) {
+                if (testGroups<kAny>(index, r, s, frame)) {
                     if constexpr (kAny) return true;
                     hit = true;
                 }
@@ -916,7 +946,9 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                         __builtin_prefetch(p + 64);
                     }
                 }
-            if (testItems<kAny>(r, s, first, last)) {
+            if (testItems<kAny>(r, s, first, last,
+                                frameOrigin(next[0] - ahead[0], next[1] - ahead[1],
+                                            next[2] - ahead[2]))) {
                 if constexpr (kAny) return true;
                 found = true;
             }

@@ -28,15 +28,17 @@ enum ItemKind : uint32_t {
 
 /// Up to four packets with the boxes of the cell's triangles in them (clipped to the cell),
 /// tested together so that a ray only runs the triangle kernel on packets whose box it passes
-/// through. A cell's groups follow each other; the first one's `run` counts them. Two cache lines.
-struct alignas(64) PacketGroup {
-    float lo[3][4];
-    float hi[3][4];
+/// through. The boxes are stored in 1/255 steps of the cell's frame (the cell grown by the
+/// grid's frame pad), rounded outwards by one more step. A cell's groups follow each other; the
+/// first one's `run` counts them. Three groups to two cache lines.
+struct alignas(16) PacketGroup {
+    uint8_t lo[3][4];  ///< Per axis, per packet.
+    uint8_t hi[3][4];
     uint32_t packet[4] = {0, 0, 0, 0};  ///< Packet indexes.
-    uint32_t count = 0;                 ///< Number of packets (1 to 4).
     uint32_t run = 1;                   ///< Groups of the cell from this one on.
-    uint32_t reserved[2] = {0, 0};
+    uint32_t count = 0;                 ///< Number of packets (1 to 4).
 };
+static_assert(sizeof(PacketGroup) == 48, "three groups to two cache lines");
 constexpr uint32_t kItemIndexBits = 29;
 constexpr uint32_t kItemIndexMask = (1u << kItemIndexBits) - 1u;
 /// Largest number of primitives of one kind a store can address.
@@ -175,12 +177,19 @@ private:
     void refine();
     void finalize();
     int64_t cellCoord(float v, int axis) const;
-    void groupCell(std::vector<uint32_t> &tris, const BBox &cell);
+    void groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z);
+    /// Lower corner of the frame of cell (x, y, z) in which its groups' boxes are stored.
+    Vec3 frameOrigin(int64_t x, int64_t y, int64_t z) const {
+        return {box_.min.x + float(x) * cellSize_.x - framePad_,
+                box_.min.y + float(y) * cellSize_.y - framePad_,
+                box_.min.z + float(z) * cellSize_.z - framePad_};
+    }
     template <bool kAny>
-    bool testGroups(uint32_t index, const TraceRay &ray, TraceState &state) const;
+    bool testGroups(uint32_t index, const TraceRay &ray, TraceState &state,
+                    const Vec3 &frame) const;
     template <bool kAny>
     bool testItems(const TraceRay &ray, TraceState &state, const uint32_t *first,
-                   const uint32_t *last) const;
+                   const uint32_t *last, const Vec3 &frame) const;
 
     const PrimitiveStore *store_ = nullptr;
     GridParams params_;
@@ -189,6 +198,8 @@ private:
     Vec3 cellSize_, invCellSize_;
     float tolerance_ = 0.001f;
     float margin_ = 0.0f;
+    float framePad_ = 0.0f;  ///< Frames of group boxes: the cell grown by this on every side.
+    Vec3 frameStep_;         ///< One 1/255 step of a frame per axis.
     BBox box_;
     // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
     // the cell's item count followed by its codes (most cells reach their data without the
