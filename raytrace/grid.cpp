@@ -736,6 +736,41 @@ bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s,
     f.bx = (float4(frame.x) - r.ox) * r.ix, f.by = (float4(frame.y) - r.oy) * r.iy;
     f.bz = (float4(frame.z) - r.oz) * r.iz;
     bool hit = false;
+    if constexpr (!kAny) {
+        // Closest hit: the boxes the ray passes through, nearest first; a hit ends the cell's
+        // tests at the first box entered beyond it.
+        constexpr uint32_t kMaxCandidates = 16;
+        if (n * 4 <= kMaxCandidates) {
+            alignas(16) float tn[kMaxCandidates];
+            uint32_t packet[kMaxCandidates], count = 0;
+            for (; n > 0; --n, ++g) {
+                float4 tnear;
+                int mask = groupMask(*g, f, s.limit, tnear);
+                _mm_storeu_ps(tn + count, tnear);
+                // Keep the lanes passed through, in place (a kept lane never moves up), and start
+                // fetching their packets, so that the misses overlap.
+                uint32_t kept = count;
+                for (int m = mask; m; m &= m - 1) {
+                    int lane = __builtin_ctz(m);
+                    prefetchPacket(*store_, g->packet[lane]);
+                    tn[kept] = tn[count + uint32_t(lane)];
+                    packet[kept++] = g->packet[lane];
+                }
+                count = kept;
+            }
+            while (count) {
+                uint32_t best = 0;
+                for (uint32_t i = 1; i < count; ++i)
+                    if (tn[i] < tn[best]) best = i;
+                if (!(tn[best] <= s.limit)) break;
+                uint32_t k = packet[best];
+                --count;
+                tn[best] = tn[count], packet[best] = packet[count];
+                if (testPacket<false>(*store_, k, r, s)) hit = true;
+            }
+            return hit;
+        }
+    }
     for (; n > 0; --n, ++g) {
         float4 tnear;
         int mask = groupMask(*g, f, s.limit, tnear);
