@@ -427,6 +427,7 @@ void Grid::finalize() {
     stats_ = GridStats();
     stats_.voxels = ncells;
     std::vector<uint32_t> tris, others;
+    GroupScratch scratch;
     for (size_t c = 0; c < ncells; ++c) {
         cellBegin[c] = uint32_t(items_.size());
         uint64_t elements = 0;
@@ -446,7 +447,7 @@ void Grid::finalize() {
             }
             if (!tris.empty()) {
                 int64_t z = int64_t(c / size_t(nx_ * ny_)), rem = int64_t(c % size_t(nx_ * ny_));
-                groupCell(tris, rem % nx_, rem / nx_, z);
+                groupCell(tris, rem % nx_, rem / nx_, z, scratch);
             }
             items_.insert(items_.end(), others.begin(), others.end());
         }
@@ -483,13 +484,15 @@ void Grid::finalize() {
 }
 
 
-void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z) {
+void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z,
+                     GroupScratch &scratch) {
     // The packets holding the cell's triangles, each with the box of those triangles.
-    std::vector<std::pair<uint32_t, uint32_t>> byPacket;
-    byPacket.reserve(tris.size());
+    auto &byPacket = scratch.byPacket;
+    byPacket.clear();
     for (uint32_t t : tris) byPacket.emplace_back(t >> 2, t);
     std::sort(byPacket.begin(), byPacket.end());
-    std::vector<std::pair<uint32_t, BBox>> used;
+    auto &used = scratch.used;
+    used.clear();
     for (const auto &[p, t] : byPacket) {
         const IntersectTriangle &tri = store_->triangles[t];
         const Vec3 p1 = tri.p0 + tri.e1, p2 = tri.p0 + tri.e2;
@@ -596,17 +599,20 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                 }
     }
     // Empty cells' words: each octant's side rounded down to a coded one.
+    uint8_t codeOf[256];
+    for (uint32_t side = 0; side < 256; ++side) {
+        uint32_t code = kEmptyAhead;
+        if (side != kAhead) {
+            code = 0;
+            while (code + 1 < kEmptyAhead && kCubeSide[code + 1] <= side) ++code;
+        }
+        codeOf[side] = uint8_t(code);
+    }
     for (size_t c = 0; c < ncells; ++c) {
         if (occupied[c]) continue;
         uint32_t word = 0;
-        for (int octant = 0; octant < 8; ++octant) {
-            uint32_t side = distance[size_t(octant) * ncells + c], code = kEmptyAhead;
-            if (side != kAhead) {
-                code = 0;
-                while (code + 1 < kEmptyAhead && kCubeSide[code + 1] <= side) ++code;
-            }
-            word |= code << (3 * octant);
-        }
+        for (int octant = 0; octant < 8; ++octant)
+            word |= uint32_t(codeOf[distance[size_t(octant) * ncells + c]]) << (3 * octant);
         cells_[c] = itemCode(kItemEmpty, word);
     }
 }

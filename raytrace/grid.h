@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "core/types.h"
@@ -177,7 +178,13 @@ private:
     void refine();
     void finalize();
     int64_t cellCoord(float v, int axis) const;
-    void groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z);
+    /// Build-time lists groupCell reuses from cell to cell.
+    struct GroupScratch {
+        std::vector<std::pair<uint32_t, uint32_t>> byPacket;
+        std::vector<std::pair<uint32_t, BBox>> used;
+    };
+    void groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z,
+                   GroupScratch &scratch);
     /// Lower corner of the frame of cell (x, y, z) in which its groups' boxes are stored.
     Vec3 frameOrigin(int64_t x, int64_t y, int64_t z) const {
         return {box_.min.x + float(x) * cellSize_.x - framePad_,
