@@ -159,8 +159,11 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
         }
     };
     // Position in cell units along an axis, clamped (NaN to 0) before any integer conversion.
+    const double scale[3] = {ext.x > 0.0f ? cells[0] / ext.x : 0.0,
+                             ext.y > 0.0f ? cells[1] / ext.y : 0.0,
+                             ext.z > 0.0f ? cells[2] / ext.z : 0.0};
     auto unit = [&](float v, int a) {
-        double f = ext[a] > 0.0f ? (double(v) - box.min[a]) / ext[a] * cells[a] : 0.0;
+        double f = (double(v) - box.min[a]) * scale[a];
         return f >= 0.0 ? (f < cells[a] ? f : cells[a] - 0.5) : 0.0;
     };
     std::vector<Keyed> keyed(n);
@@ -564,39 +567,49 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
     const int64_t n[3] = {nx_, ny_, nz_};
     for (int octant = 0; octant < 8; ++octant) {
         uint8_t *d = distance.data() + size_t(octant) * ncells;
-        int64_t s[3], start[3], stride[3] = {1, nx_, nx_ * ny_};
+        int64_t s[3], start[3];
         for (int a = 0; a < 3; ++a) {
             s[a] = (octant >> a & 1) ? -1 : 1;
             start[a] = s[a] > 0 ? n[a] - 1 : 0;
         }
-        int64_t offset[8];
-        for (int m = 0; m < 8; ++m)
-            offset[m] = ((m & 1) ? s[0] * stride[0] : 0) + ((m & 2) ? s[1] * stride[1] : 0) +
-                        ((m & 4) ? s[2] * stride[2] : 0);
+        // Row by row: first the smallest of the six neighbours in the rows ahead (y, z or both
+        // one on), at x and at x one on, over the whole row at once; then along the row
+        // against its direction, the neighbour ahead in the row itself.
+        std::vector<uint8_t> ahead(static_cast<size_t>(nx_));
+        std::vector<uint8_t> none(static_cast<size_t>(nx_), static_cast<uint8_t>(kAhead));
+        const int64_t sx = s[0];
         for (int64_t z = start[2]; z >= 0 && z < nz_; z -= s[2])
-            for (int64_t y = start[1]; y >= 0 && y < ny_; y -= s[1])
-                for (int64_t x = start[0]; x >= 0 && x < nx_; x -= s[0]) {
-                    size_t c = size_t((z * ny_ + y) * nx_ + x);
-                    if (occupied[c]) {
-                        d[c] = 0;
-                        continue;
-                    }
-                    // Neighbours ahead on each axis, or none beyond the grid.
-                    bool in[3] = {x + s[0] >= 0 && x + s[0] < nx_, y + s[1] >= 0 && y + s[1] < ny_,
-                                  z + s[2] >= 0 && z + s[2] < nz_};
-                    uint32_t best = kAhead;
-                    if (in[0] && in[1] && in[2]) {
-                        for (int m = 1; m < 8; ++m)
-                            best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
+            for (int64_t y = start[1]; y >= 0 && y < ny_; y -= s[1]) {
+                const bool inY = y + s[1] >= 0 && y + s[1] < ny_;
+                const bool inZ = z + s[2] >= 0 && z + s[2] < nz_;
+                auto row = [&](int64_t yy, int64_t zz) { return d + size_t((zz * ny_ + yy) * nx_); };
+                const uint8_t *rows[3] = {inY ? row(y + s[1], z) : none.data(),
+                                          inZ ? row(y, z + s[2]) : none.data(),
+                                          inY && inZ ? row(y + s[1], z + s[2]) : none.data()};
+                uint8_t *m = ahead.data();
+                for (int64_t x = 0; x < nx_; ++x)
+                    m[x] = std::min({rows[0][x], rows[1][x], rows[2][x]});
+                // x one on along the ray (none beyond the row's end).
+                for (int k = 0; k < 3; ++k) {
+                    if (sx > 0) {
+                        for (int64_t x = 0; x + 1 < nx_; ++x)
+                            m[x] = std::min(m[x], rows[k][x + 1]);
                     } else {
-                        for (int m = 1; m < 8; ++m)
-                            if (!((m & 1) && !in[0]) && !((m & 2) && !in[1]) &&
-                                !((m & 4) && !in[2]))
-                                best = std::min<uint32_t>(best, d[size_t(int64_t(c) + offset[m])]);
+                        for (int64_t x = nx_ - 1; x > 0; --x) m[x] = std::min(m[x], rows[k][x - 1]);
                     }
-                    d[c] = uint8_t(best == kAhead ? kAhead
-                                                  : std::min<uint32_t>(best + 1, kAhead - 1));
                 }
+                uint8_t *out = row(y, z);
+                const uint32_t *occ = occupied.data() + size_t((z * ny_ + y) * nx_);
+                uint32_t prev = kAhead;  // the cell ahead in the row
+                for (int64_t x = start[0]; x >= 0 && x < nx_; x -= sx) {
+                    uint32_t best = std::min<uint32_t>(prev, m[x]);
+                    uint32_t v = occ[x] ? 0u
+                                        : (best == kAhead ? kAhead
+                                                          : std::min<uint32_t>(best + 1, kAhead - 1));
+                    out[x] = uint8_t(v);
+                    prev = v;
+                }
+            }
     }
     // Empty cells' words: each octant's side rounded down to a coded one.
     uint8_t codeOf[256];
