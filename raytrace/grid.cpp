@@ -182,26 +182,15 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
         keyed[i] = {morton3x21(c[0], c[1], c[2]), reach, morton3(q[0], q[1], q[2]), uint32_t(i)};
     }
     std::sort(keyed.begin(), keyed.end());
-    // Permute in place along the cycles of the order (a second store would cost as much memory
-    // again, and the time to clear its fresh pages).
+    // Gather into a second store: its reads are independent, so their misses overlap.
     std::vector<uint32_t> newIndex(n);
-    for (size_t i = 0; i < n; ++i) newIndex[keyed[i].tri] = uint32_t(i);
-    std::vector<bool> placed(n);
+    decltype(triangles) sorted(n);
     for (size_t i = 0; i < n; ++i) {
-        if (placed[i]) continue;
-        IntersectTriangle held = triangles[i];
-        size_t j = i;
-        while (true) {
-            placed[j] = true;
-            size_t from = keyed[j].tri;
-            if (from == i) {
-                triangles[j] = held;
-                break;
-            }
-            triangles[j] = triangles[from];
-            j = from;
-        }
+        if (i + 8 < n) __builtin_prefetch(&triangles[keyed[i + 8].tri]);
+        sorted[i] = triangles[keyed[i].tri];
+        newIndex[keyed[i].tri] = uint32_t(i);
     }
+    triangles.swap(sorted);
     for (uint32_t &code : codes)
         if ((code >> kItemIndexBits) == kItemTriangle)
             code = itemCode(kItemTriangle, newIndex[code & kItemIndexMask]);
