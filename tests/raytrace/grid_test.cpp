@@ -234,6 +234,40 @@ TEST(CompleteGridTest, MatchesBruteForceOverLargeEmptySpacesWithDefaultSettings)
     checkAgainstBruteForce(ins, p, 3000, 77, 100);
 }
 
+TEST(CompleteGridTest, MatchesBruteForceOnPlatesAlongCellPlanesAndPartialPackets) {
+    // Square plates in the planes z = k / 4 and x = k / 4 (on cell planes of the grid and of its
+    // nested grids, where the packed boxes are clipped and stored in steps of the cell), rays
+    // along the axes among them, and 1 to 3 loose triangles so that the last packet of four is
+    // incomplete.
+    for (uint32_t loose : {1u, 2u, 3u}) {
+        SCOPED_TRACE(::testing::Message() << "loose " << loose);
+        Mesh m;
+        auto quad = [&](Vec3 a, Vec3 b, Vec3 c, Vec3 d) {
+            uint32_t base = uint32_t(m.positions.size());
+            m.positions.insert(m.positions.end(), {a, b, c, d});
+            m.indices.insert(m.indices.end(), {base, base + 1, base + 2, base, base + 2, base + 3});
+        };
+        for (int k = 0; k <= 8; ++k) {
+            float w = float(k) * 0.25f;
+            quad({0, 0, w}, {2, 0, w}, {2, 2, w}, {0, 2, w});
+            quad({w, 0, 0}, {w, 0, 2}, {w, 2, 2}, {w, 2, 0});
+        }
+        for (uint32_t i = 0; i < loose; ++i) {
+            uint32_t base = uint32_t(m.positions.size());
+            float f = 0.3f + 0.5f * float(i);
+            m.positions.insert(m.positions.end(), {{f, 0.1f, 0.1f}, {f, 1.9f, 0.2f}, {f, 1.0f, 1.9f}});
+            m.indices.insert(m.indices.end(), {base, base + 1, base + 2});
+        }
+        ASSERT_EQ(m.triangleCount() % 4, (36 + loose) % 4);
+        for (uint32_t depth : {0u, 2u}) {
+            ADSParameters p;
+            p.gridMaxDepth = depth;
+            p.gridThreshold = 3;
+            checkAgainstBruteForce({instanceOf(m, 0, Mtx4(), kAllFlags, 0)}, p, 1200, 11 + loose);
+        }
+    }
+}
+
 TEST(CompleteGridTest, MatchesBruteForceWithInstancesCopiedOrInstanced) {
     Mesh blob = testmesh::blob(30, 36), coil = testmesh::coil(80, 10, 0.5f);
     std::vector<InstanceInput> ins;
