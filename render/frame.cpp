@@ -1,10 +1,86 @@
 #include "render/frame.h"
 
+#include <algorithm>
+#include <new>
 #include <vector>
 
 #include "core/message.h"
 
 namespace ox {
+
+// --- Scratch memory --------------------------------------------------------------------------
+
+namespace {
+
+constexpr std::align_val_t kScratchAlign{64};
+
+}  // namespace
+
+ScratchBlock &ScratchBlock::operator=(ScratchBlock &&o) noexcept {
+    if (this != &o) {
+        reset();
+        pool_ = o.pool_, data_ = o.data_, bytes_ = o.bytes_;
+        o.pool_ = nullptr, o.data_ = nullptr, o.bytes_ = 0;
+    }
+    return *this;
+}
+
+void ScratchBlock::reset() {
+    if (data_) pool_->giveBack(data_, bytes_);
+    pool_ = nullptr, data_ = nullptr, bytes_ = 0;
+}
+
+ScratchBlock ScratchPool::borrow(size_t bytes) {
+    ScratchBlock block;
+    if (bytes == 0) bytes = 1;
+    {
+        std::lock_guard<std::mutex> lock(mutex_);
+        // The smallest kept block that fits, unless it is so much larger that a later, larger
+        // request would miss it.
+        auto best = kept_.end();
+        for (auto it = kept_.begin(); it != kept_.end(); ++it)
+            if (it->bytes >= bytes && it->bytes / 4 <= bytes &&
+                (best == kept_.end() || it->bytes < best->bytes))
+                best = it;
+        if (best != kept_.end()) {
+            block.pool_ = this, block.data_ = best->data, block.bytes_ = best->bytes;
+            kept_.erase(best);
+            return block;
+        }
+    }
+    void *data = ::operator new(bytes, kScratchAlign, std::nothrow);
+    if (data) block.pool_ = this, block.data_ = data, block.bytes_ = bytes;
+    return block;
+}
+
+void ScratchPool::giveBack(void *data, size_t bytes) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    if (kept_.size() >= kKeptBlocks) {
+        // The smallest block goes: it is the cheapest to make again.
+        auto smallest = std::min_element(
+            kept_.begin(), kept_.end(), [](const Kept &a, const Kept &b) { return a.bytes < b.bytes; });
+        if (smallest->bytes >= bytes) {
+            ::operator delete(data, kScratchAlign);
+            return;
+        }
+        ::operator delete(smallest->data, kScratchAlign);
+        kept_.erase(smallest);
+    }
+    kept_.push_back({data, bytes});
+}
+
+void ScratchPool::release() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    for (const Kept &k : kept_) ::operator delete(k.data, kScratchAlign);
+    kept_.clear();
+}
+
+size_t ScratchPool::keptBytes() const {
+    std::lock_guard<std::mutex> lock(mutex_);
+    size_t total = 0;
+    for (const Kept &k : kept_) total += k.bytes;
+    return total;
+}
 
 bool Frame::addLayer(std::unique_ptr<Layer> layer) {
     if (!layer) return false;

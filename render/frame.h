@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <map>
 #include <memory>
+#include <mutex>
 #include <string>
 #include <vector>
 
@@ -13,6 +14,67 @@
 /// The frame: a set of named layers of one size that renders and bakes fill, filters
 /// transform and writers store.
 namespace ox {
+
+class ScratchPool;
+
+/// A block of memory borrowed from a ScratchPool (contents undefined until written); it goes
+/// back to its pool when destroyed.
+class ScratchBlock {
+public:
+    ScratchBlock() = default;
+    ~ScratchBlock() { reset(); }
+    ScratchBlock(ScratchBlock &&o) noexcept { *this = std::move(o); }
+    ScratchBlock &operator=(ScratchBlock &&o) noexcept;
+    ScratchBlock(const ScratchBlock &) = delete;
+    ScratchBlock &operator=(const ScratchBlock &) = delete;
+
+    /// The block as an array of T (64-byte aligned); null when empty.
+    template <typename T>
+    T *as() const {
+        return static_cast<T *>(data_);
+    }
+    /// The size in bytes.
+    size_t bytes() const { return bytes_; }
+    /// Gives the block back now.
+    void reset();
+
+private:
+    friend class ScratchPool;
+    ScratchPool *pool_ = nullptr;
+    void *data_ = nullptr;
+    size_t bytes_ = 0;
+};
+
+/// Memory that the commands working on a frame borrow and give back, so that one filter after
+/// another (and one pass after another) reuses pages instead of faulting in and zero-filling
+/// fresh ones. Thread-safe. Blocks borrowed must be given back before the pool is destroyed.
+class ScratchPool {
+public:
+    ScratchPool() = default;
+    ~ScratchPool() { release(); }
+    ScratchPool(const ScratchPool &) = delete;
+    ScratchPool &operator=(const ScratchPool &) = delete;
+
+    /// A block of at least `bytes` bytes; empty (as<T>() null) when the memory cannot be had.
+    ScratchBlock borrow(size_t bytes);
+    /// Frees the blocks kept for reuse.
+    void release();
+    /// The bytes kept for reuse.
+    size_t keptBytes() const;
+    /// The most blocks kept for reuse.
+    static constexpr size_t kKeptBlocks = 16;
+
+private:
+    friend class ScratchBlock;
+    struct Kept {
+        void *data;
+        size_t bytes;
+    };
+    void giveBack(void *data, size_t bytes);
+
+    mutable std::mutex mutex_;
+    std::vector<Kept> kept_;
+};
 
 /// A set of named layers of equal size, ordered by name (bytewise). The frame owns its layers
 /// until they are detached. The layer map itself is not locked: add, delete, detach and
@@ -89,6 +151,8 @@ public:
     size_t retiredLayerCount() const { return retired_.size(); }
     /// The most retired layers a frame keeps.
     static constexpr size_t kRetiredLayers = 1;
+    /// The scratch memory of commands working on this frame.
+    ScratchPool &scratch() { return scratch_; }
     /// Removes a layer without destroying it; the caller owns the result (null when absent).
     std::unique_ptr<Layer> detachLayer(const std::string &name);
     /// Calls the layer's synchronize.
@@ -107,6 +171,7 @@ private:
     int32_t width_, height_;
     std::map<std::string, std::unique_ptr<Layer>> layers_;
     std::vector<std::unique_ptr<Layer>> retired_;  // oldest first
+    ScratchPool scratch_;
 };
 
 /// Frame utilities.

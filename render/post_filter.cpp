@@ -167,7 +167,8 @@ bool PostFilterCommand::execute(Frame &frame, RenderContext &context, RenderIOIn
                    &io);
     std::mutex failMutex;
     int32_t failX = -1, failY = -1;
-    std::vector<BandScratch> scratch(size_t(std::max(threads_, 1)));
+    std::vector<BandScratch> scratch;
+    for (int t = 0; t < std::max(threads_, 1); ++t) scratch.emplace_back(frame.scratch());
     const bool ok = bands.run([&](int32_t y0, int32_t y1, int thread) {
         int32_t fx = -1, fy = -1;
         if (filter_->filterRows(y0, y1, scratch[size_t(thread)], fx, fy)) return true;

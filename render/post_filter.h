@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <new>
 #include <string>
 #include <vector>
 
@@ -10,6 +11,7 @@
 #include "core/render_io.h"
 #include "core/types.h"
 #include "render/command.h"
+#include "render/frame.h"
 #include "render/layer.h"
 
 /// Post filters: the commands that transform a rendered or baked frame's layers before it is
@@ -43,22 +45,30 @@ namespace ox {
 /// tile is loaded once per band.
 constexpr int32_t kFilterBandRows = kLayerTileSize;
 
-/// Buffers of one thread's band work, kept from band to band so that large bands do not
-/// fault in fresh pages each time.
+/// Grows `block`, borrowed from `pool`, to hold at least n values of T (its contents are lost
+/// when it grows) and returns it. Throws std::bad_alloc when the memory cannot be had: inside
+/// a RowBands body that fails the run like a false return.
+template <typename T>
+T *scratchArray(ScratchPool &pool, ScratchBlock &block, size_t n) {
+    if (block.bytes() < n * sizeof(T)) {
+        block.reset();
+        block = pool.borrow(n * sizeof(T));
+        if (!block.as<T>()) throw std::bad_alloc();
+    }
+    return block.as<T>();
+}
+
+/// Buffers of one thread's band work, kept from band to band (and, through the frame's
+/// scratch pool, from filter to filter) so that large bands do not fault in fresh pages.
 struct BandScratch {
-    std::vector<Color> colors;
-    std::vector<float> floats;
+    explicit BandScratch(ScratchPool &p) : pool(&p) {}
+    ScratchPool *pool;
+    ScratchBlock colors, floats;
 
     /// colors sized to at least n, returned.
-    Color *colorBuffer(size_t n) {
-        if (colors.size() < n) colors.resize(n);
-        return colors.data();
-    }
+    Color *colorBuffer(size_t n) { return scratchArray<Color>(*pool, colors, n); }
     /// floats sized to at least n, returned.
-    float *floatBuffer(size_t n) {
-        if (floats.size() < n) floats.resize(n);
-        return floats.data();
-    }
+    float *floatBuffer(size_t n) { return scratchArray<float>(*pool, floats, n); }
 };
 
 /// Runs a body over bands of rows of an image on a number of threads, with progress and abort.

@@ -23,12 +23,12 @@ namespace {
 constexpr int32_t kMaxDilation = 32766;
 
 /// Row distances to the nearest covered texel of rows [y0, y1), capped at cap.
-bool rowDistances(LayerT<float> &z, int32_t y0, int32_t y1, uint16_t cap, uint16_t *dist) {
+bool rowDistances(LayerT<float> &z, int32_t y0, int32_t y1, uint16_t cap, uint16_t *dist,
+                  float *depth) {
     const int32_t w = z.width();
-    std::vector<float> depth(size_t(w) * size_t(y1 - y0));
-    if (!z.read(Region(0, y0, w, y1), depth.data())) return false;
+    if (!z.read(Region(0, y0, w, y1), depth)) return false;
     for (int32_t y = y0; y < y1; ++y) {
-        const float *zr = depth.data() + size_t(y - y0) * size_t(w);
+        const float *zr = depth + size_t(y - y0) * size_t(w);
         uint16_t *d = dist + size_t(y - y0) * size_t(w);
         int64_t last = -int64_t(cap);
         for (int32_t x = 0; x < w; ++x) {
@@ -124,35 +124,34 @@ inline int log2Floor(uint32_t v) { return 31 - __builtin_clz(v); }
 /// the texel itself, is not stored). Any run along a row or a column is then answered from two
 /// overlapping table entries.
 struct RunMaxima {
-    std::vector<std::vector<int32_t>> row, col;
+    static constexpr int kLevels = 16;
+    ScratchBlock rowBlocks[kLevels], colBlocks[kLevels];
+    int32_t *row[kLevels] = {}, *col[kLevels] = {};
 
-    void build(const float *lum, int32_t w, int32_t rows, int rowLevels, int colLevels) {
+    void build(ScratchPool &pool, const float *lum, int32_t w, int32_t rows, int rowLevels,
+               int colLevels) {
         const size_t n = size_t(w) * size_t(rows);
-        row.resize(size_t(rowLevels) + 1);
-        col.resize(size_t(colLevels) + 1);
         for (int k = 1; k <= rowLevels; ++k) {
-            std::vector<int32_t> &t = row[size_t(k)];
-            t.resize(n);
+            int32_t *t = row[k] = scratchArray<int32_t>(pool, rowBlocks[k], n);
             const int32_t half = 1 << (k - 1);
             for (int32_t y = 0; y < rows; ++y) {
                 const int32_t base = y * w;
                 for (int32_t x = 0; x + 2 * half <= w; ++x) {
-                    const int32_t a = k == 1 ? base + x : row[size_t(k - 1)][size_t(base + x)];
+                    const int32_t a = k == 1 ? base + x : row[k - 1][size_t(base + x)];
                     const int32_t b =
-                        k == 1 ? base + x + half : row[size_t(k - 1)][size_t(base + x + half)];
+                        k == 1 ? base + x + half : row[k - 1][size_t(base + x + half)];
                     t[size_t(base + x)] = lum[b] > lum[a] ? b : a;
                 }
             }
         }
         for (int k = 1; k <= colLevels; ++k) {
-            std::vector<int32_t> &t = col[size_t(k)];
-            t.resize(n);
+            int32_t *t = col[k] = scratchArray<int32_t>(pool, colBlocks[k], n);
             const int32_t half = 1 << (k - 1);
             for (int32_t y = 0; y + 2 * half <= rows; ++y)
                 for (int32_t x = 0; x < w; ++x) {
                     const int32_t i = y * w + x, j = i + half * w;
-                    const int32_t a = k == 1 ? i : col[size_t(k - 1)][size_t(i)];
-                    const int32_t b = k == 1 ? j : col[size_t(k - 1)][size_t(j)];
+                    const int32_t a = k == 1 ? i : col[k - 1][size_t(i)];
+                    const int32_t b = k == 1 ? j : col[k - 1][size_t(j)];
                     t[size_t(i)] = lum[b] > lum[a] ? b : a;
                 }
         }
@@ -163,7 +162,7 @@ struct RunMaxima {
         const int k = log2Floor(uint32_t(xb - xa + 1));
         const int32_t i = wy * w + xa, j = wy * w + xb - (1 << k) + 1;
         if (k == 0) return i;
-        const int32_t a = row[size_t(k)][size_t(i)], b = row[size_t(k)][size_t(j)];
+        const int32_t a = row[k][size_t(i)], b = row[k][size_t(j)];
         return lum[b] > lum[a] ? b : a;
     }
 
@@ -172,7 +171,7 @@ struct RunMaxima {
         const int k = log2Floor(uint32_t(yb - ya + 1));
         const int32_t i = ya * w + x, j = (yb - (1 << k) + 1) * w + x;
         if (k == 0) return i;
-        const int32_t a = col[size_t(k)][size_t(i)], b = col[size_t(k)][size_t(j)];
+        const int32_t a = col[k][size_t(i)], b = col[k][size_t(j)];
         return lum[b] > lum[a] ? b : a;
     }
 };
@@ -199,11 +198,14 @@ inline int64_t brightestOnRingFast(const RunMaxima &t, const float *lum, int32_t
 
 /// Per-thread scratch of the dilation rows.
 struct DilationScratch {
-    std::vector<uint16_t> ring;  // ring radius per texel of the band
-    std::vector<Color> rows;     // source rows of the band and its margins
-    std::vector<float> lum;      // their luminance, -infinity for background texels
-    RunMaxima runs;              // over lum, for large rings
-    std::vector<Color> out;      // result rows of the band
+    explicit DilationScratch(ScratchPool &p) : pool(&p) {}
+    ScratchPool *pool;
+    ScratchBlock ring;   // uint16_t: ring radius per texel of the band
+    ScratchBlock rows;   // Color: source rows of the band and its margins
+    ScratchBlock lum;    // float: their luminance, -infinity for background texels
+    RunMaxima runs;      // over lum, for large rings
+    ScratchBlock out;    // Color: result rows of the band
+    ScratchBlock depth;  // float: "Z" rows of a band
 };
 
 }  // namespace
@@ -242,10 +244,19 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
     }
 
     if (w == 0 || h == 0) return results.place(sources_);
-    std::vector<uint16_t> rowDist(size_t(w) * size_t(h));
+    ScratchBlock rowDistBlock = frame.scratch().borrow(size_t(w) * size_t(h) * sizeof(uint16_t));
+    uint16_t *const rowDist = rowDistBlock.as<uint16_t>();
+    if (!rowDist) {
+        message(kMsgError, 6, "Edge dilation is out of memory");
+        return false;
+    }
+    std::vector<DilationScratch> scratch;
+    for (int t = 0; t < std::max(threads_, 1); ++t) scratch.emplace_back(frame.scratch());
     RowBands distBands(h, kFilterBandRows, threads_, nullptr);
-    if (!distBands.run([&](int32_t y0, int32_t y1, int) {
-            if (rowDistances(*z, y0, y1, cap, rowDist.data() + size_t(y0) * size_t(w))) return true;
+    if (!distBands.run([&](int32_t y0, int32_t y1, int thread) {
+            DilationScratch &s = scratch[size_t(thread)];
+            float *depth = scratchArray<float>(*s.pool, s.depth, size_t(w) * size_t(y1 - y0));
+            if (rowDistances(*z, y0, y1, cap, rowDist + size_t(y0) * size_t(w), depth)) return true;
             message(kMsgError, 6, "Edge dilation could not read the Z layer");
             return false;
         }))
@@ -255,53 +266,52 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
     // Each band also reads n rows above and below it: tall bands keep that margin small.
     const int32_t bandRows = (std::max(4 * kFilterBandRows, 2 * n) + kFilterBandRows - 1) /
                              kFilterBandRows * kFilterBandRows;
-    std::vector<DilationScratch> scratch(size_t(std::max(threads_, 1)));
     RowBands bands(h, bandRows, threads_, io);
     const bool ok = bands.run([&](int32_t y0, int32_t y1, int thread) {
         DilationScratch &s = scratch[size_t(thread)];
         const size_t bandSize = size_t(w) * size_t(y1 - y0);
-        s.ring.resize(bandSize);
-        s.out.resize(bandSize);
+        uint16_t *const ring = scratchArray<uint16_t>(*s.pool, s.ring, bandSize);
+        Color *const out = scratchArray<Color>(*s.pool, s.out, bandSize);
 
         // The ring radius of every texel of the band.
         for (int32_t y = y0; y < y1; ++y) {
-            uint16_t m = ringRow(rowDist.data() + size_t(y) * size_t(w), nullptr, nullptr, 0,
-                                 s.ring.data() + size_t(y - y0) * size_t(w), w);
+            uint16_t m = ringRow(rowDist + size_t(y) * size_t(w), nullptr, nullptr, 0,
+                                 ring + size_t(y - y0) * size_t(w), w);
             for (int32_t dy = 1; dy <= n && m > dy; ++dy) {
                 const uint16_t *lo =
-                    y - dy >= 0 ? rowDist.data() + size_t(y - dy) * size_t(w) : farRow.data();
+                    y - dy >= 0 ? rowDist + size_t(y - dy) * size_t(w) : farRow.data();
                 const uint16_t *hi =
-                    y + dy < h ? rowDist.data() + size_t(y + dy) * size_t(w) : farRow.data();
+                    y + dy < h ? rowDist + size_t(y + dy) * size_t(w) : farRow.data();
                 m = ringRow(nullptr, lo, hi, uint16_t(dy),
-                            s.ring.data() + size_t(y - y0) * size_t(w), w);
+                            ring + size_t(y - y0) * size_t(w), w);
             }
         }
 
         const int32_t rowBase = std::max(0, y0 - n), rowEnd = std::min(h, y1 + n);
         const size_t window = size_t(w) * size_t(rowEnd - rowBase);
-        s.rows.resize(window);
-        s.lum.resize(window);
+        Color *const rows = scratchArray<Color>(*s.pool, s.rows, window);
+        float *const lum = scratchArray<float>(*s.pool, s.lum, window);
         // Only covered texels can win; the ring's radius is known, so no other test is needed.
         const float never = -std::numeric_limits<float>::infinity();
-        const uint16_t *windowDist = rowDist.data() + size_t(rowBase) * size_t(w);
+        const uint16_t *windowDist = rowDist + size_t(rowBase) * size_t(w);
         for (size_t l = 0; l < sources.size(); ++l) {
-            if (!sources[l]->read(Region(0, rowBase, w, rowEnd), s.rows.data())) {
+            if (!sources[l]->read(Region(0, rowBase, w, rowEnd), rows)) {
                 message(kMsgError, 6, "Edge dilation could not read layer %s", sources_[l].c_str());
                 return false;
             }
             for (size_t i = 0; i < window; ++i) {
-                const float v = s.rows[i].luminance();
+                const float v = rows[i].luminance();
                 // A NaN or lowest luminance never beats the starting value either.
-                s.lum[i] = windowDist[i] == 0 && v > -3.4028235e38f ? v : never;
+                lum[i] = windowDist[i] == 0 && v > -3.4028235e38f ? v : never;
             }
             const bool fast = n > kDirectScanMax;
             if (fast)
-                s.runs.build(s.lum.data(), w, rowEnd - rowBase, log2Floor(uint32_t(2 * n - 1)),
+                s.runs.build(*s.pool, lum, w, rowEnd - rowBase, log2Floor(uint32_t(2 * n - 1)),
                              log2Floor(uint32_t(2 * n + 1)));
             for (int32_t y = y0; y < y1; ++y) {
-                const uint16_t *d = s.ring.data() + size_t(y - y0) * size_t(w);
-                const Color *src = s.rows.data() + size_t(y - rowBase) * size_t(w);
-                Color *dst = s.out.data() + size_t(y - y0) * size_t(w);
+                const uint16_t *d = ring + size_t(y - y0) * size_t(w);
+                const Color *src = rows + size_t(y - rowBase) * size_t(w);
+                Color *dst = out + size_t(y - y0) * size_t(w);
                 for (int32_t x = 0; x < w; ++x) {
                     const int32_t r = d[x];
                     if (r == 0) {
@@ -310,12 +320,12 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                     }
                     const int64_t win =
                         r > n  ? -1
-                        : fast ? brightestOnRingFast(s.runs, s.lum.data(), rowBase, w, h, x, y, r)
-                               : brightestOnRing(s.lum.data(), rowBase, w, h, x, y, r);
-                    dst[x] = win < 0 ? background_ : s.rows[size_t(win)];
+                        : fast ? brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r)
+                               : brightestOnRing(lum, rowBase, w, h, x, y, r);
+                    dst[x] = win < 0 ? background_ : rows[size_t(win)];
                 }
             }
-            if (!outputs[l]->paste(Region(0, y0, w, y1), s.out.data())) {
+            if (!outputs[l]->paste(Region(0, y0, w, y1), out)) {
                 message(kMsgError, 6, "Edge dilation could not write layer %s",
                         outputs[l]->name().c_str());
                 return false;

@@ -82,13 +82,19 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     // Gather: per thread ranges, the instance of every texel, texels without one per band.
     const int32_t bandRows = kFilterBandRows;
     const int32_t bandCount = (h + bandRows - 1) / bandRows;
-    std::vector<int32_t> ids(size_t(w) * size_t(h), count);
+    ScratchBlock idBlock = frame.scratch().borrow(size_t(w) * size_t(h) * sizeof(int32_t));
+    int32_t *const ids = idBlock.as<int32_t>();
+    if (!ids) {
+        message(kMsgError, 6, "Shape normalization of %s is out of memory", source_.c_str());
+        return false;
+    }
     const int threads = std::max(threads_, 1);
     std::vector<std::vector<Range>> ranges(size_t(threads),
                                            std::vector<Range>(size_t(slots) * size_t(comps)));
     std::vector<std::vector<std::pair<int32_t, int32_t>>> orphans(static_cast<size_t>(bandCount));
     std::vector<int64_t> orphanCounts(size_t(bandCount), 0);
-    std::vector<BandScratch> scratch(static_cast<size_t>(threads));
+    std::vector<BandScratch> scratch;
+    for (int t = 0; t < threads; ++t) scratch.emplace_back(frame.scratch());
     RowBands gather(h, bandRows, threads, nullptr);
     const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
         const Region rows(0, y0, w, y1);
@@ -101,8 +107,11 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         std::vector<Range> &acc = ranges[size_t(thread)];
         const int32_t band = y0 / bandRows;
         for (int32_t y = y0; y < y1; ++y) {
-            int32_t *id = ids.data() + size_t(y) * size_t(w);
-            if (instances_) instances_->instancesOfRow(y, w, id);
+            int32_t *id = ids + size_t(y) * size_t(w);
+            if (instances_)
+                instances_->instancesOfRow(y, w, id);
+            else
+                std::fill(id, id + w, count);
             for (int32_t x = 0; x < w; ++x) {
                 const size_t i = size_t(y - y0) * size_t(w) + size_t(x);
                 if (z && !(depth[i] >= 0.0f)) {
@@ -196,7 +205,7 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
             message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
         }
-        const int32_t *id = ids.data() + size_t(y0) * size_t(w);
+        const int32_t *id = ids + size_t(y0) * size_t(w);
         for (size_t i = 0; i < n; ++i) {
             if (id[i] < 0) continue;
             const Remap *m = remaps.data() + size_t(id[i]) * 4;

@@ -168,7 +168,8 @@ bool RangeRemapFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch, 
 }
 
 bool RangeRemapFilter::filterPixel(int32_t x, int32_t y) {
-    BandScratch scratch;
+    ScratchPool pool;
+    BandScratch scratch(pool);
     int32_t fx, fy;
     return filterRows(y, y + 1, scratch, fx, fy);  // one texel costs as much as its row here
 }
