@@ -137,11 +137,44 @@ private:
     std::vector<LayerObserver *> observers_;
 };
 
+/// A layer's pixels in place, in tiles of tileWidth x tileHeight stored one after another in
+/// row-major tile order, each tile row-major inside.
+template <typename T>
+struct TileGrid {
+    T *base = nullptr;
+    int32_t tileWidth = 0, tileHeight = 0;
+    uint32_t tilesPerRow = 0;
+
+    /// The first pixel of tile (tx, ty); its rows lie tileWidth elements apart.
+    T *tile(uint32_t tx, uint32_t ty) const {
+        return base + (uint64_t(ty) * tilesPerRow + tx) * uint64_t(tileWidth) * uint64_t(tileHeight);
+    }
+    /// Pixel (x, y); the pixels of its row up to the tile's right edge follow it.
+    T *pixel(int32_t x, int32_t y) const {
+        return tile(uint32_t(x / tileWidth), uint32_t(y / tileHeight)) +
+               int64_t(y % tileHeight) * tileWidth + x % tileWidth;
+    }
+    /// True when both grids cut the image the same way.
+    template <typename U>
+    bool sameTiles(const TileGrid<U> &o) const {
+        return tileWidth == o.tileWidth && tileHeight == o.tileHeight && tilesPerRow == o.tilesPerRow;
+    }
+};
+
 /// The base of the boolean, float and colour layers.
 template <typename T>
 class LayerT : public Layer {
 public:
     using Element = T;
+    /// The pixels in place, for band work that would otherwise copy every pixel out and back:
+    /// false when the layer keeps no addressable tiles. After a true return, and until the
+    /// caller is done with the grid, the layer may be used only through the grid (no paste,
+    /// no read); threads may work on disjoint pixels of it at once. Writes through the grid
+    /// notify no observer.
+    virtual bool tileGrid(TileGrid<T> &grid) {
+        (void)grid;
+        return false;
+    }
     /// Typed pasteRegion.
     bool paste(const Region &region, const T *source, int64_t stride = -1) {
         return pasteRegion(region, source, stride);

@@ -115,6 +115,14 @@ void TileStorageCacheT<T>::flush() {
 }
 
 template <typename T>
+void TileStorageCacheT<T>::evictAll() {
+    flush();
+    OXScopedLock<StdMutex> lock(mutex_);
+    for (const Entry &e : entries_) OX_CHECK(e.pins == 0);
+    entries_.clear();
+}
+
+template <typename T>
 size_t TileStorageCacheT<T>::bufferCount() const {
     OXScopedLock<StdMutex> lock(mutex_);
     return entries_.size();
@@ -200,6 +208,18 @@ template <typename T>
 bool TiledMemoryLayerT<T>::readRegion(const Region &region, void *destination, int64_t stride) {
     if (!this->checkAccess(region, destination, stride)) return false;
     copyRegion<false>(region, static_cast<T *>(destination), stride);
+    return true;
+}
+
+template <typename T>
+bool TiledMemoryLayerT<T>::tileGrid(TileGrid<T> &grid) {
+    if (!storage_ || !storage_->tileData(0, 0)) return false;
+    // Cached buffers would shadow what is written through the grid.
+    cache_->evictAll();
+    grid.base = storage_->tileData(0, 0);
+    grid.tileWidth = storage_->tileWidth();
+    grid.tileHeight = storage_->tileHeight();
+    grid.tilesPerRow = storage_->tilesPerRow();
     return true;
 }
 

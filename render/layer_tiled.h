@@ -101,6 +101,9 @@ public:
     /// Writes every cached tile marked for writing back to storage (pinned ones included: call
     /// without pastes running).
     void flush();
+    /// Writes back and forgets every cached tile, so that storage alone holds the pixels (call
+    /// without pastes or reads running).
+    void evictAll();
 
     /// Buffers held (kCapacity, or more while all were pinned at once).
     size_t bufferCount() const;
@@ -137,6 +140,7 @@ public:
                       uint64_t memoryLimit = MemoryMappedFile::kMemoryLimit);
     bool pasteRegion(const Region &region, const void *source, int64_t stride) override;
     bool readRegion(const Region &region, void *destination, int64_t stride) override;
+    bool tileGrid(TileGrid<T> &grid) override;
 
     /// The tile width in pixels.
     int32_t tileWidth() const { return storage_ ? storage_->tileWidth() : 0; }

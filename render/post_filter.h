@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -71,6 +72,33 @@ struct BandScratch {
     float *floatBuffer(size_t n) { return scratchArray<float>(*pool, floats, n); }
 };
 
+/// Hands the texels of bands of rows of a colour layer (with the same texels of an optional
+/// "Z" layer and of an optional result layer) to a body in runs along rows: straight in the
+/// layers' tiles when all of them keep addressable tiles cut the same way, else through band
+/// buffers (read, then the result pasted). Made before the bands run; until it is destroyed
+/// the layers are used only through it.
+class TexelRuns {
+public:
+    /// in: the source; out: a result layer without observers, or null; z: depths, or null.
+    TexelRuns(LayerT<Color> &in, LayerT<Color> *out, LayerT<float> *z);
+
+    /// Calls body(x, y, n, src, dst, depth) for runs of n texels of row y from x, covering
+    /// rows [y0, y1) once: src holds the source texels, dst receives their results (null
+    /// without a result layer; it may be src, so read a texel before writing it), depth their
+    /// "Z" (null without one). The runs come in no fixed order. False when a layer refused
+    /// (the caller gives the message).
+    template <typename F>
+    bool run(int32_t y0, int32_t y1, BandScratch &scratch, F &&body);
+
+private:
+    LayerT<Color> &in_;
+    LayerT<Color> *out_;
+    LayerT<float> *z_;
+    bool direct_ = false;
+    TileGrid<Color> inGrid_, outGrid_;
+    TileGrid<float> zGrid_;
+};
+
 /// Runs a body over bands of rows of an image on a number of threads, with progress and abort.
 class RowBands {
 public:
@@ -128,6 +156,40 @@ private:
     Frame &frame_;
     std::vector<Entry> entries_;
 };
+
+template <typename F>
+bool TexelRuns::run(int32_t y0, int32_t y1, BandScratch &scratch, F &&body) {
+    const int32_t w = in_.width();
+    if (direct_) {
+        // Tile by tile, so that each tile's memory is walked in one stream.
+        const int32_t tw = inGrid_.tileWidth, th = inGrid_.tileHeight;
+        for (int32_t ty = y0 / th; ty * th < y1; ++ty) {
+            const int32_t ya = std::max(y0, ty * th), yb = std::min(y1, (ty + 1) * th);
+            for (int32_t tx = 0; tx * tw < w; ++tx) {
+                const int32_t x = tx * tw, n = std::min(tw, w - x);
+                const Color *src = inGrid_.tile(uint32_t(tx), uint32_t(ty));
+                Color *dst = out_ ? outGrid_.tile(uint32_t(tx), uint32_t(ty)) : nullptr;
+                const float *depth = z_ ? zGrid_.tile(uint32_t(tx), uint32_t(ty)) : nullptr;
+                for (int32_t y = ya; y < yb; ++y) {
+                    const int64_t row = int64_t(y - ty * th) * tw;
+                    body(x, y, n, src + row, dst ? dst + row : nullptr,
+                         depth ? depth + row : nullptr);
+                }
+            }
+        }
+        return true;
+    }
+    const Region rows(0, y0, w, y1);
+    const size_t n = size_t(rows.area());
+    Color *colors = scratch.colorBuffer(n);
+    float *depth = z_ ? scratch.floatBuffer(n) : nullptr;
+    if (!in_.read(rows, colors) || (z_ && !z_->read(rows, depth))) return false;
+    for (int32_t y = y0; y < y1; ++y) {
+        const size_t row = size_t(y - y0) * size_t(w);
+        body(0, y, w, colors + row, out_ ? colors + row : nullptr, depth ? depth + row : nullptr);
+    }
+    return !out_ || out_->paste(rows, colors);
+}
 
 // ---------------------------------------------------------------------------------------------
 // Pixel filters
@@ -206,6 +268,7 @@ private:
     float threshold_;
     Color background_;
     std::vector<LayerT<Color> *> in_, out_;
+    std::vector<std::unique_ptr<TexelRuns>> runs_;
     std::unique_ptr<FilterResults> results_;
 };
 

@@ -22,18 +22,62 @@ namespace {
 /// The largest ring radius the 16-bit distances hold (signed, for the vector minima).
 constexpr int32_t kMaxDilation = 32766;
 
-/// Row distances to the nearest covered texel of rows [y0, y1), capped at cap.
-bool rowDistances(LayerT<float> &z, int32_t y0, int32_t y1, uint16_t cap, uint16_t *dist,
-                  float *depth) {
+/// The rows of a layer as runs of texels: the rows of its tiles when it keeps them
+/// addressable, else whole rows of a band buffer that the caller fills (or pastes) itself.
+template <typename T>
+class PixelRows {
+public:
+    /// Takes the layer's grid when it has one (a layer written through it must have no
+    /// observers).
+    PixelRows(LayerT<T> &layer, bool write) : width_(layer.width()), runWidth_(layer.width()) {
+        if ((!write || layer.observers().empty()) && layer.tileGrid(grid_))
+            runWidth_ = grid_.tileWidth;
+    }
+    bool direct() const { return grid_.base != nullptr; }
+    /// Goes through band buffers even when the layer has a grid.
+    void dropGrid() { grid_ = TileGrid<T>(), runWidth_ = width_; }
+    /// Without a grid: the buffer holding rows from firstRow on.
+    void bind(T *buffer, int32_t firstRow) { buffer_ = buffer, firstRow_ = firstRow; }
+    /// Texels per run: run k of a row starts at x = k * runWidth().
+    int32_t runWidth() const { return runWidth_; }
+    /// The number of texels of run k.
+    int32_t runLength(int32_t k) const { return std::min(runWidth_, width_ - k * runWidth_); }
+    /// The number of runs of a row.
+    int32_t runCount() const { return (width_ + runWidth_ - 1) / runWidth_; }
+    /// The first texel of run k of row y.
+    T *run(int32_t y, int32_t k) const {
+        if (!direct()) return buffer_ + int64_t(y - firstRow_) * width_ + int64_t(k) * runWidth_;
+        return grid_.tile(uint32_t(k), uint32_t(y / grid_.tileHeight)) +
+               int64_t(y % grid_.tileHeight) * grid_.tileWidth;
+    }
+    /// Texel (x, y).
+    T &at(int32_t x, int32_t y) const { return run(y, x / runWidth_)[x % runWidth_]; }
+
+private:
+    int32_t width_, runWidth_;
+    TileGrid<T> grid_;
+    T *buffer_ = nullptr;
+    int32_t firstRow_ = 0;
+};
+
+/// Row distances to the nearest covered texel of rows [y0, y1), capped at cap; depth is the
+/// band buffer used when the layer has no grid.
+bool rowDistances(LayerT<float> &z, PixelRows<float> zRows, int32_t y0, int32_t y1,
+                  uint16_t cap, uint16_t *dist, float *depth) {
     const int32_t w = z.width();
-    if (!z.read(Region(0, y0, w, y1), depth)) return false;
+    if (!zRows.direct()) {
+        if (!z.read(Region(0, y0, w, y1), depth)) return false;
+        zRows.bind(depth, y0);
+    }
     for (int32_t y = y0; y < y1; ++y) {
-        const float *zr = depth + size_t(y - y0) * size_t(w);
         uint16_t *d = dist + size_t(y - y0) * size_t(w);
         int64_t last = -int64_t(cap);
-        for (int32_t x = 0; x < w; ++x) {
-            if (zr[x] >= 0.0f) last = x;
-            d[x] = uint16_t(std::min<int64_t>(cap, x - last));
+        for (int32_t k = 0, x = 0; k < zRows.runCount(); ++k) {
+            const float *zr = zRows.run(y, k);
+            for (int32_t i = 0, e = zRows.runLength(k); i < e; ++i, ++x) {
+                if (zr[i] >= 0.0f) last = x;
+                d[x] = uint16_t(std::min<int64_t>(cap, x - last));
+            }
         }
         last = int64_t(w) + cap;
         for (int32_t x = w - 1; x >= 0; --x) {
@@ -252,26 +296,37 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
     }
     std::vector<DilationScratch> scratch;
     for (int t = 0; t < std::max(threads_, 1); ++t) scratch.emplace_back(frame.scratch());
+    const PixelRows<float> zRows(*z, false);
     RowBands distBands(h, kFilterBandRows, threads_, nullptr);
     if (!distBands.run([&](int32_t y0, int32_t y1, int thread) {
             DilationScratch &s = scratch[size_t(thread)];
-            float *depth = scratchArray<float>(*s.pool, s.depth, size_t(w) * size_t(y1 - y0));
-            if (rowDistances(*z, y0, y1, cap, rowDist + size_t(y0) * size_t(w), depth)) return true;
+            float *depth = zRows.direct() ? nullptr
+                                          : scratchArray<float>(*s.pool, s.depth,
+                                                                size_t(w) * size_t(y1 - y0));
+            if (rowDistances(*z, zRows, y0, y1, cap, rowDist + size_t(y0) * size_t(w), depth))
+                return true;
             message(kMsgError, 6, "Edge dilation could not read the Z layer");
             return false;
         }))
         return false;
 
     const std::vector<uint16_t> farRow(size_t(w), cap);  // stands for rows outside the image
-    // Each band also reads n rows above and below it: tall bands keep that margin small.
-    const int32_t bandRows = (std::max(4 * kFilterBandRows, 2 * n) + kFilterBandRows - 1) /
+    std::vector<PixelRows<Color>> srcRows, dstRows;
+    for (size_t l = 0; l < sources.size(); ++l) {
+        srcRows.emplace_back(*sources[l], false);
+        dstRows.emplace_back(*outputs[l], true);
+        // Source and result are walked run by run together.
+        if (srcRows[l].runWidth() != dstRows[l].runWidth()) srcRows[l].dropGrid(), dstRows[l].dropGrid();
+    }
+    // Each band also ranks n rows above and below it: tall bands keep that margin small, short
+    // ones keep the band's texels in the cache between ranking and filling.
+    const int32_t bandRows = (std::max(kFilterBandRows, 8 * n) + kFilterBandRows - 1) /
                              kFilterBandRows * kFilterBandRows;
     RowBands bands(h, bandRows, threads_, io);
     const bool ok = bands.run([&](int32_t y0, int32_t y1, int thread) {
         DilationScratch &s = scratch[size_t(thread)];
         const size_t bandSize = size_t(w) * size_t(y1 - y0);
         uint16_t *const ring = scratchArray<uint16_t>(*s.pool, s.ring, bandSize);
-        Color *const out = scratchArray<Color>(*s.pool, s.out, bandSize);
 
         // The ring radius of every texel of the band.
         for (int32_t y = y0; y < y1; ++y) {
@@ -289,20 +344,34 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
 
         const int32_t rowBase = std::max(0, y0 - n), rowEnd = std::min(h, y1 + n);
         const size_t window = size_t(w) * size_t(rowEnd - rowBase);
-        Color *const rows = scratchArray<Color>(*s.pool, s.rows, window);
         float *const lum = scratchArray<float>(*s.pool, s.lum, window);
         // Only covered texels can win; the ring's radius is known, so no other test is needed.
         const float never = -std::numeric_limits<float>::infinity();
         const uint16_t *windowDist = rowDist + size_t(rowBase) * size_t(w);
         for (size_t l = 0; l < sources.size(); ++l) {
-            if (!sources[l]->read(Region(0, rowBase, w, rowEnd), rows)) {
-                message(kMsgError, 6, "Edge dilation could not read layer %s", sources_[l].c_str());
-                return false;
+            PixelRows<Color> src = srcRows[l], dst = dstRows[l];
+            if (!src.direct()) {
+                Color *rows = scratchArray<Color>(*s.pool, s.rows, window);
+                if (!sources[l]->read(Region(0, rowBase, w, rowEnd), rows)) {
+                    message(kMsgError, 6, "Edge dilation could not read layer %s",
+                            sources_[l].c_str());
+                    return false;
+                }
+                src.bind(rows, rowBase);
             }
-            for (size_t i = 0; i < window; ++i) {
-                const float v = rows[i].luminance();
-                // A NaN or lowest luminance never beats the starting value either.
-                lum[i] = windowDist[i] == 0 && v > -3.4028235e38f ? v : never;
+            if (!dst.direct()) dst.bind(scratchArray<Color>(*s.pool, s.out, bandSize), y0);
+            for (int32_t y = rowBase; y < rowEnd; ++y) {
+                const size_t row = size_t(y - rowBase) * size_t(w);
+                for (int32_t k = 0; k < src.runCount(); ++k) {
+                    const Color *c = src.run(y, k);
+                    const size_t x0 = row + size_t(k) * size_t(src.runWidth());
+                    for (int32_t i = 0, e = src.runLength(k); i < e; ++i) {
+                        const float v = c[i].luminance();
+                        // A NaN or lowest luminance never beats the starting value either.
+                        lum[x0 + size_t(i)] =
+                            windowDist[x0 + size_t(i)] == 0 && v > -3.4028235e38f ? v : never;
+                    }
+                }
             }
             const bool fast = n > kDirectScanMax;
             if (fast)
@@ -310,22 +379,30 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                              log2Floor(uint32_t(2 * n + 1)));
             for (int32_t y = y0; y < y1; ++y) {
                 const uint16_t *d = ring + size_t(y - y0) * size_t(w);
-                const Color *src = rows + size_t(y - rowBase) * size_t(w);
-                Color *dst = out + size_t(y - y0) * size_t(w);
-                for (int32_t x = 0; x < w; ++x) {
-                    const int32_t r = d[x];
-                    if (r == 0) {
-                        dst[x] = src[x];
-                        continue;
+                for (int32_t k = 0; k < src.runCount(); ++k) {
+                    const Color *from = src.run(y, k);
+                    Color *to = dst.run(y, k);
+                    const int32_t x0 = k * src.runWidth();
+                    for (int32_t i = 0, e = src.runLength(k); i < e; ++i) {
+                        const int32_t x = x0 + i, r = d[x];
+                        if (r == 0) {
+                            to[i] = from[i];
+                            continue;
+                        }
+                        const int64_t win =
+                            r > n  ? -1
+                            : fast ? brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r)
+                                   : brightestOnRing(lum, rowBase, w, h, x, y, r);
+                        if (win < 0) {
+                            to[i] = background_;
+                            continue;
+                        }
+                        const int32_t wy = int32_t(win / w);
+                        to[i] = src.at(int32_t(win - int64_t(wy) * w), rowBase + wy);
                     }
-                    const int64_t win =
-                        r > n  ? -1
-                        : fast ? brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r)
-                               : brightestOnRing(lum, rowBase, w, h, x, y, r);
-                    dst[x] = win < 0 ? background_ : rows[size_t(win)];
                 }
             }
-            if (!outputs[l]->paste(Region(0, y0, w, y1), out)) {
+            if (!dst.direct() && !outputs[l]->paste(Region(0, y0, w, y1), dst.run(y0, 0))) {
                 message(kMsgError, 6, "Edge dilation could not write layer %s",
                         outputs[l]->name().c_str());
                 return false;

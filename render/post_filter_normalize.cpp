@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <cmath>
+#include <optional>
 #include <vector>
 
 #include "core/message.h"
@@ -91,49 +92,52 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     const int threads = std::max(threads_, 1);
     std::vector<std::vector<Range>> ranges(size_t(threads),
                                            std::vector<Range>(size_t(slots) * size_t(comps)));
-    std::vector<std::vector<std::pair<int32_t, int32_t>>> orphans(static_cast<size_t>(bandCount));
     std::vector<int64_t> orphanCounts(size_t(bandCount), 0);
     std::vector<BandScratch> scratch;
     for (int t = 0; t < threads; ++t) scratch.emplace_back(frame.scratch());
+    // Background texels get the id -1, texels without an instance -2.
+    constexpr int32_t kBackground = -1, kOrphan = -2;
+    std::optional<TexelRuns> gatherRuns(std::in_place, *in, nullptr, z);
     RowBands gather(h, bandRows, threads, nullptr);
     const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
-        const Region rows(0, y0, w, y1);
-        Color *colors = scratch[size_t(thread)].colorBuffer(size_t(rows.area()));
-        float *depth = z ? scratch[size_t(thread)].floatBuffer(size_t(rows.area())) : nullptr;
-        if (!in->read(rows, colors) || (z && !z->read(rows, depth))) {
-            message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
-            return false;
-        }
-        std::vector<Range> &acc = ranges[size_t(thread)];
-        const int32_t band = y0 / bandRows;
         for (int32_t y = y0; y < y1; ++y) {
             int32_t *id = ids + size_t(y) * size_t(w);
             if (instances_)
                 instances_->instancesOfRow(y, w, id);
             else
                 std::fill(id, id + w, count);
-            for (int32_t x = 0; x < w; ++x) {
-                const size_t i = size_t(y - y0) * size_t(w) + size_t(x);
-                if (z && !(depth[i] >= 0.0f)) {
-                    id[x] = -1;
-                    continue;
-                }
-                if (instances_ && (id[x] < 0 || id[x] >= count)) {
-                    id[x] = -1;
-                    if (orphans[size_t(band)].size() < kMaxLoggedTexels)
-                        orphans[size_t(band)].push_back({x, y});
-                    ++orphanCounts[size_t(band)];
-                    continue;
-                }
-                Range *r = acc.data() + size_t(id[x]) * size_t(comps);
-                const Color &c = colors[i];
-                const float v[4] = {c.r, c.g, c.b, c.a};
-                for (int ch = 0; ch < 4; ++ch)
-                    if (channelComp[ch] >= 0) r[channelComp[ch]].add(v[ch]);
-            }
         }
+        Range *const acc = ranges[size_t(thread)].data();
+        int64_t orphansHere = 0;
+        const bool read = gatherRuns->run(
+            y0, y1, scratch[size_t(thread)],
+            [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *, const float *depth) {
+                int32_t *id = ids + size_t(y) * size_t(w) + size_t(x0);
+                for (int32_t i = 0; i < n; ++i) {
+                    if (depth && !(depth[i] >= 0.0f)) {
+                        id[i] = kBackground;
+                        continue;
+                    }
+                    if (instances_ && (id[i] < 0 || id[i] >= count)) {
+                        id[i] = kOrphan;
+                        ++orphansHere;
+                        continue;
+                    }
+                    Range *r = acc + size_t(id[i]) * size_t(comps);
+                    const Color &c = src[i];
+                    const float v[4] = {c.r, c.g, c.b, c.a};
+                    for (int ch = 0; ch < 4; ++ch)
+                        if (channelComp[ch] >= 0) r[channelComp[ch]].add(v[ch]);
+                }
+            });
+        if (!read) {
+            message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
+            return false;
+        }
+        orphanCounts[size_t(y0 / bandRows)] = orphansHere;
         return true;
     });
+    gatherRuns.reset();
     if (!gathered) return false;
 
     // The texels without an instance, in row order whatever the thread count.
@@ -141,11 +145,13 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     int64_t orphanTotal = 0;
     for (int32_t b = 0; b < bandCount; ++b) {
         orphanTotal += orphanCounts[size_t(b)];
-        for (const auto &[x, y] : orphans[size_t(b)])
-            if (logged < kMaxLoggedTexels) {
-                message(kMsgDebug, 6, "No instance found in sampled pixel %d, %d", x, y);
-                ++logged;
-            }
+        if (orphanCounts[size_t(b)] == 0 || logged >= kMaxLoggedTexels) continue;
+        for (int32_t y = b * bandRows; y < std::min(h, (b + 1) * bandRows); ++y)
+            for (int32_t x = 0; x < w && logged < kMaxLoggedTexels; ++x)
+                if (ids[size_t(y) * size_t(w) + size_t(x)] == kOrphan) {
+                    message(kMsgDebug, 6, "No instance found in sampled pixel %d, %d", x, y);
+                    ++logged;
+                }
     }
     if (orphanTotal > int64_t(logged))
         message(kMsgDebug, 6, "No instance found in %lld more sampled pixels",
@@ -196,25 +202,26 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     }
 
     // Remap the covered texels that have an instance; the rest are copied.
+    TexelRuns remapRuns(*in, out, nullptr);
     RowBands remap(h, bandRows, threads, io);
     const bool ok = remap.run([&](int32_t y0, int32_t y1, int thread) {
-        const Region rows(0, y0, w, y1);
-        const size_t n = size_t(rows.area());
-        Color *colors = scratch[size_t(thread)].colorBuffer(n);
-        if (!in->read(rows, colors)) {
-            message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
-            return false;
-        }
-        const int32_t *id = ids + size_t(y0) * size_t(w);
-        for (size_t i = 0; i < n; ++i) {
-            if (id[i] < 0) continue;
-            const Remap *m = remaps.data() + size_t(id[i]) * 4;
-            Color &c = colors[i];
-            c = Color((c.r + m[0].offset) * m[0].scale, (c.g + m[1].offset) * m[1].scale,
-                      (c.b + m[2].offset) * m[2].scale, (c.a + m[3].offset) * m[3].scale);
-        }
-        if (!out->paste(rows, colors)) {
-            message(kMsgError, 6, "Shape normalization could not write its result");
+        const bool done = remapRuns.run(
+            y0, y1, scratch[size_t(thread)],
+            [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *dst, const float *) {
+                const int32_t *id = ids + size_t(y) * size_t(w) + size_t(x0);
+                for (int32_t i = 0; i < n; ++i) {
+                    const Color c = src[i];
+                    if (id[i] < 0) {
+                        dst[i] = c;
+                        continue;
+                    }
+                    const Remap *m = remaps.data() + size_t(id[i]) * 4;
+                    dst[i] = Color((c.r + m[0].offset) * m[0].scale, (c.g + m[1].offset) * m[1].scale,
+                                   (c.b + m[2].offset) * m[2].scale, (c.a + m[3].offset) * m[3].scale);
+                }
+            });
+        if (!done) {
+            message(kMsgError, 6, "Shape normalization could not remap layer %s", source_.c_str());
             return false;
         }
         return true;

@@ -37,22 +37,24 @@ bool PremultiplyFilter::init(Frame &frame, RenderContext &) {
         if (!out) return false;
         out_.push_back(out);
     }
+    runs_.clear();
+    for (size_t i = 0; i < sources_.size(); ++i)
+        runs_.push_back(std::make_unique<TexelRuns>(*in_[i], out_[i], nullptr));
     return true;
 }
 
 bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch, int32_t &failedX,
                                    int32_t &failedY) {
-    if (in_.empty()) return true;
-    const Region rows = rowsOf(in_[0]->width(), y0, y1);
-    const size_t n = size_t(rows.area());
-    Color *buffer = scratch.colorBuffer(n);
-    for (size_t l = 0; l < in_.size(); ++l) {
-        if (!in_[l]->read(rows, buffer)) {
-            failedX = 0, failedY = y0;
-            return false;
-        }
-        for (size_t i = 0; i < n; ++i) buffer[i] = premultiply(buffer[i], threshold_, background_);
-        if (!out_[l]->paste(rows, buffer)) {
+    const float t = threshold_;
+    const Color bg = background_;
+    for (const auto &runs : runs_) {
+        const bool ok = runs->run(y0, y1, scratch,
+                                  [&](int32_t, int32_t, int32_t n, const Color *src, Color *dst,
+                                      const float *) {
+                                      for (int32_t i = 0; i < n; ++i)
+                                          dst[i] = premultiply(src[i], t, bg);
+                                  });
+        if (!ok) {
             failedX = 0, failedY = y0;
             return false;
         }
@@ -61,6 +63,7 @@ bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch,
 }
 
 bool PremultiplyFilter::filterPixel(int32_t x, int32_t y) {
+    runs_.clear();  // the layers are then used through reads and pastes
     const Region r(x, y, x + 1, y + 1);
     for (size_t l = 0; l < in_.size(); ++l) {
         Color c;
@@ -72,12 +75,14 @@ bool PremultiplyFilter::filterPixel(int32_t x, int32_t y) {
 }
 
 bool PremultiplyFilter::finish(Frame &) {
+    runs_.clear();
     const bool ok = results_ && results_->place(sources_);
     results_.reset();
     return ok;
 }
 
 void PremultiplyFilter::discard(Frame &) {
+    runs_.clear();
     results_.reset();  // removes what was not placed
 }
 

@@ -36,14 +36,16 @@ ox::RenderContext &noContext() {
 
 constexpr float kBg = -1.0f;  // "Z" of a background texel
 
-/// A frame with colour layers and a "Z" layer filled from the given rows (row 0 first).
+/// A frame with colour layers and a "Z" layer filled from the given rows (row 0 first), in
+/// tiles of `tile` texels (results of filters get the default tiles).
 std::unique_ptr<Frame> makeFrame(int w, int h, const std::vector<float> &z,
-                                 const std::vector<std::pair<std::string, std::vector<Color>>> &l) {
+                                 const std::vector<std::pair<std::string, std::vector<Color>>> &l,
+                                 int tile = 8) {
     auto f = std::make_unique<Frame>(w, h);
-    EXPECT_TRUE(f->addTiledLayer<float>("Z", 8));
+    EXPECT_TRUE(f->addTiledLayer<float>("Z", tile));
     EXPECT_TRUE(f->pasteRegion("Z", Region(0, 0, w, h), z.data()));
     for (const auto &[name, colors] : l) {
-        EXPECT_TRUE(f->addTiledLayer<Color>(name, 8));
+        EXPECT_TRUE(f->addTiledLayer<Color>(name, tile));
         EXPECT_TRUE(f->pasteRegion(name, Region(0, 0, w, h), colors.data()));
     }
     return f;
@@ -167,17 +169,19 @@ TEST(EdgeDilationTest, MatchesThePlainRingSearchOnRandomMasks) {
                     for (int x = 0; x < s.w; ++x)
                         expected[size_t(y * s.w + x)] =
                             referenceDilation(z, c, s.w, s.h, n, bg, x, y);
-                for (int threads : {1, 3}) {
-                    auto f = makeFrame(s.w, s.h, z, {{"beauty", c}});
-                    EXPECT_TRUE(sameBits(dilate(*f, n, bg, threads), expected))
-                        << s.w << "x" << s.h << " coverage " << coverage << " n " << n
-                        << " threads " << threads;
-                    ++compared;
-                }
+                // Small tiles go through band copies, default ones are worked in place.
+                for (int tile : {8, ox::kLayerTileSize})
+                    for (int threads : {1, 3}) {
+                        auto f = makeFrame(s.w, s.h, z, {{"beauty", c}}, tile);
+                        EXPECT_TRUE(sameBits(dilate(*f, n, bg, threads), expected))
+                            << s.w << "x" << s.h << " coverage " << coverage << " n " << n
+                            << " tile " << tile << " threads " << threads;
+                        ++compared;
+                    }
             }
         }
     }
-    EXPECT_EQ(compared, 5 * 3 * 7 * 2);
+    EXPECT_EQ(compared, 5 * 3 * 7 * 2 * 2);
 }
 
 TEST(EdgeDilationTest, SeveralLayersMissingLayersAndAbort) {
@@ -661,6 +665,57 @@ TEST_F(ShapeNormalizationTest, TexelsWithoutInstanceAreLoggedAndMissingInputsFai
     log = oxtest::captureOutput([&] { EXPECT_FALSE(filter.run(*f, &io)); });
     EXPECT_TRUE(has(log, "Shape normalization aborted"));
     EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
+}
+
+TEST_F(ShapeNormalizationTest, ChainGivesTheSameBytesWhateverTilesAndThreads) {
+    // Premultiply, dilation and normalization over blobs on a frame of several partial tiles:
+    // layers worked in place (default tiles) or through band copies (small tiles), on one to
+    // three threads, must all give the same bytes.
+    const int w = 150, h = 90;
+    std::mt19937 rng(99);
+    std::uniform_real_distribution<float> u(0.0f, 1.0f);
+    std::vector<float> z(size_t(w * h), kBg);
+    std::vector<Color> c(size_t(w * h));
+    for (int blob = 0; blob < 12; ++blob) {
+        const float cx = u(rng) * w, cy = u(rng) * h, r = 3 + u(rng) * 12;
+        for (int y = 0; y < h; ++y)
+            for (int x = 0; x < w; ++x)
+                if ((x - cx) * (x - cx) + (y - cy) * (y - cy) <= r * r) z[size_t(y * w + x)] = 1;
+    }
+    for (Color &t : c) t = Color(u(rng) * 3, u(rng) * 2, u(rng), u(rng));
+    FakeInstances instances(70, {{75, 40}, {10, 10}});
+    const ox::NormalizeOptions options{ox::NormalizeRange::MinMax, ox::NormalizeOutput::PerChannel,
+                                       ox::NormalizeComponent::Shape, true};
+    std::vector<Color> first;
+    for (int tile : {ox::kLayerTileSize, 8})
+        for (int threads : {1, 2, 3}) {
+            auto f = makeFrame(w, h, z, {{"beauty", c}}, tile);
+            ox::PostFilterCommand premultiply(
+                std::make_unique<ox::PremultiplyFilter>(std::vector<std::string>{"beauty"}, 0.0f,
+                                                        Color(0.1f, 0.2f, 0.3f, 1)),
+                threads);
+            ox::EdgeDilationFilter dilation({"beauty"}, 4, Color(0, 0, 0, 1));
+            dilation.setThreadCount(threads);
+            ox::ShapeNormalizationFilter normalization("beauty", options, &instances);
+            normalization.setThreadCount(threads);
+            oxtest::FakeIO io;
+            ASSERT_TRUE(premultiply.execute(*f, noContext(), io));
+            ASSERT_TRUE(dilation.run(*f, &io));
+            ASSERT_TRUE(normalization.run(*f, &io));
+            EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
+            const std::vector<Color> out = readColors(*f, "beauty");
+            if (first.empty()) {
+                first = out;
+                // Covered texels with an instance end up in [0, 1].
+                for (size_t i = 0; i < out.size(); ++i) {
+                    if (z[i] < 0 || i == size_t(40 * w + 75) || i == size_t(10 * w + 10)) continue;
+                    EXPECT_TRUE(out[i].r >= 0 && out[i].r <= 1 && out[i].a >= 0 && out[i].a <= 1)
+                        << i;
+                }
+            } else {
+                EXPECT_TRUE(sameBits(out, first)) << "tile " << tile << " threads " << threads;
+            }
+        }
 }
 
 // ---------------------------------------------------------------------------------------------
