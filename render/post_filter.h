@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <cstring>
 #include <functional>
 #include <memory>
 #include <new>
@@ -14,6 +15,10 @@
 #include "render/command.h"
 #include "render/frame.h"
 #include "render/layer.h"
+
+#ifdef __SSE2__
+#include <emmintrin.h>
+#endif
 
 /// Post filters: the commands that transform a rendered or baked frame's layers before it is
 /// written (premultiply, edge dilation, shape normalization, range remap, RNM fold).
@@ -71,6 +76,27 @@ struct BandScratch {
     /// floats sized to at least n, returned.
     float *floatBuffer(size_t n) { return scratchArray<float>(*pool, floats, n); }
 };
+
+/// Copies n colours to dst, a result in a layer's tiles that is written once and read only by
+/// a later pass: the stores bypass the cache, so that dst's lines are not read in first.
+/// Call streamFence before another thread reads them.
+inline void streamColors(Color *dst, const Color *src, int32_t n) {
+#ifdef __SSE2__
+    if ((reinterpret_cast<uintptr_t>(dst) & 15) == 0) {
+        for (int32_t i = 0; i < n; ++i)
+            _mm_stream_ps(&dst[i].r, _mm_loadu_ps(&src[i].r));
+        return;
+    }
+#endif
+    std::memcpy(dst, src, size_t(n) * sizeof(Color));
+}
+
+/// Orders the streamed stores of this thread before what follows.
+inline void streamFence() {
+#ifdef __SSE2__
+    _mm_sfence();
+#endif
+}
 
 /// Hands the texels of bands of rows of a colour layer (with the same texels of an optional
 /// "Z" layer and of an optional result layer) to a body in runs along rows: straight in the
@@ -163,6 +189,8 @@ bool TexelRuns::run(int32_t y0, int32_t y1, BandScratch &scratch, F &&body) {
     if (direct_) {
         // Tile by tile, so that each tile's memory is walked in one stream.
         const int32_t tw = inGrid_.tileWidth, th = inGrid_.tileHeight;
+        // Results go to a run buffer in the cache first, then to the tile with streamed stores.
+        Color *runBuffer = out_ ? scratch.colorBuffer(size_t(tw)) : nullptr;
         for (int32_t ty = y0 / th; ty * th < y1; ++ty) {
             const int32_t ya = std::max(y0, ty * th), yb = std::min(y1, (ty + 1) * th);
             for (int32_t tx = 0; tx * tw < w; ++tx) {
@@ -172,11 +200,12 @@ bool TexelRuns::run(int32_t y0, int32_t y1, BandScratch &scratch, F &&body) {
                 const float *depth = z_ ? zGrid_.tile(uint32_t(tx), uint32_t(ty)) : nullptr;
                 for (int32_t y = ya; y < yb; ++y) {
                     const int64_t row = int64_t(y - ty * th) * tw;
-                    body(x, y, n, src + row, dst ? dst + row : nullptr,
-                         depth ? depth + row : nullptr);
+                    body(x, y, n, src + row, runBuffer, depth ? depth + row : nullptr);
+                    if (dst) streamColors(dst + row, runBuffer, n);
                 }
             }
         }
+        streamFence();
         return true;
     }
     const Region rows(0, y0, w, y1);

@@ -360,16 +360,24 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                 src.bind(rows, rowBase);
             }
             if (!dst.direct()) dst.bind(scratchArray<Color>(*s.pool, s.out, bandSize), y0);
+            Color *const runBuffer =
+                dst.direct() ? scratchArray<Color>(*s.pool, s.out, size_t(dst.runWidth())) : nullptr;
             for (int32_t y = rowBase; y < rowEnd; ++y) {
                 const size_t row = size_t(y - rowBase) * size_t(w);
                 for (int32_t k = 0; k < src.runCount(); ++k) {
                     const Color *c = src.run(y, k);
                     const size_t x0 = row + size_t(k) * size_t(src.runWidth());
+                    const uint16_t *covered = windowDist + x0;
+                    float *lr = lum + x0;
                     for (int32_t i = 0, e = src.runLength(k); i < e; ++i) {
+                        // Background texels are not even read: most of the image is.
+                        if (covered[i] != 0) {
+                            lr[i] = never;
+                            continue;
+                        }
                         const float v = c[i].luminance();
                         // A NaN or lowest luminance never beats the starting value either.
-                        lum[x0 + size_t(i)] =
-                            windowDist[x0 + size_t(i)] == 0 && v > -3.4028235e38f ? v : never;
+                        lr[i] = v > -3.4028235e38f ? v : never;
                     }
                 }
             }
@@ -381,7 +389,9 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                 const uint16_t *d = ring + size_t(y - y0) * size_t(w);
                 for (int32_t k = 0; k < src.runCount(); ++k) {
                     const Color *from = src.run(y, k);
-                    Color *to = dst.run(y, k);
+                    // In place, results go to the tile through a run buffer (see streamColors).
+                    Color *const tile = dst.run(y, k);
+                    Color *const to = dst.direct() ? runBuffer : tile;
                     const int32_t x0 = k * src.runWidth();
                     for (int32_t i = 0, e = src.runLength(k); i < e; ++i) {
                         const int32_t x = x0 + i, r = d[x];
@@ -400,8 +410,10 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                         const int32_t wy = int32_t(win / w);
                         to[i] = src.at(int32_t(win - int64_t(wy) * w), rowBase + wy);
                     }
+                    if (dst.direct()) streamColors(tile, runBuffer, src.runLength(k));
                 }
             }
+            streamFence();
             if (!dst.direct() && !outputs[l]->paste(Region(0, y0, w, y1), dst.run(y0, 0))) {
                 message(kMsgError, 6, "Edge dilation could not write layer %s",
                         outputs[l]->name().c_str());

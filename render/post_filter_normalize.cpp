@@ -1,6 +1,9 @@
 #include <algorithm>
 #include <cmath>
 #include <optional>
+#ifdef __SSE2__
+#include <emmintrin.h>
+#endif
 #include <vector>
 
 #include "core/message.h"
@@ -24,9 +27,78 @@ struct Range {
     void merge(const Range &o) { lo = std::min(lo, o.lo), hi = std::max(hi, o.hi); }
 };
 
+/// The finite ranges of r, g, b and a of one slot.
+struct alignas(16) ChannelRanges {
+    float lo[4] = {3.4028235e38f, 3.4028235e38f, 3.4028235e38f, 3.4028235e38f};
+    float hi[4] = {-3.4028235e38f, -3.4028235e38f, -3.4028235e38f, -3.4028235e38f};
+    void merge(const ChannelRanges &o) {
+        for (int c = 0; c < 4; ++c) lo[c] = std::min(lo[c], o.lo[c]), hi[c] = std::max(hi[c], o.hi[c]);
+    }
+};
+
+/// The ranges of a run of texels of one slot, kept in registers and merged into the slot's
+/// ChannelRanges at the end of the run. Infinite and NaN values are left out (they would
+/// spoil the range of every other texel); -0 counts as +0, so that the minimum of a zero
+/// does not depend on the order in which the threads' ranges merge.
+class RunRanges {
+public:
+    RunRanges() { reset(); }
+#ifdef __SSE2__
+    void reset() {
+        lo_ = _mm_set1_ps(3.4028235e38f);
+        hi_ = _mm_set1_ps(-3.4028235e38f);
+    }
+    void add(const Color &c) {
+        const __m128 v = _mm_add_ps(_mm_loadu_ps(&c.r), _mm_setzero_ps());
+        const __m128 finite = _mm_cmpeq_ps(_mm_sub_ps(v, v), _mm_setzero_ps());
+        lo_ = _mm_min_ps(_mm_or_ps(_mm_and_ps(finite, v), _mm_andnot_ps(finite, kHuge())), lo_);
+        hi_ = _mm_max_ps(_mm_or_ps(_mm_and_ps(finite, v), _mm_andnot_ps(finite, kLow())), hi_);
+    }
+    void mergeInto(ChannelRanges &r) const {
+        _mm_store_ps(r.lo, _mm_min_ps(lo_, _mm_load_ps(r.lo)));
+        _mm_store_ps(r.hi, _mm_max_ps(hi_, _mm_load_ps(r.hi)));
+    }
+
+private:
+    static __m128 kHuge() { return _mm_set1_ps(3.4028235e38f); }
+    static __m128 kLow() { return _mm_set1_ps(-3.4028235e38f); }
+    __m128 lo_, hi_;
+#else
+    void reset() { r_ = ChannelRanges(); }
+    void add(const Color &c) {
+        const float v[4] = {c.r + 0.0f, c.g + 0.0f, c.b + 0.0f, c.a + 0.0f};
+        for (int k = 0; k < 4; ++k)
+            if (std::isfinite(v[k])) r_.lo[k] = std::min(r_.lo[k], v[k]), r_.hi[k] = std::max(r_.hi[k], v[k]);
+    }
+    void mergeInto(ChannelRanges &r) const { r.merge(r_); }
+
+private:
+    ChannelRanges r_;
+#endif
+};
+
 /// v' = (v + offset) * scale for one channel.
 struct Remap {
     float scale = 1.0f, offset = 0.0f;
+};
+
+/// The remaps of r, g, b and a of one slot.
+struct alignas(16) SlotRemap {
+    float offset[4] = {0, 0, 0, 0};
+    float scale[4] = {1, 1, 1, 1};
+
+    /// (c + offset) * scale, channel by channel.
+    Color apply(const Color &c) const {
+#ifdef __SSE2__
+        Color out;
+        _mm_storeu_ps(&out.r, _mm_mul_ps(_mm_add_ps(_mm_loadu_ps(&c.r), _mm_load_ps(offset)),
+                                         _mm_load_ps(scale)));
+        return out;
+#else
+        return Color((c.r + offset[0]) * scale[0], (c.g + offset[1]) * scale[1],
+                     (c.b + offset[2]) * scale[2], (c.a + offset[3]) * scale[3]);
+#endif
+    }
 };
 
 /// The remap of a range under the range mode; false (identity) when it cannot be applied.
@@ -90,8 +162,8 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         return false;
     }
     const int threads = std::max(threads_, 1);
-    std::vector<std::vector<Range>> ranges(size_t(threads),
-                                           std::vector<Range>(size_t(slots) * size_t(comps)));
+    std::vector<std::vector<ChannelRanges>> ranges(
+        size_t(threads), std::vector<ChannelRanges>(static_cast<size_t>(slots)));
     std::vector<int64_t> orphanCounts(size_t(bandCount), 0);
     std::vector<BandScratch> scratch;
     for (int t = 0; t < threads; ++t) scratch.emplace_back(frame.scratch());
@@ -107,12 +179,15 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
             else
                 std::fill(id, id + w, count);
         }
-        Range *const acc = ranges[size_t(thread)].data();
+        ChannelRanges *const acc = ranges[size_t(thread)].data();
         int64_t orphansHere = 0;
         const bool read = gatherRuns->run(
             y0, y1, scratch[size_t(thread)],
             [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *, const float *depth) {
                 int32_t *id = ids + size_t(y) * size_t(w) + size_t(x0);
+                // Neighbours mostly share their instance: its ranges stay in registers.
+                RunRanges run;
+                int32_t current = -1;
                 for (int32_t i = 0; i < n; ++i) {
                     if (depth && !(depth[i] >= 0.0f)) {
                         id[i] = kBackground;
@@ -123,12 +198,14 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
                         ++orphansHere;
                         continue;
                     }
-                    Range *r = acc + size_t(id[i]) * size_t(comps);
-                    const Color &c = src[i];
-                    const float v[4] = {c.r, c.g, c.b, c.a};
-                    for (int ch = 0; ch < 4; ++ch)
-                        if (channelComp[ch] >= 0) r[channelComp[ch]].add(v[ch]);
+                    if (id[i] != current) {
+                        if (current >= 0) run.mergeInto(acc[current]);
+                        current = id[i];
+                        run.reset();
+                    }
+                    run.add(src[i]);
                 }
+                if (current >= 0) run.mergeInto(acc[current]);
             });
         if (!read) {
             message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
@@ -158,16 +235,22 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
                 static_cast<long long>(orphanTotal - int64_t(logged)));
 
     // Merge the threads' ranges (minimum and maximum do not depend on the order).
-    std::vector<Range> total(size_t(slots) * size_t(comps));
+    std::vector<ChannelRanges> channels(static_cast<size_t>(slots));
     for (const auto &acc : ranges)
-        for (size_t i = 0; i < total.size(); ++i) total[i].merge(acc[i]);
+        for (size_t i = 0; i < channels.size(); ++i) channels[i].merge(acc[i]);
+    std::vector<Range> total(size_t(slots) * size_t(comps));
+    for (int32_t s = 0; s < slots; ++s)
+        for (int ch = 0; ch < 4; ++ch)
+            if (channelComp[ch] >= 0)
+                total[size_t(s) * size_t(comps) + size_t(channelComp[ch])].merge(
+                    {channels[size_t(s)].lo[ch], channels[size_t(s)].hi[ch]});
     std::vector<Range> image(static_cast<size_t>(comps));
     for (int32_t s = 0; s < slots; ++s)
         for (int32_t c = 0; c < comps; ++c)
             image[size_t(c)].merge(total[size_t(s) * size_t(comps) + size_t(c)]);
 
     // The remap of every slot and channel, and the record.
-    std::vector<Remap> remaps(size_t(slots) * 4);
+    std::vector<SlotRemap> remaps(static_cast<size_t>(slots));
     std::vector<Remap> imageRemap(static_cast<size_t>(comps));
     std::vector<bool> imageApplied(static_cast<size_t>(comps));
     for (int32_t c = 0; c < comps; ++c)
@@ -187,9 +270,10 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
             applied[size_t(c)] = remapOf(r[c], options_.range, own[size_t(c)]);
         for (int ch = 0; ch < 4; ++ch) {
             const int32_t c = channelComp[ch];
-            if (c >= 0)
-                remaps[size_t(s) * 4 + size_t(ch)] =
-                    perShape ? own[size_t(c)] : imageRemap[size_t(c)];
+            if (c < 0) continue;
+            const Remap &m = perShape ? own[size_t(c)] : imageRemap[size_t(c)];
+            remaps[size_t(s)].offset[ch] = m.offset;
+            remaps[size_t(s)].scale[ch] = m.scale;
         }
         if (s < count && r[0].lo <= r[0].hi) {
             ShapeMinMax shape;
@@ -209,16 +293,8 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
             y0, y1, scratch[size_t(thread)],
             [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *dst, const float *) {
                 const int32_t *id = ids + size_t(y) * size_t(w) + size_t(x0);
-                for (int32_t i = 0; i < n; ++i) {
-                    const Color c = src[i];
-                    if (id[i] < 0) {
-                        dst[i] = c;
-                        continue;
-                    }
-                    const Remap *m = remaps.data() + size_t(id[i]) * 4;
-                    dst[i] = Color((c.r + m[0].offset) * m[0].scale, (c.g + m[1].offset) * m[1].scale,
-                                   (c.b + m[2].offset) * m[2].scale, (c.a + m[3].offset) * m[3].scale);
-                }
+                for (int32_t i = 0; i < n; ++i)
+                    dst[i] = id[i] < 0 ? src[i] : remaps[size_t(id[i])].apply(src[i]);
             });
         if (!done) {
             message(kMsgError, 6, "Shape normalization could not remap layer %s", source_.c_str());
