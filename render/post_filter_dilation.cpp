@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <cstring>
 #ifdef __SSE2__
 #include <emmintrin.h>
 #endif
@@ -60,30 +61,81 @@ private:
     int32_t firstRow_ = 0;
 };
 
+/// One doubling step of the row distances: out[x] = min(in[x], in[x - step] + step,
+/// in[x + step] + step) within the row (values stay below 65536 - step). Separate buffers:
+/// reading what the step just stored would stall on every vector.
+void relaxRow(const uint16_t *__restrict in, uint16_t *__restrict out, int32_t w, int32_t step) {
+    const uint16_t s = uint16_t(step);
+    auto scalar = [&](int32_t x) {
+        uint16_t v = in[x];
+        if (x >= step) v = std::min<uint16_t>(v, uint16_t(in[x - step] + s));
+        if (x + step < w) v = std::min<uint16_t>(v, uint16_t(in[x + step] + s));
+        out[x] = v;
+    };
+    int32_t x = 0;
+    for (; x < std::min(step, w); ++x) scalar(x);
+#ifdef __SSE2__
+    // Unsigned 16-bit minimum from a saturating subtraction: min(a, b) = a - max(a - b, 0).
+    const __m128i sv = _mm_set1_epi16(int16_t(s));
+    auto umin = [](__m128i a, __m128i b) { return _mm_sub_epi16(a, _mm_subs_epu16(a, b)); };
+    auto load = [&](int32_t at) {
+        return _mm_loadu_si128(reinterpret_cast<const __m128i *>(in + at));
+    };
+    for (; x + 8 + step <= w; x += 8) {
+        const __m128i near = _mm_adds_epu16(umin(load(x - step), load(x + step)), sv);
+        _mm_storeu_si128(reinterpret_cast<__m128i *>(out + x), umin(load(x), near));
+    }
+#endif
+    for (; x < w; ++x) scalar(x);
+}
+
 /// Row distances to the nearest covered texel of rows [y0, y1), capped at cap; depth is the
 /// band buffer used when the layer has no grid.
 bool rowDistances(LayerT<float> &z, PixelRows<float> zRows, int32_t y0, int32_t y1,
-                  uint16_t cap, uint16_t *dist, float *depth) {
+                  uint16_t cap, uint16_t *dist, float *depth, uint16_t *spare) {
     const int32_t w = z.width();
     if (!zRows.direct()) {
         if (!z.read(Region(0, y0, w, y1), depth)) return false;
         zRows.bind(depth, y0);
     }
+    const int32_t n = cap - 1;
     for (int32_t y = y0; y < y1; ++y) {
         uint16_t *d = dist + size_t(y - y0) * size_t(w);
-        int64_t last = -int64_t(cap);
+        // 0 for covered texels, cap for the others.
+        bool anyCovered = false;
         for (int32_t k = 0, x = 0; k < zRows.runCount(); ++k) {
             const float *zr = zRows.run(y, k);
-            for (int32_t i = 0, e = zRows.runLength(k); i < e; ++i, ++x) {
-                if (zr[i] >= 0.0f) last = x;
-                d[x] = uint16_t(std::min<int64_t>(cap, x - last));
+            int32_t i = 0;
+            const int32_t e = zRows.runLength(k);
+#ifdef __SSE2__
+            const __m128i capv = _mm_set1_epi16(int16_t(cap));
+            __m128i seen = _mm_setzero_si128();
+            for (; i + 8 <= e; i += 8) {
+                // NaN compares false: not covered.
+                const __m128 lo = _mm_cmpge_ps(_mm_loadu_ps(zr + i), _mm_setzero_ps());
+                const __m128 hi = _mm_cmpge_ps(_mm_loadu_ps(zr + i + 4), _mm_setzero_ps());
+                const __m128i mask = _mm_packs_epi32(_mm_castps_si128(lo), _mm_castps_si128(hi));
+                seen = _mm_or_si128(seen, mask);
+                _mm_storeu_si128(reinterpret_cast<__m128i *>(d + x + i), _mm_andnot_si128(mask, capv));
             }
+            anyCovered |= _mm_movemask_epi8(seen) != 0;
+#endif
+            for (; i < e; ++i) {
+                const bool covered = zr[i] >= 0.0f;
+                anyCovered |= covered;
+                d[x + i] = covered ? 0 : cap;
+            }
+            x += e;
         }
-        last = int64_t(w) + cap;
-        for (int32_t x = w - 1; x >= 0; --x) {
-            if (d[x] == 0) last = x;
-            d[x] = uint16_t(std::min<int64_t>(d[x], last - x));
+        if (!anyCovered) continue;
+        // Doubling steps: after steps 1, 2, 4, ..., s every distance up to 2s - 1 is exact,
+        // and a distance is never below the true one, so distances beyond n stay at cap.
+        uint16_t *from = d, *to = spare;
+        for (int32_t step = 1, reach = 0; reach < n; reach += step, step *= 2) {
+            relaxRow(from, to, w, step);
+            std::swap(from, to);
         }
+        if (from != d) std::memcpy(d, from, size_t(w) * sizeof(uint16_t));
     }
     return true;
 }
@@ -250,6 +302,7 @@ struct DilationScratch {
     RunMaxima runs;      // over lum, for large rings
     ScratchBlock out;    // Color: result rows of the band
     ScratchBlock depth;  // float: "Z" rows of a band
+    ScratchBlock spare;  // uint16_t: a row of distances
 };
 
 }  // namespace
@@ -303,7 +356,9 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
             float *depth = zRows.direct() ? nullptr
                                           : scratchArray<float>(*s.pool, s.depth,
                                                                 size_t(w) * size_t(y1 - y0));
-            if (rowDistances(*z, zRows, y0, y1, cap, rowDist + size_t(y0) * size_t(w), depth))
+            uint16_t *spare = scratchArray<uint16_t>(*s.pool, s.spare, size_t(w));
+            if (rowDistances(*z, zRows, y0, y1, cap, rowDist + size_t(y0) * size_t(w), depth,
+                             spare))
                 return true;
             message(kMsgError, 6, "Edge dilation could not read the Z layer");
             return false;
@@ -362,7 +417,8 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
             if (!dst.direct()) dst.bind(scratchArray<Color>(*s.pool, s.out, bandSize), y0);
             Color *const runBuffer =
                 dst.direct() ? scratchArray<Color>(*s.pool, s.out, size_t(dst.runWidth())) : nullptr;
-            for (int32_t y = rowBase; y < rowEnd; ++y) {
+            // The luminance of window row y.
+            auto rankRow = [&](int32_t y) {
                 const size_t row = size_t(y - rowBase) * size_t(w);
                 for (int32_t k = 0; k < src.runCount(); ++k) {
                     const Color *c = src.run(y, k);
@@ -380,12 +436,19 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                         lr[i] = v > -3.4028235e38f ? v : never;
                     }
                 }
-            }
+            };
             const bool fast = n > kDirectScanMax;
-            if (fast)
+            int32_t ranked = rowBase;  // window rows [rowBase, ranked) have their luminance
+            if (fast) {
+                for (; ranked < rowEnd; ++ranked) rankRow(ranked);
                 s.runs.build(*s.pool, lum, w, rowEnd - rowBase, log2Floor(uint32_t(2 * n - 1)),
                              log2Floor(uint32_t(2 * n + 1)));
+            }
             for (int32_t y = y0; y < y1; ++y) {
+                // Small rings: a row is ranked just before the first row that can reach it, so
+                // the texels it read are still in the cache when they are copied or win.
+                for (const int32_t need = std::min(rowEnd, y + n + 1); ranked < need; ++ranked)
+                    rankRow(ranked);
                 const uint16_t *d = ring + size_t(y - y0) * size_t(w);
                 for (int32_t k = 0; k < src.runCount(); ++k) {
                     const Color *from = src.run(y, k);
