@@ -209,8 +209,28 @@ uint16_t ringRow(const uint16_t *__restrict own, const uint16_t *__restrict lo,
     return m;
 }
 
+/// brightestOnRing for a ring of radius R that lies inside the image, around window index c:
+/// unrolled, and without branches on the candidates' luminance.
+template <int R>
+inline int64_t brightestOnInnerRing(const float *lum, int64_t c, int64_t w) {
+    float best = -3.4028235e38f;
+    int64_t winner = -1;
+    auto visit = [&](int64_t i) {
+        const float v = lum[i];
+        const bool better = v > best;
+        best = better ? v : best;
+        winner = better ? i : winner;
+    };
+    for (int dy = -R; dy <= R; ++dy) visit(c + dy * w - R);
+    for (int dy = -R; dy <= R; ++dy) visit(c + dy * w + R);
+    for (int dx = -R + 1; dx <= R - 1; ++dx) visit(c + R * w + dx);
+    for (int dx = -R + 1; dx <= R - 1; ++dx) visit(c - R * w + dx);
+    return winner;
+}
+
 /// Rings up to this size are scanned texel by texel; larger ones use RunMaxima.
 constexpr int32_t kDirectScanMax = 6;
+static_assert(kDirectScanMax == 6, "brightestOnInnerRing is dispatched for radii 1 to 6");
 
 /// floor(log2(v)) for v >= 1.
 inline int log2Floor(uint32_t v) { return 31 - __builtin_clz(v); }
@@ -462,10 +482,24 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                             to[i] = from[i];
                             continue;
                         }
-                        const int64_t win =
-                            r > n  ? -1
-                            : fast ? brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r)
-                                   : brightestOnRing(lum, rowBase, w, h, x, y, r);
+                        int64_t win = -1;
+                        if (r > n) {
+                            // No covered texel within reach: the background colour.
+                        } else if (fast) {
+                            win = brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r);
+                        } else if (x >= r && x + r < w && y >= r && y + r < h) {
+                            const int64_t c = int64_t(y - rowBase) * w + x;
+                            switch (r) {
+                                case 1: win = brightestOnInnerRing<1>(lum, c, w); break;
+                                case 2: win = brightestOnInnerRing<2>(lum, c, w); break;
+                                case 3: win = brightestOnInnerRing<3>(lum, c, w); break;
+                                case 4: win = brightestOnInnerRing<4>(lum, c, w); break;
+                                case 5: win = brightestOnInnerRing<5>(lum, c, w); break;
+                                default: win = brightestOnInnerRing<6>(lum, c, w); break;
+                            }
+                        } else {
+                            win = brightestOnRing(lum, rowBase, w, h, x, y, r);
+                        }
                         if (win < 0) {
                             to[i] = background_;
                             continue;
