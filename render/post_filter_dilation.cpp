@@ -31,12 +31,19 @@ public:
     /// Takes the layer's grid when it has one (a layer written through it must have no
     /// observers).
     PixelRows(LayerT<T> &layer, bool write) : width_(layer.width()), runWidth_(layer.width()) {
-        if ((!write || layer.observers().empty()) && layer.tileGrid(grid_))
+        if ((!write || layer.observers().empty()) && layer.tileGrid(grid_)) {
             runWidth_ = grid_.tileWidth;
+            // Tiles of a power-of-two size are addressed with shifts.
+            const auto isPow2 = [](int32_t v) { return v > 0 && (v & (v - 1)) == 0; };
+            if (isPow2(grid_.tileWidth) && isPow2(grid_.tileHeight)) {
+                shiftX_ = __builtin_ctz(uint32_t(grid_.tileWidth));
+                shiftY_ = __builtin_ctz(uint32_t(grid_.tileHeight));
+            }
+        }
     }
     bool direct() const { return grid_.base != nullptr; }
     /// Goes through band buffers even when the layer has a grid.
-    void dropGrid() { grid_ = TileGrid<T>(), runWidth_ = width_; }
+    void dropGrid() { grid_ = TileGrid<T>(), runWidth_ = width_, shiftX_ = -1; }
     /// Without a grid: the buffer holding rows from firstRow on.
     void bind(T *buffer, int32_t firstRow) { buffer_ = buffer, firstRow_ = firstRow; }
     /// Texels per run: run k of a row starts at x = k * runWidth().
@@ -52,10 +59,18 @@ public:
                int64_t(y % grid_.tileHeight) * grid_.tileWidth;
     }
     /// Texel (x, y).
-    T &at(int32_t x, int32_t y) const { return run(y, x / runWidth_)[x % runWidth_]; }
+    T &at(int32_t x, int32_t y) const {
+        if (!direct()) return buffer_[int64_t(y - firstRow_) * width_ + x];
+        if (shiftX_ < 0) return run(y, x / runWidth_)[x % runWidth_];
+        const int64_t tile = int64_t(y >> shiftY_) * grid_.tilesPerRow + (x >> shiftX_);
+        return grid_.base[(tile << (shiftX_ + shiftY_)) +
+                          (int64_t(y & ((1 << shiftY_) - 1)) << shiftX_) +
+                          (x & ((1 << shiftX_) - 1))];
+    }
 
 private:
     int32_t width_, runWidth_;
+    int shiftX_ = -1, shiftY_ = -1;
     TileGrid<T> grid_;
     T *buffer_ = nullptr;
     int32_t firstRow_ = 0;
@@ -209,23 +224,83 @@ uint16_t ringRow(const uint16_t *__restrict own, const uint16_t *__restrict lo,
     return m;
 }
 
+/// The rank of n texels c: their luminance where dist is 0 (covered), -infinity elsewhere,
+/// so that only covered texels can win (the ring's radius is known, no other test is needed).
+/// A NaN or lowest luminance never beats the starting value either.
+void rankRun(const Color *c, const uint16_t *dist, float *lum, int32_t n) {
+    const float never = -std::numeric_limits<float>::infinity();
+    int32_t i = 0;
+#ifdef __SSE2__
+    const __m128 kr = _mm_set1_ps(0.299f), kg = _mm_set1_ps(0.587f), kb = _mm_set1_ps(0.114f);
+    const __m128 lowest = _mm_set1_ps(-3.4028235e38f), nev = _mm_set1_ps(never);
+    for (; i + 4 <= n; i += 4) {
+        const __m128i d = _mm_loadl_epi64(reinterpret_cast<const __m128i *>(dist + i));
+        const __m128i background = _mm_cmpgt_epi16(d, _mm_setzero_si128());  // d < 32768
+        if (_mm_movemask_epi8(background) == 0xffff) {
+            // Most of the image: its texels are not even read.
+            _mm_storeu_ps(lum + i, nev);
+            continue;
+        }
+        __m128 r = _mm_loadu_ps(&c[i].r), g = _mm_loadu_ps(&c[i + 1].r);
+        __m128 b = _mm_loadu_ps(&c[i + 2].r), a = _mm_loadu_ps(&c[i + 3].r);
+        _MM_TRANSPOSE4_PS(r, g, b, a);
+        // The same operations in the same order as Color::luminance.
+        const __m128 v =
+            _mm_add_ps(_mm_add_ps(_mm_mul_ps(kr, r), _mm_mul_ps(kg, g)), _mm_mul_ps(kb, b));
+        const __m128 covered = _mm_castsi128_ps(_mm_unpacklo_epi16(
+            _mm_cmpeq_epi16(d, _mm_setzero_si128()), _mm_cmpeq_epi16(d, _mm_setzero_si128())));
+        const __m128 keep = _mm_and_ps(covered, _mm_cmpgt_ps(v, lowest));
+        _mm_storeu_ps(lum + i, _mm_or_ps(_mm_and_ps(keep, v), _mm_andnot_ps(keep, nev)));
+    }
+#endif
+    for (; i < n; ++i) {
+        if (dist[i] != 0) {
+            lum[i] = never;
+            continue;
+        }
+        const float v = c[i].luminance();
+        lum[i] = v > -3.4028235e38f ? v : never;
+    }
+}
+
 /// brightestOnRing for a ring of radius R that lies inside the image, around window index c:
-/// unrolled, and without branches on the candidates' luminance.
+/// unrolled, without branches on the candidates' luminance, and with each side of the ring
+/// searched on its own (sides compared afterwards in ring order, a later side winning only
+/// when brighter, which is what one scan in ring order gives). Returns the winner's offset
+/// from the centre in dx and dy; false when no candidate beats the starting luminance.
 template <int R>
-inline int64_t brightestOnInnerRing(const float *lum, int64_t c, int64_t w) {
-    float best = -3.4028235e38f;
-    int64_t winner = -1;
-    auto visit = [&](int64_t i) {
-        const float v = lum[i];
-        const bool better = v > best;
-        best = better ? v : best;
-        winner = better ? i : winner;
-    };
-    for (int dy = -R; dy <= R; ++dy) visit(c + dy * w - R);
-    for (int dy = -R; dy <= R; ++dy) visit(c + dy * w + R);
-    for (int dx = -R + 1; dx <= R - 1; ++dx) visit(c + R * w + dx);
-    for (int dx = -R + 1; dx <= R - 1; ++dx) visit(c - R * w + dx);
-    return winner;
+inline bool brightestOnInnerRing(const float *lum, int64_t c, int64_t w, int32_t &dx,
+                                 int32_t &dy) {
+    struct Side {
+        float best = -3.4028235e38f;
+        int32_t k = -1;
+        void visit(float v, int32_t ordinal) {
+            const bool better = v > best;
+            best = better ? v : best;
+            k = better ? ordinal : k;
+        }
+    } left, right, top, bottom;
+    for (int i = 0; i <= 2 * R; ++i) {
+        left.visit(lum[c + (i - R) * w - R], i);
+        right.visit(lum[c + (i - R) * w + R], i);
+    }
+    for (int i = 0; i <= 2 * R - 2; ++i) {
+        top.visit(lum[c + R * w + i - R + 1], i);
+        bottom.visit(lum[c - R * w + i - R + 1], i);
+    }
+    Side win = left;
+    int side = 0;
+    if (right.best > win.best) win = right, side = 1;
+    if (top.best > win.best) win = top, side = 2;
+    if (bottom.best > win.best) win = bottom, side = 3;
+    if (win.k < 0) return false;
+    switch (side) {
+        case 0: dx = -R, dy = win.k - R; break;
+        case 1: dx = R, dy = win.k - R; break;
+        case 2: dx = win.k - R + 1, dy = R; break;
+        default: dx = win.k - R + 1, dy = -R; break;
+    }
+    return true;
 }
 
 /// Rings up to this size are scanned texel by texel; larger ones use RunMaxima.
@@ -420,8 +495,6 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         const int32_t rowBase = std::max(0, y0 - n), rowEnd = std::min(h, y1 + n);
         const size_t window = size_t(w) * size_t(rowEnd - rowBase);
         float *const lum = scratchArray<float>(*s.pool, s.lum, window);
-        // Only covered texels can win; the ring's radius is known, so no other test is needed.
-        const float never = -std::numeric_limits<float>::infinity();
         const uint16_t *windowDist = rowDist + size_t(rowBase) * size_t(w);
         for (size_t l = 0; l < sources.size(); ++l) {
             PixelRows<Color> src = srcRows[l], dst = dstRows[l];
@@ -443,18 +516,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                 for (int32_t k = 0; k < src.runCount(); ++k) {
                     const Color *c = src.run(y, k);
                     const size_t x0 = row + size_t(k) * size_t(src.runWidth());
-                    const uint16_t *covered = windowDist + x0;
-                    float *lr = lum + x0;
-                    for (int32_t i = 0, e = src.runLength(k); i < e; ++i) {
-                        // Background texels are not even read: most of the image is.
-                        if (covered[i] != 0) {
-                            lr[i] = never;
-                            continue;
-                        }
-                        const float v = c[i].luminance();
-                        // A NaN or lowest luminance never beats the starting value either.
-                        lr[i] = v > -3.4028235e38f ? v : never;
-                    }
+                    rankRun(c, windowDist + x0, lum + x0, src.runLength(k));
                 }
             };
             const bool fast = n > kDirectScanMax;
@@ -489,14 +551,18 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                             win = brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r);
                         } else if (x >= r && x + r < w && y >= r && y + r < h) {
                             const int64_t c = int64_t(y - rowBase) * w + x;
+                            int32_t dx = 0, dy = 0;
+                            bool found = false;
                             switch (r) {
-                                case 1: win = brightestOnInnerRing<1>(lum, c, w); break;
-                                case 2: win = brightestOnInnerRing<2>(lum, c, w); break;
-                                case 3: win = brightestOnInnerRing<3>(lum, c, w); break;
-                                case 4: win = brightestOnInnerRing<4>(lum, c, w); break;
-                                case 5: win = brightestOnInnerRing<5>(lum, c, w); break;
-                                default: win = brightestOnInnerRing<6>(lum, c, w); break;
+                                case 1: found = brightestOnInnerRing<1>(lum, c, w, dx, dy); break;
+                                case 2: found = brightestOnInnerRing<2>(lum, c, w, dx, dy); break;
+                                case 3: found = brightestOnInnerRing<3>(lum, c, w, dx, dy); break;
+                                case 4: found = brightestOnInnerRing<4>(lum, c, w, dx, dy); break;
+                                case 5: found = brightestOnInnerRing<5>(lum, c, w, dx, dy); break;
+                                default: found = brightestOnInnerRing<6>(lum, c, w, dx, dy); break;
                             }
+                            to[i] = found ? src.at(x + dx, y + dy) : background_;
+                            continue;
                         } else {
                             win = brightestOnRing(lum, rowBase, w, h, x, y, r);
                         }
