@@ -398,6 +398,7 @@ struct DilationScratch {
     ScratchBlock out;    // Color: result rows of the band
     ScratchBlock depth;  // float: "Z" rows of a band
     ScratchBlock spare;  // uint16_t: a row of distances
+    ScratchBlock dist;   // uint16_t: row distances of the band's window
 };
 
 }  // namespace
@@ -436,29 +437,9 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
     }
 
     if (w == 0 || h == 0) return results.place(sources_);
-    ScratchBlock rowDistBlock = frame.scratch().borrow(size_t(w) * size_t(h) * sizeof(uint16_t));
-    uint16_t *const rowDist = rowDistBlock.as<uint16_t>();
-    if (!rowDist) {
-        message(kMsgError, 6, "Edge dilation is out of memory");
-        return false;
-    }
     std::vector<DilationScratch> scratch;
     for (int t = 0; t < std::max(threads_, 1); ++t) scratch.emplace_back(frame.scratch());
     const PixelRows<float> zRows(*z, false);
-    RowBands distBands(h, kFilterBandRows, threads_, nullptr);
-    if (!distBands.run([&](int32_t y0, int32_t y1, int thread) {
-            DilationScratch &s = scratch[size_t(thread)];
-            float *depth = zRows.direct() ? nullptr
-                                          : scratchArray<float>(*s.pool, s.depth,
-                                                                size_t(w) * size_t(y1 - y0));
-            uint16_t *spare = scratchArray<uint16_t>(*s.pool, s.spare, size_t(w));
-            if (rowDistances(*z, zRows, y0, y1, cap, rowDist + size_t(y0) * size_t(w), depth,
-                             spare))
-                return true;
-            message(kMsgError, 6, "Edge dilation could not read the Z layer");
-            return false;
-        }))
-        return false;
 
     const std::vector<uint16_t> farRow(size_t(w), cap);  // stands for rows outside the image
     std::vector<PixelRows<Color>> srcRows, dstRows;
@@ -478,24 +459,33 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         const size_t bandSize = size_t(w) * size_t(y1 - y0);
         uint16_t *const ring = scratchArray<uint16_t>(*s.pool, s.ring, bandSize);
 
-        // The ring radius of every texel of the band.
-        for (int32_t y = y0; y < y1; ++y) {
-            uint16_t m = ringRow(rowDist + size_t(y) * size_t(w), nullptr, nullptr, 0,
-                                 ring + size_t(y - y0) * size_t(w), w);
-            for (int32_t dy = 1; dy <= n && m > dy; ++dy) {
-                const uint16_t *lo =
-                    y - dy >= 0 ? rowDist + size_t(y - dy) * size_t(w) : farRow.data();
-                const uint16_t *hi =
-                    y + dy < h ? rowDist + size_t(y + dy) * size_t(w) : farRow.data();
-                m = ringRow(nullptr, lo, hi, uint16_t(dy),
-                            ring + size_t(y - y0) * size_t(w), w);
-            }
-        }
-
+        // The band reaches n rows above and below itself: its window.
         const int32_t rowBase = std::max(0, y0 - n), rowEnd = std::min(h, y1 + n);
         const size_t window = size_t(w) * size_t(rowEnd - rowBase);
+
+        // The row distances of the window (adjacent bands compute their shared margins twice;
+        // a whole-image table would cost more in memory traffic).
+        uint16_t *const windowDist = scratchArray<uint16_t>(*s.pool, s.dist, window);
+        float *depth = zRows.direct() ? nullptr : scratchArray<float>(*s.pool, s.depth, window);
+        uint16_t *spare = scratchArray<uint16_t>(*s.pool, s.spare, size_t(w));
+        if (!rowDistances(*z, zRows, rowBase, rowEnd, cap, windowDist, depth, spare)) {
+            message(kMsgError, 6, "Edge dilation could not read the Z layer");
+            return false;
+        }
+        auto distRow = [&](int32_t y) {
+            return y >= 0 && y < h ? windowDist + size_t(y - rowBase) * size_t(w) : farRow.data();
+        };
+
+        // The ring radius of every texel of the band.
+        for (int32_t y = y0; y < y1; ++y) {
+            uint16_t m = ringRow(distRow(y), nullptr, nullptr, 0,
+                                 ring + size_t(y - y0) * size_t(w), w);
+            for (int32_t dy = 1; dy <= n && m > dy; ++dy)
+                m = ringRow(nullptr, distRow(y - dy), distRow(y + dy), uint16_t(dy),
+                            ring + size_t(y - y0) * size_t(w), w);
+        }
+
         float *const lum = scratchArray<float>(*s.pool, s.lum, window);
-        const uint16_t *windowDist = rowDist + size_t(rowBase) * size_t(w);
         for (size_t l = 0; l < sources.size(); ++l) {
             PixelRows<Color> src = srcRows[l], dst = dstRows[l];
             if (!src.direct()) {
