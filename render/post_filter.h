@@ -91,6 +91,18 @@ inline void streamColors(Color *dst, const Color *src, int32_t n) {
     std::memcpy(dst, src, size_t(n) * sizeof(Color));
 }
 
+/// Sets n colours at dst to c like streamColors.
+inline void streamFill(Color *dst, const Color &c, int32_t n) {
+#ifdef __SSE2__
+    if ((reinterpret_cast<uintptr_t>(dst) & 15) == 0) {
+        const __m128 v = _mm_loadu_ps(&c.r);
+        for (int32_t i = 0; i < n; ++i) _mm_stream_ps(&dst[i].r, v);
+        return;
+    }
+#endif
+    std::fill(dst, dst + n, c);
+}
+
 /// Orders the streamed stores of this thread before what follows.
 inline void streamFence() {
 #ifdef __SSE2__

@@ -527,8 +527,23 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                     // In place, results go to the tile through a run buffer (see streamColors).
                     Color *const tile = dst.run(y, k);
                     Color *const to = dst.direct() ? runBuffer : tile;
-                    const int32_t x0 = k * src.runWidth();
-                    for (int32_t i = 0, e = src.runLength(k); i < e; ++i) {
+                    const int32_t x0 = k * src.runWidth(), len = src.runLength(k);
+                    // Most runs lie wholly inside an island or wholly out of reach.
+                    uint16_t lo = 65535, hi = 0;
+                    for (int32_t i = 0; i < len; ++i)
+                        lo = std::min(lo, d[x0 + i]), hi = std::max(hi, d[x0 + i]);
+                    if (hi == 0 || lo > n) {
+                        if (hi == 0 && dst.direct())
+                            streamColors(tile, from, len);
+                        else if (hi == 0)
+                            std::memcpy(tile, from, size_t(len) * sizeof(Color));
+                        else if (dst.direct())
+                            streamFill(tile, background_, len);
+                        else
+                            std::fill(tile, tile + len, background_);
+                        continue;
+                    }
+                    for (int32_t i = 0; i < len; ++i) {
                         const int32_t x = x0 + i, r = d[x];
                         if (r == 0) {
                             to[i] = from[i];
@@ -563,7 +578,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                         const int32_t wy = int32_t(win / w);
                         to[i] = src.at(int32_t(win - int64_t(wy) * w), rowBase + wy);
                     }
-                    if (dst.direct()) streamColors(tile, runBuffer, src.runLength(k));
+                    if (dst.direct()) streamColors(tile, runBuffer, len);
                 }
             }
             streamFence();
