@@ -76,6 +76,26 @@ private:
     int32_t firstRow_ = 0;
 };
 
+/// The smallest and largest of n ring radii (all below 32768).
+inline void runRange(const uint16_t *d, int32_t n, uint16_t &lo, uint16_t &hi) {
+    int32_t i = 0;
+#ifdef __SSE2__
+    if (n >= 8) {
+        __m128i vlo = _mm_set1_epi16(32767), vhi = _mm_setzero_si128();
+        for (; i + 8 <= n; i += 8) {
+            const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i *>(d + i));
+            vlo = _mm_min_epi16(vlo, v);
+            vhi = _mm_max_epi16(vhi, v);
+        }
+        alignas(16) uint16_t l[8], h[8];
+        _mm_store_si128(reinterpret_cast<__m128i *>(l), vlo);
+        _mm_store_si128(reinterpret_cast<__m128i *>(h), vhi);
+        for (int k = 0; k < 8; ++k) lo = std::min(lo, l[k]), hi = std::max(hi, h[k]);
+    }
+#endif
+    for (; i < n; ++i) lo = std::min(lo, d[i]), hi = std::max(hi, d[i]);
+}
+
 /// One doubling step of the row distances: out[x] = min(in[x], in[x - step] + step,
 /// in[x + step] + step) within the row (values stay below 65536 - step). Separate buffers:
 /// reading what the step just stored would stall on every vector.
@@ -530,8 +550,7 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                     const int32_t x0 = k * src.runWidth(), len = src.runLength(k);
                     // Most runs lie wholly inside an island or wholly out of reach.
                     uint16_t lo = 65535, hi = 0;
-                    for (int32_t i = 0; i < len; ++i)
-                        lo = std::min(lo, d[x0 + i]), hi = std::max(hi, d[x0 + i]);
+                    runRange(d + x0, len, lo, hi);
                     if (hi == 0 || lo > n) {
                         if (hi == 0 && dst.direct())
                             streamColors(tile, from, len);
