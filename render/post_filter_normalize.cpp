@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <cmath>
 #include <optional>
+#include <type_traits>
 #ifdef __SSE2__
 #include <emmintrin.h>
 #endif
@@ -155,9 +156,13 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     // Gather: per thread ranges, the instance of every texel, texels without one per band.
     const int32_t bandRows = kFilterBandRows;
     const int32_t bandCount = (h + bandRows - 1) / bandRows;
-    ScratchBlock idBlock = frame.scratch().borrow(size_t(w) * size_t(h) * sizeof(int32_t));
-    int32_t *const ids = idBlock.as<int32_t>();
-    if (!ids) {
+    // The slot of every texel, in 16 bits when the slots allow (most runs): the table is
+    // written once and read once, so its size is memory traffic.
+    const bool compact = slots < 0xfffe;
+    ScratchBlock idBlock = frame.scratch().borrow(size_t(w) * size_t(h) *
+                                                  (compact ? sizeof(uint16_t) : sizeof(int32_t)));
+    void *const idTable = idBlock.as<void>();
+    if (!idTable) {
         message(kMsgError, 6, "Shape normalization of %s is out of memory", source_.c_str());
         return false;
     }
@@ -167,13 +172,16 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     std::vector<int64_t> orphanCounts(size_t(bandCount), 0);
     std::vector<BandScratch> scratch;
     for (int t = 0; t < threads; ++t) scratch.emplace_back(frame.scratch());
-    // Background texels get the id -1, texels without an instance -2.
-    constexpr int32_t kBackground = -1, kOrphan = -2;
+    std::vector<ScratchBlock> lookups(static_cast<size_t>(threads));
+    // Background texels get the id Id(-1), texels without an instance Id(-2).
     std::optional<TexelRuns> gatherRuns(std::in_place, *in, nullptr, z);
-    RowBands gather(h, bandRows, threads, nullptr);
-    const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
+    auto gatherBand = [&](auto *ids, int32_t y0, int32_t y1, int thread) {
+        using Id = std::remove_pointer_t<decltype(ids)>;
+        constexpr Id kBackground = Id(-1), kOrphan = Id(-2);
+        int32_t *const looked = scratchArray<int32_t>(frame.scratch(), lookups[size_t(thread)],
+                                                      size_t(w) * size_t(y1 - y0));
         for (int32_t y = y0; y < y1; ++y) {
-            int32_t *id = ids + size_t(y) * size_t(w);
+            int32_t *id = looked + size_t(y - y0) * size_t(w);
             if (instances_)
                 instances_->instancesOfRow(y, w, id);
             else
@@ -184,7 +192,8 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         const bool read = gatherRuns->run(
             y0, y1, scratch[size_t(thread)],
             [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *, const float *depth) {
-                int32_t *id = ids + size_t(y) * size_t(w) + size_t(x0);
+                const int32_t *found = looked + size_t(y - y0) * size_t(w) + size_t(x0);
+                Id *id = ids + size_t(y) * size_t(w) + size_t(x0);
                 // Neighbours mostly share their instance: its ranges stay in registers.
                 RunRanges run;
                 int32_t current = -1;
@@ -193,31 +202,44 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
                         id[i] = kBackground;
                         continue;
                     }
-                    if (instances_ && (id[i] < 0 || id[i] >= count)) {
+                    const int32_t slot = found[i];
+                    if (instances_ && (slot < 0 || slot >= count)) {
                         id[i] = kOrphan;
                         ++orphansHere;
                         continue;
                     }
-                    if (id[i] != current) {
+                    id[i] = Id(slot);
+                    if (slot != current) {
                         if (current >= 0) run.mergeInto(acc[current]);
-                        current = id[i];
+                        current = slot;
                         run.reset();
                     }
                     run.add(src[i]);
                 }
                 if (current >= 0) run.mergeInto(acc[current]);
             });
+        orphanCounts[size_t(y0 / bandRows)] = orphansHere;
+        return read;
+    };
+    RowBands gather(h, bandRows, threads, nullptr);
+    const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
+        const bool read =
+            compact ? gatherBand(static_cast<uint16_t *>(idTable), y0, y1, thread)
+                    : gatherBand(static_cast<int32_t *>(idTable), y0, y1, thread);
         if (!read) {
             message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
         }
-        orphanCounts[size_t(y0 / bandRows)] = orphansHere;
         return true;
     });
     gatherRuns.reset();
     if (!gathered) return false;
 
     // The texels without an instance, in row order whatever the thread count.
+    auto isOrphan = [&](size_t i) {
+        return compact ? static_cast<const uint16_t *>(idTable)[i] == uint16_t(-2)
+                       : static_cast<const int32_t *>(idTable)[i] == -2;
+    };
     size_t logged = 0;
     int64_t orphanTotal = 0;
     for (int32_t b = 0; b < bandCount; ++b) {
@@ -225,7 +247,7 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         if (orphanCounts[size_t(b)] == 0 || logged >= kMaxLoggedTexels) continue;
         for (int32_t y = b * bandRows; y < std::min(h, (b + 1) * bandRows); ++y)
             for (int32_t x = 0; x < w && logged < kMaxLoggedTexels; ++x)
-                if (ids[size_t(y) * size_t(w) + size_t(x)] == kOrphan) {
+                if (isOrphan(size_t(y) * size_t(w) + size_t(x))) {
                     message(kMsgDebug, 6, "No instance found in sampled pixel %d, %d", x, y);
                     ++logged;
                 }
@@ -288,14 +310,28 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     // Remap the covered texels that have an instance; the rest are copied.
     TexelRuns remapRuns(*in, out, nullptr);
     RowBands remap(h, bandRows, threads, io);
-    const bool ok = remap.run([&](int32_t y0, int32_t y1, int thread) {
-        const bool done = remapRuns.run(
+    auto remapBand = [&](const auto *ids, int32_t y0, int32_t y1, int thread) {
+        using Id = std::remove_const_t<std::remove_pointer_t<decltype(ids)>>;
+        return remapRuns.run(
             y0, y1, scratch[size_t(thread)],
             [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *dst, const float *) {
-                const int32_t *id = ids + size_t(y) * size_t(w) + size_t(x0);
-                for (int32_t i = 0; i < n; ++i)
-                    dst[i] = id[i] < 0 ? src[i] : remaps[size_t(id[i])].apply(src[i]);
+                const Id *id = ids + size_t(y) * size_t(w) + size_t(x0);
+                for (int32_t i = 0; i < n; ++i) {
+                    // Background Id(-1) and no instance Id(-2) are the two largest codes of
+                    // the unsigned table, the two negative ones of the signed one.
+                    bool slot;
+                    if constexpr (std::is_signed_v<Id>)
+                        slot = id[i] >= 0;
+                    else
+                        slot = id[i] < Id(-2);
+                    dst[i] = slot ? remaps[size_t(id[i])].apply(src[i]) : src[i];
+                }
             });
+    };
+    const bool ok = remap.run([&](int32_t y0, int32_t y1, int thread) {
+        const bool done =
+            compact ? remapBand(static_cast<const uint16_t *>(idTable), y0, y1, thread)
+                    : remapBand(static_cast<const int32_t *>(idTable), y0, y1, thread);
         if (!done) {
             message(kMsgError, 6, "Shape normalization could not remap layer %s", source_.c_str());
             return false;

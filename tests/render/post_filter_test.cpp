@@ -667,6 +667,45 @@ TEST_F(ShapeNormalizationTest, TexelsWithoutInstanceAreLoggedAndMissingInputsFai
     EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
 }
 
+TEST_F(ShapeNormalizationTest, ManyInstancesGiveWhatFewGive) {
+    // More instances than a 16-bit slot table holds: the texels of instances 0 and 69999 must
+    // come out as those of instances 0 and 1 of a two-instance frame.
+    class Spread final : public ox::TexelInstanceInterface {
+    public:
+        void instancesOfRow(int32_t y, int32_t width, int32_t *ids) const override {
+            split_.instancesOfRow(y, width, ids);
+            for (int32_t x = 0; x < width; ++x)
+                if (ids[x] == 1) ids[x] = 69999;
+        }
+        int32_t instanceCount() const override { return 70000; }
+        std::string instanceName(int32_t i) const override { return std::to_string(i); }
+
+    private:
+        FakeInstances split_{3, {{4, 1}}};
+    };
+    const std::vector<float> z = {1, 1, 1, 1, kBg, 1, 1, 1, 1, 1, 1, 1};
+    std::vector<Color> in(12);
+    for (size_t i = 0; i < in.size(); ++i) in[i] = Color(float(i), float(i % 5), 2, float(i % 3));
+    const ox::NormalizeOptions options{ox::NormalizeRange::MinMax, ox::NormalizeOutput::PerChannel,
+                                       ox::NormalizeComponent::Shape, true};
+    FakeInstances few(3, {{4, 1}});
+    Spread many;
+    std::vector<Color> results[2];
+    const ox::TexelInstanceInterface *lookups[2] = {&few, &many};
+    for (int k = 0; k < 2; ++k) {
+        auto f = makeFrame(6, 2, z, {{"beauty", in}});
+        ox::ShapeNormalizationFilter filter("beauty", options, lookups[k]);
+        filter.setThreadCount(2);
+        ASSERT_TRUE(filter.run(*f, nullptr));
+        results[k] = readColors(*f, "beauty");
+        ASSERT_EQ(filter.record().shapes.size(), 2u);
+    }
+    EXPECT_TRUE(sameBits(results[0], results[1]));
+    EXPECT_EQ(results[0][4], in[4]);    // background
+    EXPECT_EQ(results[0][10], in[10]);  // (4, 1) has no instance
+    EXPECT_NE(results[0][1], in[1]);
+}
+
 TEST_F(ShapeNormalizationTest, ChainGivesTheSameBytesWhateverTilesAndThreads) {
     // Premultiply, dilation and normalization over blobs on a frame of several partial tiles:
     // layers worked in place (default tiles) or through band copies (small tiles), on one to
