@@ -323,88 +323,117 @@ inline bool brightestOnInnerRing(const float *lum, int64_t c, int64_t w, int32_t
     return true;
 }
 
-/// Rings up to this size are scanned texel by texel; larger ones use RunMaxima.
+/// Rings up to this size are scanned texel by texel; larger ones use RunPeaks.
 constexpr int32_t kDirectScanMax = 6;
 static_assert(kDirectScanMax == 6, "brightestOnInnerRing is dispatched for radii 1 to 6");
 
 /// floor(log2(v)) for v >= 1.
 inline int log2Floor(uint32_t v) { return 31 - __builtin_clz(v); }
 
-/// Sparse tables over a band's window: row[k] holds, for every texel, the index of the first
-/// brightest texel of the 2^k texels from it to the right, col[k] the same upwards (level 0,
-/// the texel itself, is not stored). Any run along a row or a column is then answered from two
-/// overlapping table entries.
-struct RunMaxima {
+/// out[i] = max(a[i], b[i]) for n values (no NaN among them).
+inline void maxOf(const float *a, const float *b, float *out, int32_t n) {
+    int32_t i = 0;
+#ifdef __SSE2__
+    for (; i + 4 <= n; i += 4)
+        _mm_storeu_ps(out + i, _mm_max_ps(_mm_loadu_ps(a + i), _mm_loadu_ps(b + i)));
+#endif
+    for (; i < n; ++i) out[i] = std::max(a[i], b[i]);
+}
+
+/// Sparse tables over a band's window: row[k] holds, for every texel, the highest luminance
+/// of the 2^k texels from it to the right, col[k] the same upwards (level 0 is the luminance
+/// itself). Any run along a row or a column is then answered from two overlapping entries.
+struct RunPeaks {
     static constexpr int kLevels = 16;
     ScratchBlock rowBlocks[kLevels], colBlocks[kLevels];
-    int32_t *row[kLevels] = {}, *col[kLevels] = {};
+    float *row[kLevels] = {}, *col[kLevels] = {};
 
     void build(ScratchPool &pool, const float *lum, int32_t w, int32_t rows, int rowLevels,
                int colLevels) {
         const size_t n = size_t(w) * size_t(rows);
         for (int k = 1; k <= rowLevels; ++k) {
-            int32_t *t = row[k] = scratchArray<int32_t>(pool, rowBlocks[k], n);
+            float *t = row[k] = scratchArray<float>(pool, rowBlocks[k], n);
+            const float *prev = k == 1 ? lum : row[k - 1];
             const int32_t half = 1 << (k - 1);
+            if (2 * half > w) continue;  // no run of this length fits a row
             for (int32_t y = 0; y < rows; ++y) {
-                const int32_t base = y * w;
-                for (int32_t x = 0; x + 2 * half <= w; ++x) {
-                    const int32_t a = k == 1 ? base + x : row[k - 1][size_t(base + x)];
-                    const int32_t b =
-                        k == 1 ? base + x + half : row[k - 1][size_t(base + x + half)];
-                    t[size_t(base + x)] = lum[b] > lum[a] ? b : a;
-                }
+                const size_t base = size_t(y) * size_t(w);
+                maxOf(prev + base, prev + base + half, t + base, w - 2 * half + 1);
             }
         }
         for (int k = 1; k <= colLevels; ++k) {
-            int32_t *t = col[k] = scratchArray<int32_t>(pool, colBlocks[k], n);
+            float *t = col[k] = scratchArray<float>(pool, colBlocks[k], n);
+            const float *prev = k == 1 ? lum : col[k - 1];
             const int32_t half = 1 << (k - 1);
-            for (int32_t y = 0; y + 2 * half <= rows; ++y)
-                for (int32_t x = 0; x < w; ++x) {
-                    const int32_t i = y * w + x, j = i + half * w;
-                    const int32_t a = k == 1 ? i : col[k - 1][size_t(i)];
-                    const int32_t b = k == 1 ? j : col[k - 1][size_t(j)];
-                    t[size_t(i)] = lum[b] > lum[a] ? b : a;
-                }
+            for (int32_t y = 0; y + 2 * half <= rows; ++y) {
+                const size_t base = size_t(y) * size_t(w);
+                maxOf(prev + base, prev + base + size_t(half) * size_t(w), t + base, w);
+            }
         }
     }
 
-    /// The first brightest texel of window row wy from xa to xb (inclusive).
-    int32_t alongRow(const float *lum, int32_t w, int32_t wy, int32_t xa, int32_t xb) const {
+    /// The highest luminance of window row wy from xa to xb (inclusive).
+    float alongRow(const float *lum, int32_t w, int32_t wy, int32_t xa, int32_t xb) const {
         const int k = log2Floor(uint32_t(xb - xa + 1));
-        const int32_t i = wy * w + xa, j = wy * w + xb - (1 << k) + 1;
-        if (k == 0) return i;
-        const int32_t a = row[k][size_t(i)], b = row[k][size_t(j)];
-        return lum[b] > lum[a] ? b : a;
+        const size_t i = size_t(wy) * size_t(w) + size_t(xa);
+        if (k == 0) return lum[i];
+        return std::max(row[k][i], row[k][size_t(wy) * size_t(w) + size_t(xb - (1 << k) + 1)]);
     }
 
-    /// The first brightest texel of window column x from row ya to yb (inclusive).
-    int32_t alongColumn(const float *lum, int32_t w, int32_t x, int32_t ya, int32_t yb) const {
+    /// The first texel (window index) of window row wy from xa to xb whose luminance is best,
+    /// the highest of the run: blocks without it are skipped, largest first.
+    int64_t firstAlongRow(const float *lum, int32_t w, int32_t wy, int32_t xa, int32_t xb,
+                          float best) const {
+        const size_t base = size_t(wy) * size_t(w);
+        int32_t p = xa;
+        for (int k = log2Floor(uint32_t(xb - xa + 1)); k >= 0; --k) {
+            if (p + (1 << k) - 1 > xb) continue;
+            if ((k == 0 ? lum : row[k])[base + size_t(p)] < best) p += 1 << k;
+        }
+        return int64_t(base) + p;
+    }
+
+    /// The same along window column x from row ya to yb.
+    int64_t firstAlongColumn(const float *lum, int32_t w, int32_t x, int32_t ya, int32_t yb,
+                             float best) const {
+        int32_t p = ya;
+        for (int k = log2Floor(uint32_t(yb - ya + 1)); k >= 0; --k) {
+            if (p + (1 << k) - 1 > yb) continue;
+            if ((k == 0 ? lum : col[k])[size_t(p) * size_t(w) + size_t(x)] < best) p += 1 << k;
+        }
+        return int64_t(p) * w + x;
+    }
+
+    /// The highest luminance of window column x from row ya to yb (inclusive).
+    float alongColumn(const float *lum, int32_t w, int32_t x, int32_t ya, int32_t yb) const {
         const int k = log2Floor(uint32_t(yb - ya + 1));
-        const int32_t i = ya * w + x, j = (yb - (1 << k) + 1) * w + x;
-        if (k == 0) return i;
-        const int32_t a = col[k][size_t(i)], b = col[k][size_t(j)];
-        return lum[b] > lum[a] ? b : a;
+        const size_t i = size_t(ya) * size_t(w) + size_t(x);
+        if (k == 0) return lum[i];
+        return std::max(col[k][i], col[k][size_t(yb - (1 << k) + 1) * size_t(w) + size_t(x)]);
     }
 };
 
-/// brightestOnRing answered from the run maxima: the first brightest texel of each of the four
-/// sides, compared in ring order.
-inline int64_t brightestOnRingFast(const RunMaxima &t, const float *lum, int32_t rowBase, int32_t w,
+/// brightestOnRing answered from the run peaks: the highest luminance of each of the four
+/// sides, compared in ring order (a later side wins only when brighter), then the first texel
+/// of the winning side that has it.
+inline int64_t brightestOnRingFast(const RunPeaks &t, const float *lum, int32_t rowBase, int32_t w,
                                    int32_t h, int32_t x, int32_t y, int32_t r) {
     float best = -3.4028235e38f;
-    int64_t winner = -1;
-    auto visit = [&](int32_t i) {
-        if (lum[i] > best) best = lum[i], winner = i;
+    int side = -1;
+    auto visit = [&](float v, int s) {
+        if (v > best) best = v, side = s;
     };
     const int32_t ya = std::max(0, y - r) - rowBase, yb = std::min(h - 1, y + r) - rowBase;
-    if (x - r >= 0) visit(t.alongColumn(lum, w, x - r, ya, yb));
-    if (x + r < w) visit(t.alongColumn(lum, w, x + r, ya, yb));
+    if (x - r >= 0) visit(t.alongColumn(lum, w, x - r, ya, yb), 0);
+    if (x + r < w) visit(t.alongColumn(lum, w, x + r, ya, yb), 1);
     const int32_t xa = std::max(0, x - r + 1), xb = std::min(w - 1, x + r - 1);
     if (xa <= xb) {
-        if (y + r < h) visit(t.alongRow(lum, w, y + r - rowBase, xa, xb));
-        if (y - r >= 0) visit(t.alongRow(lum, w, y - r - rowBase, xa, xb));
+        if (y + r < h) visit(t.alongRow(lum, w, y + r - rowBase, xa, xb), 2);
+        if (y - r >= 0) visit(t.alongRow(lum, w, y - r - rowBase, xa, xb), 3);
     }
-    return winner;
+    if (side < 0) return -1;
+    if (side <= 1) return t.firstAlongColumn(lum, w, side == 0 ? x - r : x + r, ya, yb, best);
+    return t.firstAlongRow(lum, w, (side == 2 ? y + r : y - r) - rowBase, xa, xb, best);
 }
 
 /// Per-thread scratch of the dilation rows.
@@ -414,7 +443,7 @@ struct DilationScratch {
     ScratchBlock ring;   // uint16_t: ring radius per texel of the band
     ScratchBlock rows;   // Color: source rows of the band and its margins
     ScratchBlock lum;    // float: their luminance, -infinity for background texels
-    RunMaxima runs;      // over lum, for large rings
+    RunPeaks runs;       // over lum, for large rings
     ScratchBlock out;    // Color: result rows of the band
     ScratchBlock depth;  // float: "Z" rows of a band
     ScratchBlock spare;  // uint16_t: a row of distances
