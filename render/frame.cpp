@@ -57,8 +57,9 @@ void ScratchPool::giveBack(void *data, size_t bytes) {
     std::lock_guard<std::mutex> lock(mutex_);
     if (kept_.size() >= kKeptBlocks) {
         // The smallest block goes: it is the cheapest to make again.
-        auto smallest = std::min_element(
-            kept_.begin(), kept_.end(), [](const Kept &a, const Kept &b) { return a.bytes < b.bytes; });
+        auto smallest =
+            std::min_element(kept_.begin(), kept_.end(),
+                             [](const Kept &a, const Kept &b) { return a.bytes < b.bytes; });
         if (smallest->bytes >= bytes) {
             ::operator delete(data, kScratchAlign);
             return;

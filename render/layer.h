@@ -147,17 +147,14 @@ struct TileGrid {
 
     /// The first pixel of tile (tx, ty); its rows lie tileWidth elements apart.
     T *tile(uint32_t tx, uint32_t ty) const {
-        return base + (uint64_t(ty) * tilesPerRow + tx) * uint64_t(tileWidth) * uint64_t(tileHeight);
-    }
-    /// Pixel (x, y); the pixels of its row up to the tile's right edge follow it.
-    T *pixel(int32_t x, int32_t y) const {
-        return tile(uint32_t(x / tileWidth), uint32_t(y / tileHeight)) +
-               int64_t(y % tileHeight) * tileWidth + x % tileWidth;
+        return base +
+               (uint64_t(ty) * tilesPerRow + tx) * uint64_t(tileWidth) * uint64_t(tileHeight);
     }
     /// True when both grids cut the image the same way.
     template <typename U>
     bool sameTiles(const TileGrid<U> &o) const {
-        return tileWidth == o.tileWidth && tileHeight == o.tileHeight && tilesPerRow == o.tilesPerRow;
+        return tileWidth == o.tileWidth && tileHeight == o.tileHeight &&
+               tilesPerRow == o.tilesPerRow;
     }
 };
 

@@ -92,8 +92,8 @@ TexelRuns::TexelRuns(LayerT<Color> &in, LayerT<Color> *out, LayerT<float> *z)
     : in_(in), out_(out), z_(z) {
     // Writes through a grid would not reach observers.
     if (out_ && !out_->observers().empty()) return;
-    direct_ = in_.tileGrid(inGrid_) && (!out_ || (out_->tileGrid(outGrid_) &&
-                                                  outGrid_.sameTiles(inGrid_))) &&
+    direct_ = in_.tileGrid(inGrid_) &&
+              (!out_ || (out_->tileGrid(outGrid_) && outGrid_.sameTiles(inGrid_))) &&
               (!z_ || (z_->tileGrid(zGrid_) && zGrid_.sameTiles(inGrid_)));
 }
 

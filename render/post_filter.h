@@ -83,8 +83,7 @@ struct BandScratch {
 inline void streamColors(Color *dst, const Color *src, int32_t n) {
 #ifdef __SSE2__
     if ((reinterpret_cast<uintptr_t>(dst) & 15) == 0) {
-        for (int32_t i = 0; i < n; ++i)
-            _mm_stream_ps(&dst[i].r, _mm_loadu_ps(&src[i].r));
+        for (int32_t i = 0; i < n; ++i) _mm_stream_ps(&dst[i].r, _mm_loadu_ps(&src[i].r));
         return;
     }
 #endif

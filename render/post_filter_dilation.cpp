@@ -63,9 +63,9 @@ public:
         if (!direct()) return buffer_[int64_t(y - firstRow_) * width_ + x];
         if (shiftX_ < 0) return run(y, x / runWidth_)[x % runWidth_];
         const int64_t tile = int64_t(y >> shiftY_) * grid_.tilesPerRow + (x >> shiftX_);
-        return grid_.base[(tile << (shiftX_ + shiftY_)) +
-                          (int64_t(y & ((1 << shiftY_) - 1)) << shiftX_) +
-                          (x & ((1 << shiftX_) - 1))];
+        return grid_
+            .base[(tile << (shiftX_ + shiftY_)) + (int64_t(y & ((1 << shiftY_) - 1)) << shiftX_) +
+                  (x & ((1 << shiftX_) - 1))];
     }
 
 private:
@@ -126,8 +126,8 @@ void relaxRow(const uint16_t *__restrict in, uint16_t *__restrict out, int32_t w
 
 /// Row distances to the nearest covered texel of rows [y0, y1), capped at cap; depth is the
 /// band buffer used when the layer has no grid.
-bool rowDistances(LayerT<float> &z, PixelRows<float> zRows, int32_t y0, int32_t y1,
-                  uint16_t cap, uint16_t *dist, float *depth, uint16_t *spare) {
+bool rowDistances(LayerT<float> &z, PixelRows<float> zRows, int32_t y0, int32_t y1, uint16_t cap,
+                  uint16_t *dist, float *depth, uint16_t *spare) {
     const int32_t w = z.width();
     if (!zRows.direct()) {
         if (!z.read(Region(0, y0, w, y1), depth)) return false;
@@ -151,7 +151,8 @@ bool rowDistances(LayerT<float> &z, PixelRows<float> zRows, int32_t y0, int32_t 
                 const __m128 hi = _mm_cmpge_ps(_mm_loadu_ps(zr + i + 4), _mm_setzero_ps());
                 const __m128i mask = _mm_packs_epi32(_mm_castps_si128(lo), _mm_castps_si128(hi));
                 seen = _mm_or_si128(seen, mask);
-                _mm_storeu_si128(reinterpret_cast<__m128i *>(d + x + i), _mm_andnot_si128(mask, capv));
+                _mm_storeu_si128(reinterpret_cast<__m128i *>(d + x + i),
+                                 _mm_andnot_si128(mask, capv));
             }
             anyCovered |= _mm_movemask_epi8(seen) != 0;
 #endif
@@ -289,8 +290,7 @@ void rankRun(const Color *c, const uint16_t *dist, float *lum, int32_t n) {
 /// when brighter, which is what one scan in ring order gives). Returns the winner's offset
 /// from the centre in dx and dy; false when no candidate beats the starting luminance.
 template <int R>
-inline bool brightestOnInnerRing(const float *lum, int64_t c, int64_t w, int32_t &dx,
-                                 int32_t &dy) {
+inline bool brightestOnInnerRing(const float *lum, int64_t c, int64_t w, int32_t &dx, int32_t &dy) {
     struct Side {
         float best = -3.4028235e38f;
         int32_t k = -1;
@@ -315,10 +315,18 @@ inline bool brightestOnInnerRing(const float *lum, int64_t c, int64_t w, int32_t
     if (bottom.best > win.best) win = bottom, side = 3;
     if (win.k < 0) return false;
     switch (side) {
-        case 0: dx = -R, dy = win.k - R; break;
-        case 1: dx = R, dy = win.k - R; break;
-        case 2: dx = win.k - R + 1, dy = R; break;
-        default: dx = win.k - R + 1, dy = -R; break;
+        case 0:
+            dx = -R, dy = win.k - R;
+            break;
+        case 1:
+            dx = R, dy = win.k - R;
+            break;
+        case 2:
+            dx = win.k - R + 1, dy = R;
+            break;
+        default:
+            dx = win.k - R + 1, dy = -R;
+            break;
     }
     return true;
 }
@@ -496,7 +504,8 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
         srcRows.emplace_back(*sources[l], false);
         dstRows.emplace_back(*outputs[l], true);
         // Source and result are walked run by run together.
-        if (srcRows[l].runWidth() != dstRows[l].runWidth()) srcRows[l].dropGrid(), dstRows[l].dropGrid();
+        if (srcRows[l].runWidth() != dstRows[l].runWidth())
+            srcRows[l].dropGrid(), dstRows[l].dropGrid();
     }
     // Each band also ranks n rows above and below it: tall bands keep that margin small, short
     // ones keep the band's texels in the cache between ranking and filling.
@@ -527,8 +536,8 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
 
         // The ring radius of every texel of the band.
         for (int32_t y = y0; y < y1; ++y) {
-            uint16_t m = ringRow(distRow(y), nullptr, nullptr, 0,
-                                 ring + size_t(y - y0) * size_t(w), w);
+            uint16_t m =
+                ringRow(distRow(y), nullptr, nullptr, 0, ring + size_t(y - y0) * size_t(w), w);
             for (int32_t dy = 1; dy <= n && m > dy; ++dy)
                 m = ringRow(nullptr, distRow(y - dy), distRow(y + dy), uint16_t(dy),
                             ring + size_t(y - y0) * size_t(w), w);
@@ -548,7 +557,8 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
             }
             if (!dst.direct()) dst.bind(scratchArray<Color>(*s.pool, s.out, bandSize), y0);
             Color *const runBuffer =
-                dst.direct() ? scratchArray<Color>(*s.pool, s.out, size_t(dst.runWidth())) : nullptr;
+                dst.direct() ? scratchArray<Color>(*s.pool, s.out, size_t(dst.runWidth()))
+                             : nullptr;
             // The luminance of window row y.
             auto rankRow = [&](int32_t y) {
                 const size_t row = size_t(y - rowBase) * size_t(w);
@@ -607,12 +617,24 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                             int32_t dx = 0, dy = 0;
                             bool found = false;
                             switch (r) {
-                                case 1: found = brightestOnInnerRing<1>(lum, c, w, dx, dy); break;
-                                case 2: found = brightestOnInnerRing<2>(lum, c, w, dx, dy); break;
-                                case 3: found = brightestOnInnerRing<3>(lum, c, w, dx, dy); break;
-                                case 4: found = brightestOnInnerRing<4>(lum, c, w, dx, dy); break;
-                                case 5: found = brightestOnInnerRing<5>(lum, c, w, dx, dy); break;
-                                default: found = brightestOnInnerRing<6>(lum, c, w, dx, dy); break;
+                                case 1:
+                                    found = brightestOnInnerRing<1>(lum, c, w, dx, dy);
+                                    break;
+                                case 2:
+                                    found = brightestOnInnerRing<2>(lum, c, w, dx, dy);
+                                    break;
+                                case 3:
+                                    found = brightestOnInnerRing<3>(lum, c, w, dx, dy);
+                                    break;
+                                case 4:
+                                    found = brightestOnInnerRing<4>(lum, c, w, dx, dy);
+                                    break;
+                                case 5:
+                                    found = brightestOnInnerRing<5>(lum, c, w, dx, dy);
+                                    break;
+                                default:
+                                    found = brightestOnInnerRing<6>(lum, c, w, dx, dy);
+                                    break;
                             }
                             to[i] = found ? src.at(x + dx, y + dy) : background_;
                             continue;

@@ -33,7 +33,8 @@ struct alignas(16) ChannelRanges {
     float lo[4] = {3.4028235e38f, 3.4028235e38f, 3.4028235e38f, 3.4028235e38f};
     float hi[4] = {-3.4028235e38f, -3.4028235e38f, -3.4028235e38f, -3.4028235e38f};
     void merge(const ChannelRanges &o) {
-        for (int c = 0; c < 4; ++c) lo[c] = std::min(lo[c], o.lo[c]), hi[c] = std::max(hi[c], o.hi[c]);
+        for (int c = 0; c < 4; ++c)
+            lo[c] = std::min(lo[c], o.lo[c]), hi[c] = std::max(hi[c], o.hi[c]);
     }
 };
 
@@ -69,7 +70,8 @@ private:
     void add(const Color &c) {
         const float v[4] = {c.r + 0.0f, c.g + 0.0f, c.b + 0.0f, c.a + 0.0f};
         for (int k = 0; k < 4; ++k)
-            if (std::isfinite(v[k])) r_.lo[k] = std::min(r_.lo[k], v[k]), r_.hi[k] = std::max(r_.hi[k], v[k]);
+            if (std::isfinite(v[k]))
+                r_.lo[k] = std::min(r_.lo[k], v[k]), r_.hi[k] = std::max(r_.hi[k], v[k]);
     }
     void mergeInto(ChannelRanges &r) const { r.merge(r_); }
 
@@ -223,9 +225,8 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     };
     RowBands gather(h, bandRows, threads, nullptr);
     const bool gathered = gather.run([&](int32_t y0, int32_t y1, int thread) {
-        const bool read =
-            compact ? gatherBand(static_cast<uint16_t *>(idTable), y0, y1, thread)
-                    : gatherBand(static_cast<int32_t *>(idTable), y0, y1, thread);
+        const bool read = compact ? gatherBand(static_cast<uint16_t *>(idTable), y0, y1, thread)
+                                  : gatherBand(static_cast<int32_t *>(idTable), y0, y1, thread);
         if (!read) {
             message(kMsgError, 6, "Shape normalization could not read layer %s", source_.c_str());
             return false;
@@ -329,9 +330,9 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
             });
     };
     const bool ok = remap.run([&](int32_t y0, int32_t y1, int thread) {
-        const bool done =
-            compact ? remapBand(static_cast<const uint16_t *>(idTable), y0, y1, thread)
-                    : remapBand(static_cast<const int32_t *>(idTable), y0, y1, thread);
+        const bool done = compact
+                              ? remapBand(static_cast<const uint16_t *>(idTable), y0, y1, thread)
+                              : remapBand(static_cast<const int32_t *>(idTable), y0, y1, thread);
         if (!done) {
             message(kMsgError, 6, "Shape normalization could not remap layer %s", source_.c_str());
             return false;

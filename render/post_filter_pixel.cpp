@@ -48,12 +48,11 @@ bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch,
     const float t = threshold_;
     const Color bg = background_;
     for (const auto &runs : runs_) {
-        const bool ok = runs->run(y0, y1, scratch,
-                                  [&](int32_t, int32_t, int32_t n, const Color *src, Color *dst,
-                                      const float *) {
-                                      for (int32_t i = 0; i < n; ++i)
-                                          dst[i] = premultiply(src[i], t, bg);
-                                  });
+        const bool ok = runs->run(
+            y0, y1, scratch,
+            [&](int32_t, int32_t, int32_t n, const Color *src, Color *dst, const float *) {
+                for (int32_t i = 0; i < n; ++i) dst[i] = premultiply(src[i], t, bg);
+            });
         if (!ok) {
             failedX = 0, failedY = y0;
             return false;
