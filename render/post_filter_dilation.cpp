@@ -10,12 +10,14 @@
 #include "render/frame.h"
 #include "render/post_filter.h"
 
-/// Edge dilation in two steps. First, for every texel, the distance along its row to the
-/// nearest covered texel (0 for a covered one), capped at size + 1. Then, row by row, the
-/// square-ring (Chebyshev) distance to the nearest covered texel, which is the minimum over the
-/// rows within size of max(row distance, row offset); it is exactly the radius of the first
-/// ring that holds a covered texel. Only that ring is scanned for the brightest candidate, in
-/// the ring order, so the result is that of scanning every ring from 1 outwards.
+/// Edge dilation, band by band of rows, each band with a window of size rows above and below.
+/// First, for every texel of the window, the distance along its row to the nearest covered
+/// texel (0 for a covered one), capped at size + 1. Then, row by row, the square-ring
+/// (Chebyshev) distance to the nearest covered texel, which is the minimum over the rows
+/// within size of max(row distance, row offset); it is exactly the radius of the first ring
+/// that holds a covered texel. Only that ring is searched for the brightest candidate, in the
+/// ring order, so the result is that of scanning every ring from 1 outwards. Sources are read
+/// and results written straight in the layers' tiles when the layers allow it.
 namespace ox {
 
 namespace {
