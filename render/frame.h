@@ -62,7 +62,7 @@ public:
     /// The bytes kept for reuse.
     size_t keptBytes() const;
     /// The most blocks kept for reuse.
-    static constexpr size_t kKeptBlocks = 16;
+    static constexpr size_t kKeptBlocks = 32;
 
 private:
     friend class ScratchBlock;
