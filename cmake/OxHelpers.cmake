@@ -2,8 +2,10 @@
 # helpers that turn one folder into one static library and one test executable.
 
 add_library(ox_warnings INTERFACE)
-target_compile_options(ox_warnings INTERFACE -Wall -Wextra -Wpedantic -Wshadow=local
-    -Wno-unused-parameter -Wnon-virtual-dtor)
+target_compile_options(ox_warnings INTERFACE -Wall -Wextra -Wpedantic
+    -Wno-unused-parameter -Wnon-virtual-dtor
+    # Clang's builds (sanitizers, fuzzers) have no -Wshadow=local.
+    $<$<CXX_COMPILER_ID:GNU>:-Wshadow=local>)
 
 add_library(ox_opt INTERFACE)
 target_compile_options(ox_opt INTERFACE $<$<CONFIG:Release>:-O2> -fno-fast-math -g1)
