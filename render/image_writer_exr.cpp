@@ -260,13 +260,13 @@ bool writeEXR(const std::string &fileName, LayerT<Color> &layer, bool alpha) {
     const int64_t blocks = std::clamp<int64_t>(
         std::min<int64_t>(2 * int64_t(Imf::globalThreadCount()), kStripBytes / (rowBytes * kBlock)),
         1, 64);
-    const int32_t kStrip = int32_t(blocks) * kBlock;
+    const int32_t strip = int32_t(blocks) * kBlock;
     LayerStrip s;
     s.layer = &layer;
     s.units = 4;
     s.channelNames = {"R", "G", "B"};
     if (alpha) s.channelNames.push_back("A");
-    s.data.assign(size_t(w) * size_t(kStrip) * 4, 0.0f);
+    s.data.assign(size_t(w) * size_t(strip) * 4, 0.0f);
     AtomicFile file(fileName);
     std::FILE *f = file.file();
     if (!f) return fail("Failed to open file: " + fileName + " (" + fileError() + ")");
@@ -278,8 +278,8 @@ bool writeEXR(const std::string &fileName, LayerT<Color> &layer, bool alpha) {
         EXROStream stream(f, fileName);
         {
             Imf::OutputFile out(stream, header, Imf::globalThreadCount());
-            for (int32_t start = 0; start < h; start += kStrip) {
-                const int32_t end = std::min(h, start + kStrip);
+            for (int32_t start = 0; start < h; start += strip) {
+                const int32_t end = std::min(h, start + strip);
                 const int32_t y0 = h - end, y1 = h - start;
                 if (!layer.read(Region(0, y0, w, y1), reinterpret_cast<Color *>(s.data.data())))
                     throw Iex::BaseExc("layer " + layer.name() + " cannot be read");
