@@ -892,49 +892,118 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
     return hit;
 }
 
+namespace {
+
+// One axis of the walk: the step, the index of the next cell plane and the distance to it
+// (recomputed exactly from the plane index after each step), and the distance between planes.
+// The cell index along the axis is next - ahead; the walk leaves the grid when next reaches
+// beyond. An axis the ray does not move along has its next plane at infinity and never leaves.
+// The walk keeps three of these as named locals and reaches them only through the inlined
+// helpers below, never by a run-time index, so that they stay in registers.
+struct WalkAxis {
+    int64_t next, ahead, step, beyond, cellStep, n;
+    float tNext, base, size, inv, delta, lo, invSize;
+};
+
+// Cell index of coordinate v along an axis. Clamps in floating point first: NaN and huge values
+// never reach the integer conversion; above 2^24 cells n - 1 may round up to n in float, so the
+// index is clamped again.
+__attribute__((always_inline)) inline int64_t axisCell(float v, float lo, float invSize,
+                                                       int64_t n) {
+    float f = (v - lo) * invSize;
+    f = f >= 0.0f ? (f < float(n - 1) ? f : float(n - 1)) : 0.0f;
+    return std::min(int64_t(f), n - 1);  // truncation is floor for the non-negative values left
+}
+
+// Clips [t0, t1] to the slab of an axis; false when the ray misses it. A zero direction component
+// tests the slab only.
+__attribute__((always_inline)) inline bool clipAxis(float o, float d, float inv, float lo,
+                                                    float hi, float &t0, float &t1) {
+    if (d == 0.0f) return !(o < lo || o > hi);
+    float ta = (lo - o) * inv;
+    float tb = (hi - o) * inv;
+    if (ta > tb) std::swap(ta, tb);
+    t0 = std::max(t0, ta);
+    t1 = std::min(t1, tb);
+    return true;
+}
+
+__attribute__((always_inline)) inline float planeDistance(const WalkAxis &A) {
+    return (A.base + float(A.next) * A.size) * A.inv;
+}
+
+// Sets up an axis for a ray entering the grid at distance t0; returns the cell index.
+__attribute__((always_inline)) inline int64_t startAxis(WalkAxis &A, float o, float d, float inv,
+                                                        float lo, float size, float invSize,
+                                                        int64_t n, int64_t stride, float t0) {
+    float p = d == 0.0f ? o : o + d * t0;
+    int64_t idx = axisCell(p, lo, invSize, n);
+    A.lo = lo, A.invSize = invSize, A.size = size, A.inv = inv, A.n = n;
+    A.base = lo - o;
+    A.step = d > 0.0f ? 1 : (d < 0.0f ? -1 : 0);
+    A.ahead = A.step > 0;
+    A.next = idx + A.ahead;
+    A.beyond = A.step > 0 ? n + 1 : (A.step < 0 ? -1 : -2);
+    A.cellStep = A.step * stride;
+    A.tNext = A.step ? planeDistance(A) : kInfiniteDistance;
+    A.delta = A.step ? size * std::fabs(inv) : kInfiniteDistance;
+    return idx;
+}
+
+// Crosses the axis's next cell plane.
+__attribute__((always_inline)) inline void advanceAxis(WalkAxis &A) {
+    A.next += A.step;
+    A.tNext = planeDistance(A);
+}
+
+// The axis whose far face of an empty cube the walk leaves through moves dist cells on; false
+// when that leaves the grid.
+__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, int64_t dist) {
+    A.next += A.step * dist;
+    if (uint64_t(A.next - A.ahead) >= uint64_t(A.n)) return false;
+    A.tNext = planeDistance(A);
+    return true;
+}
+
+// Any other axis moves to the cell the ray is in at the exit distance (at most dist - 1 cells
+// on), with the plane ahead not before the exit; false when that leaves the grid.
+__attribute__((always_inline)) inline bool followAxis(WalkAxis &A, float o, float d, float tExit,
+                                                      int64_t dist) {
+    if (A.step == 0 || A.tNext >= tExit) return true;
+    int64_t from = A.next - A.ahead;
+    int64_t last = from + A.step * (dist - 1);
+    float f = (o + d * tExit - A.lo) * A.invSize;
+    f = f >= 0.0f ? (f < float(A.n) ? f : float(A.n)) : 0.0f;
+    int64_t at = int64_t(f);
+    at = A.step > 0 ? std::clamp(at, from, last) : std::clamp(at, last, from);
+    A.next = at + A.ahead;
+    A.tNext = planeDistance(A);
+    while (A.tNext < tExit && A.next - A.ahead != last) advanceAxis(A);
+    return uint64_t(A.next - A.ahead) < uint64_t(A.n);
+}
+
+}  // namespace
+
 template <bool kAny>
 bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     if (cells_.empty()) return false;
-    // Clip the ray against the box (slab test); zero direction components test the slab only.
+    // Clip the ray against the box (slab test).
     float t0 = 0.0f, t1 = s.limit;
-    for (int a = 0; a < 3; ++a) {
-        if (r.d[a] == 0.0f) {
-            if (r.o[a] < box_.min[a] || r.o[a] > box_.max[a]) return false;
-            continue;
-        }
-        float ta = (box_.min[a] - r.o[a]) * r.inv[a];
-        float tb = (box_.max[a] - r.o[a]) * r.inv[a];
-        if (ta > tb) std::swap(ta, tb);
-        t0 = std::max(t0, ta);
-        t1 = std::min(t1, tb);
-    }
-    if (!(t0 <= t1)) return false;
+    if (!clipAxis(r.o.x, r.d.x, r.inv.x, box_.min.x, box_.max.x, t0, t1) ||
+        !clipAxis(r.o.y, r.d.y, r.inv.y, box_.min.y, box_.max.y, t0, t1) ||
+        !clipAxis(r.o.z, r.d.z, r.inv.z, box_.min.z, box_.max.z, t0, t1) || !(t0 <= t1))
+        return false;
 
-    // Per axis: the step, the index of the next cell plane and the distance to it (recomputed
-    // exactly from the plane index after each step), and the distance between planes. The cell
-    // index is next - ahead; the walk leaves the grid when next reaches beyond. An axis the ray
-    // does not move along has its next plane at infinity and never leaves.
-    int64_t step[3], next[3], ahead[3], beyond[3], cellStep[3];
-    float tNext[3], base[3], delta[3];
-    const int64_t n[3] = {nx_, ny_, nz_};
-    const int64_t stride[3] = {1, nx_, nx_ * ny_};
-    int64_t cell = 0;
-    for (int a = 0; a < 3; ++a) {
-        float p = r.d[a] == 0.0f ? r.o[a] : r.o[a] + r.d[a] * t0;
-        int64_t idx = cellCoord(p, a);
-        cell += idx * stride[a];
-        base[a] = box_.min[a] - r.o[a];
-        step[a] = r.d[a] > 0.0f ? 1 : (r.d[a] < 0.0f ? -1 : 0);
-        ahead[a] = step[a] > 0;
-        next[a] = idx + ahead[a];
-        beyond[a] = step[a] > 0 ? n[a] + 1 : (step[a] < 0 ? -1 : -2);
-        cellStep[a] = step[a] * stride[a];
-        tNext[a] =
-            step[a] ? (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a] : kInfiniteDistance;
-        delta[a] = step[a] ? cellSize_[a] * std::fabs(r.inv[a]) : kInfiniteDistance;
-    }
+    WalkAxis X, Y, Z;
+    const int64_t strideY = nx_, strideZ = nx_ * ny_;
+    int64_t cell = startAxis(X, r.o.x, r.d.x, r.inv.x, box_.min.x, cellSize_.x, invCellSize_.x,
+                             nx_, 1, t0);
+    cell += strideY * startAxis(Y, r.o.y, r.d.y, r.inv.y, box_.min.y, cellSize_.y,
+                                invCellSize_.y, ny_, strideY, t0);
+    cell += strideZ * startAxis(Z, r.o.z, r.d.z, r.inv.z, box_.min.z, cellSize_.z,
+                                invCellSize_.z, nz_, strideZ, t0);
     // Where empty cells keep the distance code of the ray's direction octant.
-    const uint32_t shift = 3 * uint32_t((step[0] < 0) | (step[1] < 0) << 1 | (step[2] < 0) << 2);
+    const uint32_t shift = 3 * uint32_t((X.step < 0) | (Y.step < 0) << 1 | (Z.step < 0) << 2);
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
     // The walk waits on each cell's word before it knows where to go next. In grids whose
@@ -944,7 +1013,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         __builtin_prefetch(cells + cell);
         // The points in cell units, stepped by 2 crossings of the smallest cell side; the cell
         // counts fit 32 bits.
-        float h = 2.0f * std::min({delta[0], delta[1], delta[2]});
+        float h = 2.0f * std::min({X.delta, Y.delta, Z.delta});
         const float4 scale(_mm_setr_ps(invCellSize_.x, invCellSize_.y, invCellSize_.z, 0.0f));
         const float4 top(_mm_setr_ps(float(nx_ - 1), float(ny_ - 1), float(nz_ - 1), 0.0f));
         const float4 dir(_mm_setr_ps(r.d.x, r.d.y, r.d.z, 0.0f));
@@ -962,19 +1031,24 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             _mm_store_si128(reinterpret_cast<__m128i *>(at),
                             _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), top)));
             // (Above 2^24 cells a coordinate may round one or two past the last cell.)
-            int64_t c =
-                std::min(at[0] + int64_t(at[1]) * stride[1] + int64_t(at[2]) * stride[2], lastCell);
+            int64_t c = std::min(at[0] + int64_t(at[1]) * strideY + int64_t(at[2]) * strideZ,
+                                 lastCell);
             __builtin_prefetch(cells + c);
         }
     }
     bool found = false;
     // Every iteration advances at least one cell along the ray, so a walk needs at most
     // nx + ny + nz of them.
-    for (int64_t walked = n[0] + n[1] + n[2]; walked > 0; --walked) {
+    for (int64_t walked = nx_ + ny_ + nz_; walked > 0; --walked) {
         // The axis of the nearest cell plane; while this cell is looked at, fetch the cell the
         // walk is likely to enter next.
-        int a = tNext[0] < tNext[1] ? (tNext[0] < tNext[2] ? 0 : 2) : (tNext[1] < tNext[2] ? 1 : 2);
-        if (next[a] + step[a] != beyond[a]) __builtin_prefetch(cells + cell + cellStep[a]);
+        const int a = X.tNext < Y.tNext ? (X.tNext < Z.tNext ? 0 : 2) : (Y.tNext < Z.tNext ? 1 : 2);
+        const float tA = a == 0 ? X.tNext : (a == 1 ? Y.tNext : Z.tNext);
+        const int64_t stepA = a == 0 ? X.cellStep : (a == 1 ? Y.cellStep : Z.cellStep);
+        const bool inside = a == 0 ? X.next + X.step != X.beyond
+                                   : (a == 1 ? Y.next + Y.step != Y.beyond
+                                             : Z.next + Z.step != Z.beyond);
+        if (inside) __builtin_prefetch(cells + cell + stepA);
         const uint32_t word = cells[cell];
         const uint32_t dist = (word >> kItemIndexBits) == kItemEmpty
                                   ? (word >> shift & 7) == kEmptyAhead ? 255u
@@ -982,8 +1056,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                                   : 0u;
         if (dist == 0) {
             const uint32_t *first = cells + cell, *last = first + 1;
-            if ((*first >> kItemIndexBits) == kItemList) {
-                const uint32_t *list = items + (*first & kItemIndexMask);
+            if ((word >> kItemIndexBits) == kItemList) {
+                const uint32_t *list = items + (word & kItemIndexMask);
                 first = list + 1;
                 last = first + *list;
             }
@@ -1003,14 +1077,13 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                     }
                 }
             if (testItems<kAny>(r, s, first, last,
-                                frameOrigin(next[0] - ahead[0], next[1] - ahead[1],
-                                            next[2] - ahead[2]))) {
+                                frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead))) {
                 if constexpr (kAny) return true;
                 found = true;
             }
             // The next cell's word has arrived meanwhile: start fetching what it names.
-            if (next[a] + step[a] != beyond[a] && tNext[a] < s.limit) {
-                uint32_t nextWord = cells[cell + cellStep[a]];
+            if (inside && tA < s.limit) {
+                uint32_t nextWord = cells[cell + stepA];
                 uint32_t kind = nextWord >> kItemIndexBits, index = nextWord & kItemIndexMask;
                 const char *p = nullptr;
                 if (kind == kItemGroup)
@@ -1027,41 +1100,39 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             // Every cell within dist - 1 of this one is empty: leave that cube in one jump
             // through its nearest far face. The other axes move to the cell the ray is in
             // there (at most dist - 1 cells on), with the plane ahead not before the exit.
-            float reach = float(dist - 1);
-            float e0 = tNext[0] + reach * delta[0], e1 = tNext[1] + reach * delta[1],
-                  e2 = tNext[2] + reach * delta[2];
-            int j = e0 < e1 ? (e0 < e2 ? 0 : 2) : (e1 < e2 ? 1 : 2);
-            float tExit = j == 0 ? e0 : j == 1 ? e1 : e2;
+            const float reach = float(dist - 1);
+            const float e0 = X.tNext + reach * X.delta, e1 = Y.tNext + reach * Y.delta,
+                        e2 = Z.tNext + reach * Z.delta;
+            const int j = e0 < e1 ? (e0 < e2 ? 0 : 2) : (e1 < e2 ? 1 : 2);
+            const float tExit = j == 0 ? e0 : (j == 1 ? e1 : e2);
             if (!(tExit < s.limit)) break;
-            next[j] += step[j] * int64_t(dist);
-            if (uint64_t(next[j] - ahead[j]) >= uint64_t(n[j])) break;
-            tNext[j] = (base[j] + float(next[j]) * cellSize_[j]) * r.inv[j];
-            for (int b = 0; b < 3; ++b) {
-                if (b == j || step[b] == 0 || tNext[b] >= tExit) continue;
-                int64_t from = next[b] - ahead[b];
-                int64_t last = from + step[b] * int64_t(dist - 1);
-                float f = (r.o[b] + r.d[b] * tExit - box_.min[b]) * invCellSize_[b];
-                f = f >= 0.0f ? (f < float(n[b]) ? f : float(n[b])) : 0.0f;
-                int64_t at = int64_t(f);
-                at = step[b] > 0 ? std::clamp(at, from, last) : std::clamp(at, last, from);
-                next[b] = at + ahead[b];
-                tNext[b] = (base[b] + float(next[b]) * cellSize_[b]) * r.inv[b];
-                while (tNext[b] < tExit && next[b] - ahead[b] != last) {
-                    next[b] += step[b];
-                    tNext[b] = (base[b] + float(next[b]) * cellSize_[b]) * r.inv[b];
-                }
-                if (uint64_t(next[b] - ahead[b]) >= uint64_t(n[b])) return found;
+            const int64_t d = int64_t(dist);
+            if (j == 0) {
+                if (!leadAxis(X, d)) break;
+                if (!followAxis(Y, r.o.y, r.d.y, tExit, d) || !followAxis(Z, r.o.z, r.d.z, tExit, d))
+                    return found;
+            } else if (j == 1) {
+                if (!leadAxis(Y, d)) break;
+                if (!followAxis(X, r.o.x, r.d.x, tExit, d) || !followAxis(Z, r.o.z, r.d.z, tExit, d))
+                    return found;
+            } else {
+                if (!leadAxis(Z, d)) break;
+                if (!followAxis(X, r.o.x, r.d.x, tExit, d) || !followAxis(Y, r.o.y, r.d.y, tExit, d))
+                    return found;
             }
-            cell = ((next[2] - ahead[2]) * ny_ + (next[1] - ahead[1])) * nx_ + next[0] - ahead[0];
+            cell = (Z.next - Z.ahead) * strideZ + (Y.next - Y.ahead) * strideY + X.next - X.ahead;
             continue;
         }
         // Step to the neighbour across the nearest cell plane. The best hit lies inside the
         // cells walked so far when that plane is beyond it: nothing further can be closer.
-        if (tNext[a] >= s.limit) break;
-        next[a] += step[a];
-        if (next[a] == beyond[a]) break;
-        cell += cellStep[a];
-        tNext[a] = (base[a] + float(next[a]) * cellSize_[a]) * r.inv[a];
+        if (tA >= s.limit || !inside) break;
+        cell += stepA;
+        if (a == 0)
+            advanceAxis(X);
+        else if (a == 1)
+            advanceAxis(Y);
+        else
+            advanceAxis(Z);
     }
     return found;
 }
