@@ -8,6 +8,7 @@
 #include <string>
 
 #include "core/message.h"
+#include "raytrace/intersect_wide.h"
 #include "raytrace/motion_blur.h"
 
 namespace ox {
@@ -301,8 +302,8 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     // Group boxes are padded by the margin plus a thousandth of the cell diagonal against
     // rounding in the slab test; their frames leave room for twice that.
     framePad_ = 2.0f * (margin_ + 1e-3f * cellSize_.length());
-    frameStep_ = (cellSize_ + Vec3(2.0f * framePad_, 2.0f * framePad_, 2.0f * framePad_)) *
-                 (1.0f / 255.0f);
+    frameStep_ =
+        (cellSize_ + Vec3(2.0f * framePad_, 2.0f * framePad_, 2.0f * framePad_)) * (1.0f / 255.0f);
     insertAll(prims);
     return true;
 }
@@ -475,7 +476,6 @@ void Grid::finalize() {
     std::vector<uint32_t>().swap(refinedChild_);
 }
 
-
 void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z,
                      GroupScratch &scratch) {
     // The packets holding the cell's triangles, each with the box of those triangles.
@@ -571,7 +571,9 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
             for (int64_t y = start[1]; y >= 0 && y < ny_; y -= s[1]) {
                 const bool inY = y + s[1] >= 0 && y + s[1] < ny_;
                 const bool inZ = z + s[2] >= 0 && z + s[2] < nz_;
-                auto row = [&](int64_t yy, int64_t zz) { return d + size_t((zz * ny_ + yy) * nx_); };
+                auto row = [&](int64_t yy, int64_t zz) {
+                    return d + size_t((zz * ny_ + yy) * nx_);
+                };
                 const uint8_t *rows[3] = {inY ? row(y + s[1], z) : none.data(),
                                           inZ ? row(y, z + s[2]) : none.data(),
                                           inY && inZ ? row(y + s[1], z + s[2]) : none.data()};
@@ -581,8 +583,7 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                 // x one on along the ray (none beyond the row's end).
                 for (int k = 0; k < 3; ++k) {
                     if (sx > 0) {
-                        for (int64_t x = 0; x + 1 < nx_; ++x)
-                            m[x] = std::min(m[x], rows[k][x + 1]);
+                        for (int64_t x = 0; x + 1 < nx_; ++x) m[x] = std::min(m[x], rows[k][x + 1]);
                     } else {
                         for (int64_t x = nx_ - 1; x > 0; --x) m[x] = std::min(m[x], rows[k][x - 1]);
                     }
@@ -592,9 +593,10 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                 uint32_t prev = kAhead;  // the cell ahead in the row
                 for (int64_t x = start[0]; x >= 0 && x < nx_; x -= sx) {
                     uint32_t best = std::min<uint32_t>(prev, m[x]);
-                    uint32_t v = occ[x] ? 0u
-                                        : (best == kAhead ? kAhead
-                                                          : std::min<uint32_t>(best + 1, kAhead - 1));
+                    uint32_t v =
+                        occ[x]
+                            ? 0u
+                            : (best == kAhead ? kAhead : std::min<uint32_t>(best + 1, kAhead - 1));
                     out[x] = uint8_t(v);
                     prev = v;
                 }
@@ -725,8 +727,8 @@ inline int groupMask(const PacketGroup &g, const GroupFrame &f, float limit, flo
     __m128i w0 = _mm_unpacklo_epi8(v0, zero), w1 = _mm_unpackhi_epi8(v0, zero);
     __m128i w2 = _mm_unpacklo_epi8(v1, zero);
     auto lanes = [&](__m128i w, bool high) {
-        return float4(_mm_cvtepi32_ps(high ? _mm_unpackhi_epi16(w, zero)
-                                           : _mm_unpacklo_epi16(w, zero)));
+        return float4(
+            _mm_cvtepi32_ps(high ? _mm_unpackhi_epi16(w, zero) : _mm_unpacklo_epi16(w, zero)));
     };
     float4 t0x = lanes(w0, false) * f.ax + f.bx, t0y = lanes(w0, true) * f.ay + f.by;
     float4 t0z = lanes(w1, false) * f.az + f.bz, t1x = lanes(w1, true) * f.ax + f.bx;
@@ -741,8 +743,7 @@ inline int groupMask(const PacketGroup &g, const GroupFrame &f, float limit, flo
 }  // namespace
 
 template <bool kAny>
-bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s,
-                      const Vec3 &frame) const {
+bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s, const Vec3 &frame) const {
     const PacketGroup *g = groups_.data() + index;
     // Most cells have several groups: fetch the lines of the next two before the first arrives.
     const char *bytes = reinterpret_cast<const char *>(g);
@@ -811,9 +812,106 @@ bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s,
     return hit;
 }
 
+namespace {
+
+// The eight-wide form of groupMask over two groups (lanes 0-3 the first's packets, 4-7 the
+// second's; second = nullptr leaves lanes 4-7 out), with the same operations lane for lane.
+struct WideFrame {
+    __m256 ax, ay, az, bx, by, bz;
+};
+
+OX_WIDE_INLINE __m256 wideBytes(__m128i v, bool high) {
+    return _mm256_cvtepi32_ps(_mm256_cvtepu8_epi32(high ? _mm_srli_si128(v, 8) : v));
+}
+
+OX_WIDE_INLINE int groupPairMask(const PacketGroup &g0, const PacketGroup *g1, const WideFrame &f,
+                                 float limit) {
+    using namespace wide_ops;
+    const PacketGroup &h = g1 ? *g1 : g0;
+    // Per group: lo x, y, z, hi x in the first 16 bytes; hi y, z in the next 8. Interleaved by
+    // four bytes, each eight bytes hold one bound of both groups.
+    __m128i a0 = _mm_load_si128(reinterpret_cast<const __m128i *>(&g0));
+    __m128i a1 = _mm_load_si128(reinterpret_cast<const __m128i *>(&h));
+    __m128i b0 = _mm_loadl_epi64(reinterpret_cast<const __m128i *>(&g0.hi[1][0]));
+    __m128i b1 = _mm_loadl_epi64(reinterpret_cast<const __m128i *>(&h.hi[1][0]));
+    __m128i loXY = _mm_unpacklo_epi32(a0, a1), loZhiX = _mm_unpackhi_epi32(a0, a1);
+    __m128i hiYZ = _mm_unpacklo_epi32(b0, b1);
+    __m256 t0x = add(mul(wideBytes(loXY, false), f.ax), f.bx);
+    __m256 t0y = add(mul(wideBytes(loXY, true), f.ay), f.by);
+    __m256 t0z = add(mul(wideBytes(loZhiX, false), f.az), f.bz);
+    __m256 t1x = add(mul(wideBytes(loZhiX, true), f.ax), f.bx);
+    __m256 t1y = add(mul(wideBytes(hiYZ, false), f.ay), f.by);
+    __m256 t1z = add(mul(wideBytes(hiYZ, true), f.az), f.bz);
+    __m256 tnear = _mm256_max_ps(_mm256_max_ps(_mm256_min_ps(t0x, t1x), _mm256_min_ps(t0y, t1y)),
+                                 _mm256_max_ps(_mm256_min_ps(t0z, t1z), _mm256_setzero_ps()));
+    __m256 tfar = _mm256_min_ps(_mm256_min_ps(_mm256_max_ps(t0x, t1x), _mm256_max_ps(t0y, t1y)),
+                                _mm256_min_ps(_mm256_max_ps(t0z, t1z), _mm256_set1_ps(limit)));
+    int lanes = (1 << g0.count) - 1;
+    if (g1) lanes |= ((1 << g1->count) - 1) << 4;
+    return _mm256_movemask_ps(_mm256_cmp_ps(tnear, tfar, _CMP_LE_OS)) & lanes;
+}
+
+// True when packet k0 or k1 holds a hit below the limit. Both are tested together unless one is
+// the store's incomplete last packet.
+OX_WIDE_INLINE bool packetPairHit(const PrimitiveStore &store, uint32_t k0, uint32_t k1,
+                                  const TraceRay &r, TraceState &s) {
+    if (__builtin_expect(size_t(std::max(k0, k1)) * 4 + 4 > store.triangles.size(), 0))
+        return testPacket<true>(store, k0, r, s) || testPacket<true>(store, k1, r, s);
+    const IntersectTriangle *tri = store.triangles.data();
+    IntersectWideTriangle pk =
+        IntersectWideTriangle::load(tri + size_t(k0) * 4, tri + size_t(k1) * 4);
+    __m256 t, u, v;
+    return intersectPacketPair(pk, r, s.limit, t, u, v) != 0;
+}
+
+}  // namespace
+
+__attribute__((target("avx2"))) bool Grid::anyHitInGroupsWide(uint32_t index, const TraceRay &r,
+                                                              TraceState &s,
+                                                              const Vec3 &frame) const {
+    using namespace wide_ops;
+    const PacketGroup *g = groups_.data() + index;
+    const char *bytes = reinterpret_cast<const char *>(g);
+    __builtin_prefetch(bytes);
+    __builtin_prefetch(bytes + 64);
+    __builtin_prefetch(bytes + 128);
+    const uint32_t n = g->run;
+    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    WideFrame f;
+    f.ax = mul(_mm256_set1_ps(frameStep_.x), wide(r.ix));
+    f.ay = mul(_mm256_set1_ps(frameStep_.y), wide(r.iy));
+    f.az = mul(_mm256_set1_ps(frameStep_.z), wide(r.iz));
+    f.bx = mul(sub(_mm256_set1_ps(frame.x), wide(r.ox)), wide(r.ix));
+    f.by = mul(sub(_mm256_set1_ps(frame.y), wide(r.oy)), wide(r.iy));
+    f.bz = mul(sub(_mm256_set1_ps(frame.z), wide(r.oz)), wide(r.iz));
+    // Two groups at a time, the packets they let through two at a time.
+    for (uint32_t i = 0; i < n; i += 2) {
+        const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
+        int mask = groupPairMask(*pair[0], pair[1], f, s.limit);
+        for (int m = mask; m; m &= m - 1) {
+            int lane = __builtin_ctz(m);
+            prefetchPacket(*store_, pair[lane >> 2]->packet[lane & 3]);
+        }
+        while (mask) {
+            int lane = __builtin_ctz(mask);
+            mask &= mask - 1;
+            uint32_t k0 = pair[lane >> 2]->packet[lane & 3];
+            if (!mask) {
+                if (testPacket<true>(*store_, k0, r, s)) return true;
+                break;
+            }
+            int second = __builtin_ctz(mask);
+            mask &= mask - 1;
+            if (packetPairHit(*store_, k0, pair[second >> 2]->packet[second & 3], r, s))
+                return true;
+        }
+    }
+    return false;
+}
+
 template <bool kAny>
-bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
-                     const uint32_t *last, const Vec3 &frame) const {
+bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first, const uint32_t *last,
+                     const Vec3 &frame) const {
     bool hit = false;
     for (const uint32_t *k = first; k != last; ++k) {
         uint32_t code = *k;
@@ -827,7 +925,9 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first,
                 break;
             }
             case kItemGroup: {
-                if (testGroups<kAny>(index, r, s, frame)) {
+                // Any hit: two groups and two packets at a time where the processor can.
+                if (kAny && r.wide ? anyHitInGroupsWide(index, r, s, frame)
+                                   : testGroups<kAny>(index, r, s, frame)) {
                     if constexpr (kAny) return true;
                     hit = true;
                 }
@@ -917,8 +1017,8 @@ __attribute__((always_inline)) inline int64_t axisCell(float v, float lo, float 
 
 // Clips [t0, t1] to the slab of an axis; false when the ray misses it. A zero direction component
 // tests the slab only.
-__attribute__((always_inline)) inline bool clipAxis(float o, float d, float inv, float lo,
-                                                    float hi, float &t0, float &t1) {
+__attribute__((always_inline)) inline bool clipAxis(float o, float d, float inv, float lo, float hi,
+                                                    float &t0, float &t1) {
     if (d == 0.0f) return !(o < lo || o > hi);
     float ta = (lo - o) * inv;
     float tb = (hi - o) * inv;
@@ -996,12 +1096,12 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
 
     WalkAxis X, Y, Z;
     const int64_t strideY = nx_, strideZ = nx_ * ny_;
-    int64_t cell = startAxis(X, r.o.x, r.d.x, r.inv.x, box_.min.x, cellSize_.x, invCellSize_.x,
-                             nx_, 1, t0);
-    cell += strideY * startAxis(Y, r.o.y, r.d.y, r.inv.y, box_.min.y, cellSize_.y,
-                                invCellSize_.y, ny_, strideY, t0);
-    cell += strideZ * startAxis(Z, r.o.z, r.d.z, r.inv.z, box_.min.z, cellSize_.z,
-                                invCellSize_.z, nz_, strideZ, t0);
+    int64_t cell =
+        startAxis(X, r.o.x, r.d.x, r.inv.x, box_.min.x, cellSize_.x, invCellSize_.x, nx_, 1, t0);
+    cell += strideY * startAxis(Y, r.o.y, r.d.y, r.inv.y, box_.min.y, cellSize_.y, invCellSize_.y,
+                                ny_, strideY, t0);
+    cell += strideZ * startAxis(Z, r.o.z, r.d.z, r.inv.z, box_.min.z, cellSize_.z, invCellSize_.z,
+                                nz_, strideZ, t0);
     // Where empty cells keep the distance code of the ray's direction octant.
     const uint32_t shift = 3 * uint32_t((X.step < 0) | (Y.step < 0) << 1 | (Z.step < 0) << 2);
     const uint32_t *cells = cells_.data();
@@ -1031,8 +1131,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             _mm_store_si128(reinterpret_cast<__m128i *>(at),
                             _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), top)));
             // (Above 2^24 cells a coordinate may round one or two past the last cell.)
-            int64_t c = std::min(at[0] + int64_t(at[1]) * strideY + int64_t(at[2]) * strideZ,
-                                 lastCell);
+            int64_t c =
+                std::min(at[0] + int64_t(at[1]) * strideY + int64_t(at[2]) * strideZ, lastCell);
             __builtin_prefetch(cells + c);
         }
     }
@@ -1045,15 +1145,15 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         const int a = X.tNext < Y.tNext ? (X.tNext < Z.tNext ? 0 : 2) : (Y.tNext < Z.tNext ? 1 : 2);
         const float tA = a == 0 ? X.tNext : (a == 1 ? Y.tNext : Z.tNext);
         const int64_t stepA = a == 0 ? X.cellStep : (a == 1 ? Y.cellStep : Z.cellStep);
-        const bool inside = a == 0 ? X.next + X.step != X.beyond
-                                   : (a == 1 ? Y.next + Y.step != Y.beyond
-                                             : Z.next + Z.step != Z.beyond);
+        const bool inside =
+            a == 0 ? X.next + X.step != X.beyond
+                   : (a == 1 ? Y.next + Y.step != Y.beyond : Z.next + Z.step != Z.beyond);
         if (inside) __builtin_prefetch(cells + cell + stepA);
         const uint32_t word = cells[cell];
-        const uint32_t dist = (word >> kItemIndexBits) == kItemEmpty
-                                  ? (word >> shift & 7) == kEmptyAhead ? 255u
-                                                                       : kCubeSide[word >> shift & 7]
-                                  : 0u;
+        const uint32_t dist =
+            (word >> kItemIndexBits) == kItemEmpty
+                ? (word >> shift & 7) == kEmptyAhead ? 255u : kCubeSide[word >> shift & 7]
+                : 0u;
         if (dist == 0) {
             const uint32_t *first = cells + cell, *last = first + 1;
             if ((word >> kItemIndexBits) == kItemList) {
@@ -1076,8 +1176,9 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                         __builtin_prefetch(p + 64);
                     }
                 }
-            if (testItems<kAny>(r, s, first, last,
-                                frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead))) {
+            if (testItems<kAny>(
+                    r, s, first, last,
+                    frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead))) {
                 if constexpr (kAny) return true;
                 found = true;
             }
@@ -1089,7 +1190,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 if (kind == kItemGroup)
                     p = reinterpret_cast<const char *>(groups_.data() + index);
                 else if (kind == kItemPacket)
-                    p = reinterpret_cast<const char *>(store_->triangles.data() + size_t(index) * 4);
+                    p = reinterpret_cast<const char *>(store_->triangles.data() +
+                                                       size_t(index) * 4);
                 else if (kind == kItemList)
                     p = reinterpret_cast<const char *>(items + index);
                 if (p) __builtin_prefetch(p);
@@ -1109,15 +1211,18 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             const int64_t d = int64_t(dist);
             if (j == 0) {
                 if (!leadAxis(X, d)) break;
-                if (!followAxis(Y, r.o.y, r.d.y, tExit, d) || !followAxis(Z, r.o.z, r.d.z, tExit, d))
+                if (!followAxis(Y, r.o.y, r.d.y, tExit, d) ||
+                    !followAxis(Z, r.o.z, r.d.z, tExit, d))
                     return found;
             } else if (j == 1) {
                 if (!leadAxis(Y, d)) break;
-                if (!followAxis(X, r.o.x, r.d.x, tExit, d) || !followAxis(Z, r.o.z, r.d.z, tExit, d))
+                if (!followAxis(X, r.o.x, r.d.x, tExit, d) ||
+                    !followAxis(Z, r.o.z, r.d.z, tExit, d))
                     return found;
             } else {
                 if (!leadAxis(Z, d)) break;
-                if (!followAxis(X, r.o.x, r.d.x, tExit, d) || !followAxis(Y, r.o.y, r.d.y, tExit, d))
+                if (!followAxis(X, r.o.x, r.d.x, tExit, d) ||
+                    !followAxis(Y, r.o.y, r.d.y, tExit, d))
                     return found;
             }
             cell = (Z.next - Z.ahead) * strideZ + (Y.next - Y.ahead) * strideY + X.next - X.ahead;

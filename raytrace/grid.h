@@ -194,6 +194,9 @@ private:
     template <bool kAny>
     bool testGroups(uint32_t index, const TraceRay &ray, TraceState &state,
                     const Vec3 &frame) const;
+    /// testGroups<true> with the eight-wide tests (processors with AVX2 only).
+    bool anyHitInGroupsWide(uint32_t index, const TraceRay &ray, TraceState &state,
+                            const Vec3 &frame) const;
     template <bool kAny>
     bool testItems(const TraceRay &ray, TraceState &state, const uint32_t *first,
                    const uint32_t *last, const Vec3 &frame) const;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <algorithm>
+#include <atomic>
 #include <cmath>
 #include <cstdint>
 #include <limits>
@@ -18,12 +19,26 @@ constexpr float kMinHitDistance = 1e-6f;
 /// The unbounded query distance.
 constexpr float kInfiniteDistance = kLargestFloat;
 
+namespace detail {
+/// On where the processor has AVX2, unless switched off with setWideTests.
+extern std::atomic<bool> wideTests;
+}  // namespace detail
+
+/// Whether queries run the eight-wide AVX2 tests of intersect_wide.h (same answers, same bits).
+inline bool wideTestsEnabled() { return detail::wideTests.load(std::memory_order_relaxed); }
+/// Whether the processor can run the eight-wide tests.
+bool wideTestsAvailable();
+/// Switches the eight-wide tests on (where available) or off for the queries prepared from now
+/// on; returns whether they now run. For comparisons and tests.
+bool setWideTests(bool on);
+
 /// Ray data prepared once per query (and once per instance in object space).
 struct TraceRay {
     Vec3 o, d, inv;              ///< Origin, direction and its component-wise reciprocal.
     uint32_t required = 0;       ///< Flag bits of which a visible object needs one.
     float time = 0.0f;           ///< Shutter time in [0, 1].
     bool overrideFlags = false;  ///< Inside an instance: test every triangle with instFlags.
+    bool wide = false;           ///< Run the eight-wide tests (chosen once per query).
     uint32_t instFlags = 0;
     float4 ox, oy, oz, dx, dy, dz, ix, iy, iz;
     int4 flagKeep, flagSet, required4;  ///< Lane flags = (packet flags & keep) | set.
@@ -54,6 +69,7 @@ struct TraceRay {
         flagKeep = int4(-1);
         flagSet = int4(0);
         required4 = int4(int32_t(required));
+        wide = wideTestsEnabled();
         return true;
     }
 };

@@ -193,9 +193,15 @@ void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSPara
             expectSameHit(hit, ref, i);
             if (::testing::Test::HasFailure()) return;
         }
+        // Occlusion with the four-wide tests and (where the processor has them) the eight-wide.
         float tmax = diag * rng.uniform() * 0.5f;
-        bool occ = grid.occluded(ray, tmax, nullptr);
-        ASSERT_EQ(occ, bruteForce(ins, held, ray, tmax).t >= 0.0f) << "ray " << i;
+        bool occluded = bruteForce(ins, held, ray, tmax).t >= 0.0f;
+        for (bool wide : {false, true}) {
+            setWideTests(wide);
+            bool occ = grid.occluded(ray, tmax, nullptr);
+            setWideTests(true);
+            ASSERT_EQ(occ, occluded) << "ray " << i << " wide " << wide;
+        }
     }
     EXPECT_GT(hits, minHits < 0 ? rays / 6 : minHits);
 }
@@ -255,7 +261,8 @@ TEST(CompleteGridTest, MatchesBruteForceOnPlatesAlongCellPlanesAndPartialPackets
         for (uint32_t i = 0; i < loose; ++i) {
             uint32_t base = uint32_t(m.positions.size());
             float f = 0.3f + 0.5f * float(i);
-            m.positions.insert(m.positions.end(), {{f, 0.1f, 0.1f}, {f, 1.9f, 0.2f}, {f, 1.0f, 1.9f}});
+            m.positions.insert(m.positions.end(),
+                               {{f, 0.1f, 0.1f}, {f, 1.9f, 0.2f}, {f, 1.0f, 1.9f}});
             m.indices.insert(m.indices.end(), {base, base + 1, base + 2});
         }
         ASSERT_EQ(m.triangleCount() % 4, (36 + loose) % 4);
