@@ -825,7 +825,7 @@ OX_WIDE_INLINE __m256 wideBytes(__m128i v, bool high) {
 }
 
 OX_WIDE_INLINE int groupPairMask(const PacketGroup &g0, const PacketGroup *g1, const WideFrame &f,
-                                 float limit) {
+                                 float limit, __m256 &tnear) {
     using namespace wide_ops;
     const PacketGroup &h = g1 ? *g1 : g0;
     // Per group: lo x, y, z, hi x in the first 16 bytes; hi y, z in the next 8. Interleaved by
@@ -842,8 +842,8 @@ OX_WIDE_INLINE int groupPairMask(const PacketGroup &g0, const PacketGroup *g1, c
     __m256 t1x = add(mul(wideBytes(loZhiX, true), f.ax), f.bx);
     __m256 t1y = add(mul(wideBytes(hiYZ, false), f.ay), f.by);
     __m256 t1z = add(mul(wideBytes(hiYZ, true), f.az), f.bz);
-    __m256 tnear = _mm256_max_ps(_mm256_max_ps(_mm256_min_ps(t0x, t1x), _mm256_min_ps(t0y, t1y)),
-                                 _mm256_max_ps(_mm256_min_ps(t0z, t1z), _mm256_setzero_ps()));
+    tnear = _mm256_max_ps(_mm256_max_ps(_mm256_min_ps(t0x, t1x), _mm256_min_ps(t0y, t1y)),
+                          _mm256_max_ps(_mm256_min_ps(t0z, t1z), _mm256_setzero_ps()));
     __m256 tfar = _mm256_min_ps(_mm256_min_ps(_mm256_max_ps(t0x, t1x), _mm256_max_ps(t0y, t1y)),
                                 _mm256_min_ps(_mm256_max_ps(t0z, t1z), _mm256_set1_ps(limit)));
     int lanes = (1 << g0.count) - 1;
@@ -866,6 +866,79 @@ OX_WIDE_INLINE bool packetPairHit(const PrimitiveStore &store, uint32_t k0, uint
 
 }  // namespace
 
+// Closest hit: the groups' boxes two groups at a time, the packets one at a time as testGroups
+// tests them (pairs of packets lost more than they gained), so that both give the same hit.
+__attribute__((target("avx2"))) bool Grid::closestInGroupsWide(uint32_t index, const TraceRay &r,
+                                                               TraceState &s,
+                                                               const Vec3 &frame) const {
+    using namespace wide_ops;
+    const PacketGroup *g = groups_.data() + index;
+    const char *bytes = reinterpret_cast<const char *>(g);
+    __builtin_prefetch(bytes);
+    __builtin_prefetch(bytes + 64);
+    __builtin_prefetch(bytes + 128);
+    const uint32_t n = g->run;
+    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    WideFrame f;
+    f.ax = mul(_mm256_set1_ps(frameStep_.x), wide(r.ix));
+    f.ay = mul(_mm256_set1_ps(frameStep_.y), wide(r.iy));
+    f.az = mul(_mm256_set1_ps(frameStep_.z), wide(r.iz));
+    f.bx = mul(sub(_mm256_set1_ps(frame.x), wide(r.ox)), wide(r.ix));
+    f.by = mul(sub(_mm256_set1_ps(frame.y), wide(r.oy)), wide(r.iy));
+    f.bz = mul(sub(_mm256_set1_ps(frame.z), wide(r.oz)), wide(r.iz));
+    bool hit = false;
+    constexpr uint32_t kMaxCandidates = 16;
+    if (n * 4 <= kMaxCandidates) {
+        alignas(32) float tn[kMaxCandidates];
+        uint32_t packet[kMaxCandidates], count = 0;
+        for (uint32_t i = 0; i < n; i += 2) {
+            const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
+            __m256 tnear;
+            int mask = groupPairMask(*pair[0], pair[1], f, s.limit, tnear);
+            _mm256_storeu_ps(tn + count, tnear);
+            uint32_t kept = count;
+            for (int m = mask; m; m &= m - 1) {
+                int lane = __builtin_ctz(m);
+                uint32_t k = pair[lane >> 2]->packet[lane & 3];
+                prefetchPacket(*store_, k);
+                tn[kept] = tn[count + uint32_t(lane)];
+                packet[kept++] = k;
+            }
+            count = kept;
+        }
+        while (count) {
+            uint32_t best = 0;
+            for (uint32_t i = 1; i < count; ++i)
+                if (tn[i] < tn[best]) best = i;
+            if (!(tn[best] <= s.limit)) break;
+            uint32_t k = packet[best];
+            --count;
+            tn[best] = tn[count], packet[best] = packet[count];
+            if (testPacket<false>(*store_, k, r, s)) hit = true;
+        }
+        return hit;
+    }
+    for (uint32_t i = 0; i < n; i += 2) {
+        const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
+        __m256 tnear;
+        int mask = groupPairMask(*pair[0], pair[1], f, s.limit, tnear);
+        for (int m = mask; m; m &= m - 1) {
+            int lane = __builtin_ctz(m);
+            prefetchPacket(*store_, pair[lane >> 2]->packet[lane & 3]);
+        }
+        while (mask) {
+            int lane = __builtin_ctz(mask);
+            mask &= mask - 1;
+            if (testPacket<false>(*store_, pair[lane >> 2]->packet[lane & 3], r, s)) {
+                hit = true;
+                mask &=
+                    _mm256_movemask_ps(_mm256_cmp_ps(tnear, _mm256_set1_ps(s.limit), _CMP_LE_OS));
+            }
+        }
+    }
+    return hit;
+}
+
 __attribute__((target("avx2"))) bool Grid::anyHitInGroupsWide(uint32_t index, const TraceRay &r,
                                                               TraceState &s,
                                                               const Vec3 &frame) const {
@@ -887,7 +960,8 @@ __attribute__((target("avx2"))) bool Grid::anyHitInGroupsWide(uint32_t index, co
     // Two groups at a time, the packets they let through two at a time.
     for (uint32_t i = 0; i < n; i += 2) {
         const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
-        int mask = groupPairMask(*pair[0], pair[1], f, s.limit);
+        __m256 tnear;
+        int mask = groupPairMask(*pair[0], pair[1], f, s.limit, tnear);
         for (int m = mask; m; m &= m - 1) {
             int lane = __builtin_ctz(m);
             prefetchPacket(*store_, pair[lane >> 2]->packet[lane & 3]);
@@ -925,9 +999,10 @@ bool Grid::testItems(const TraceRay &r, TraceState &s, const uint32_t *first, co
                 break;
             }
             case kItemGroup: {
-                // Any hit: two groups and two packets at a time where the processor can.
-                if (kAny && r.wide ? anyHitInGroupsWide(index, r, s, frame)
-                                   : testGroups<kAny>(index, r, s, frame)) {
+                // Two groups at a time where the processor can.
+                if (r.wide ? (kAny ? anyHitInGroupsWide(index, r, s, frame)
+                                   : closestInGroupsWide(index, r, s, frame))
+                           : testGroups<kAny>(index, r, s, frame)) {
                     if constexpr (kAny) return true;
                     hit = true;
                 }

@@ -194,9 +194,12 @@ private:
     template <bool kAny>
     bool testGroups(uint32_t index, const TraceRay &ray, TraceState &state,
                     const Vec3 &frame) const;
-    /// testGroups<true> with the eight-wide tests (processors with AVX2 only).
+    /// testGroups<true> and testGroups<false> with eight-wide box tests of two groups at a time
+    /// (processors with AVX2 only); any-hit queries also test two packets at a time.
     bool anyHitInGroupsWide(uint32_t index, const TraceRay &ray, TraceState &state,
                             const Vec3 &frame) const;
+    bool closestInGroupsWide(uint32_t index, const TraceRay &ray, TraceState &state,
+                             const Vec3 &frame) const;
     template <bool kAny>
     bool testItems(const TraceRay &ray, TraceState &state, const uint32_t *first,
                    const uint32_t *last, const Vec3 &frame) const;

@@ -177,8 +177,16 @@ void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSPara
         ray.direction = ray.direction.normalized();
         ray.type = i % 3 == 0 ? kRayShadow : kRayPrimary;
         ray.time = rng.uniform();
-        Hit hit;
+        // The four-wide path must report the very hit of the eight-wide one (where the
+        // processor has it).
+        Hit hit, narrow;
+        setWideTests(false);
+        bool foundNarrow = grid.intersect(ray, narrow, kInfiniteDistance, nullptr);
+        setWideTests(true);
         bool found = grid.intersect(ray, hit, kInfiniteDistance, nullptr);
+        ASSERT_EQ(found, foundNarrow) << "ray " << i;
+        ASSERT_EQ(hit.t, narrow.t) << "ray " << i;
+        ASSERT_EQ(hit.primitive, narrow.primitive) << "ray " << i;
         Reference ref = bruteForce(ins, held, ray, kInfiniteDistance);
         ASSERT_EQ(found, ref.t >= 0.0f) << "ray " << i;
         if (found) {
@@ -193,7 +201,7 @@ void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSPara
             expectSameHit(hit, ref, i);
             if (::testing::Test::HasFailure()) return;
         }
-        // Occlusion with the four-wide tests and (where the processor has them) the eight-wide.
+        // Occlusion with both.
         float tmax = diag * rng.uniform() * 0.5f;
         bool occluded = bruteForce(ins, held, ray, tmax).t >= 0.0f;
         for (bool wide : {false, true}) {
