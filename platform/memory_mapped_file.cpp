@@ -14,6 +14,27 @@
 namespace ox {
 namespace {
 
+/// Plain blocks from this size on are mapped on their own, aligned to a huge page and offered
+/// to the kernel as huge pages: a frame layer then faults in and zero-fills in 2 MiB steps
+/// instead of 4 KiB ones, and tile walks over it miss the TLB far less often.
+constexpr uint64_t kHugePage = uint64_t(2) << 20;
+
+/// A zero-filled anonymous mapping of size bytes (a multiple of kHugePage) aligned to
+/// kHugePage; null when it cannot be had.
+void *mapHugeAligned(uint64_t size) {
+    const size_t span = size_t(size + kHugePage);
+    void *p = mmap(nullptr, span, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+    if (p == MAP_FAILED) return nullptr;
+    const uintptr_t start = reinterpret_cast<uintptr_t>(p);
+    const uintptr_t aligned = (start + kHugePage - 1) & ~uintptr_t(kHugePage - 1);
+    // The slack before and after the aligned range goes back at once.
+    if (aligned > start) munmap(p, aligned - start);
+    const size_t tail = span - (aligned - start) - size_t(size);
+    if (tail > 0) munmap(reinterpret_cast<void *>(aligned + size_t(size)), tail);
+    madvise(reinterpret_cast<void *>(aligned), size_t(size), MADV_HUGEPAGE);  // advice only
+    return reinterpret_cast<void *>(aligned);
+}
+
 std::string tempDirectory() {
     const char *dir = std::getenv("TMPDIR");
     std::string d = (dir && *dir) ? dir : "/tmp";
@@ -30,7 +51,12 @@ MemoryMappedFile::MemoryMappedFile(uint64_t size, uint64_t memoryLimit) : size_(
             fail("Cannot allocate memory block", ENOMEM);
             return;
         }
-        base_ = static_cast<unsigned char *>(std::calloc(size_t(size), 1));
+        if (size >= kHugePage && size <= SIZE_MAX - 2 * kHugePage) {
+            mapped_ = (size + kHugePage - 1) & ~(kHugePage - 1);
+            base_ = static_cast<unsigned char *>(mapHugeAligned(mapped_));
+            if (!base_) mapped_ = 0;
+        }
+        if (!base_) base_ = static_cast<unsigned char *>(std::calloc(size_t(size), 1));
         if (!base_) fail("Cannot allocate memory block", ENOMEM);
         return;
     }
@@ -64,6 +90,8 @@ MemoryMappedFile::~MemoryMappedFile() {
     if (fd_ >= 0) {
         if (base_) munmap(base_, size_t(size_));
         close(fd_);
+    } else if (mapped_ > 0) {
+        munmap(base_, size_t(mapped_));
     } else {
         std::free(base_);
     }

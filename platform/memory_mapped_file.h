@@ -4,8 +4,9 @@
 #include <cstdint>
 #include <string>
 
-/// A large memory block: plain memory up to kMemoryLimit bytes, above that a mapped
-/// temporary file, so that huge frame and texture buffers do not fail for lack of memory.
+/// A large memory block: plain memory up to kMemoryLimit bytes (from 2 MiB on a mapping of its
+/// own offered as huge pages), above that a mapped temporary file, so that huge frame and
+/// texture buffers do not fail for lack of memory.
 namespace ox {
 
 class MemoryMappedFile {
@@ -52,6 +53,7 @@ private:
 
     uint64_t size_ = 0;
     unsigned char *base_ = nullptr;
+    uint64_t mapped_ = 0;  // bytes of an anonymous mapping of a plain block, 0 for calloc
     int fd_ = -1;
     bool failed_ = false;
 };

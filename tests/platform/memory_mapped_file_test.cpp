@@ -58,6 +58,29 @@ TEST_F(MemoryMappedFileTest, SmallBlockLivesInMemory) {
     EXPECT_TRUE(empty.ok());
 }
 
+TEST_F(MemoryMappedFileTest, LargeMemoryBlockOfOddSizeIsZeroedAndWritableToTheLastByte) {
+    // Several huge pages and a part of one: the block is aligned and sized in whole pages
+    // inside, but holds exactly the bytes asked for.
+    const uint64_t size = (5ull << 20) + 12345;
+    for (int round = 0; round < 2; ++round) {  // the second block may reuse the first's pages
+        ox::MemoryMappedFile block(size);
+        ASSERT_TRUE(block.ok());
+        EXPECT_FALSE(block.isFileBacked());
+        std::vector<uint64_t> words(size / 8, ~0ull);
+        ASSERT_TRUE(block.read(0, words.data(), words.size() * 8));
+        EXPECT_TRUE(std::all_of(words.begin(), words.end(), [](uint64_t w) { return w == 0; }));
+        for (size_t i = 0; i < words.size(); ++i) words[i] = pattern(i);
+        ASSERT_TRUE(block.write(0, words.data(), words.size() * 8));
+        const unsigned char last = 0xA5;
+        EXPECT_TRUE(block.write(size - 1, &last, 1));
+        EXPECT_FALSE(block.write(size, &last, 1));
+        EXPECT_EQ(static_cast<unsigned char *>(block.map(size - 1, 1))[0], 0xA5);
+        uint64_t back = 0;
+        ASSERT_TRUE(block.read((size / 16) * 8, &back, 8));
+        EXPECT_EQ(back, pattern(size / 16));
+    }
+}
+
 TEST_F(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
     const uint64_t size = 300ull << 20;
     {
