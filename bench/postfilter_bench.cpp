@@ -85,6 +85,21 @@ ox::RenderContext &noContext() {
     return *reinterpret_cast<ox::RenderContext *>(storage);
 }
 
+/// Progress goes nowhere; nothing aborts.
+struct NoIO final : ox::RenderIOInterface {
+    bool isAborted() const override { return false; }
+    bool isReleased() override { return false; }
+    void setProgressTitle(const std::string &) override {}
+    void beginCommand() override {}
+    void endCommand() override {}
+    void finish() override {}
+    void setProgress(float) override {}
+    void abort() override {}
+    void release() override {}
+    void clearRelease() override {}
+    void refreshDisplay() override {}
+};
+
 /// The floor of every filter that replaces a layer: read it in bands, paste into a scratch
 /// layer (the storage retired by the previous round), retire the old one and rename the new
 /// one.
@@ -127,6 +142,44 @@ BENCHMARK(BM_EdgeDilation)
     ->MeasureProcessCPUTime()
     ->UseRealTime();
 
+/// The chain's other two steps on their own (one frame, filtered again and again).
+void BM_Premultiply(benchmark::State &state) {
+    auto frame = makeFrame();
+    ox::PostFilterCommand premultiply(
+        std::make_unique<ox::PremultiplyFilter>(std::vector<std::string>{"beauty"}, 0.0f,
+                                                ox::Color(0, 0, 0, 0)),
+        int(state.range(0)));
+    NoIO io;
+    for (auto _ : state)
+        if (!premultiply.execute(*frame, noContext(), io)) state.SkipWithError("failed");
+    state.SetItemsProcessed(int64_t(state.iterations()) * kSize * kSize);
+}
+BENCHMARK(BM_Premultiply)
+    ->ArgName("threads")
+    ->Arg(1)
+    ->Arg(2)
+    ->Unit(benchmark::kMillisecond)
+    ->MeasureProcessCPUTime()
+    ->UseRealTime();
+
+void BM_ShapeNormalization(benchmark::State &state) {
+    auto frame = makeFrame();
+    CellInstances instances;
+    ox::ShapeNormalizationFilter normalization("beauty", ox::NormalizeOptions{}, &instances);
+    normalization.setThreadCount(int(state.range(0)));
+    NoIO io;
+    for (auto _ : state)
+        if (!normalization.run(*frame, &io)) state.SkipWithError("failed");
+    state.SetItemsProcessed(int64_t(state.iterations()) * kSize * kSize);
+}
+BENCHMARK(BM_ShapeNormalization)
+    ->ArgName("threads")
+    ->Arg(1)
+    ->Arg(2)
+    ->Unit(benchmark::kMillisecond)
+    ->MeasureProcessCPUTime()
+    ->UseRealTime();
+
 void BM_FilterChain(benchmark::State &state) {
     auto frame = makeFrame();
     const int threads = int(state.range(0));
@@ -139,19 +192,7 @@ void BM_FilterChain(benchmark::State &state) {
     dilation.setThreadCount(threads);
     ox::ShapeNormalizationFilter normalization("beauty", ox::NormalizeOptions{}, &instances);
     normalization.setThreadCount(threads);
-    struct NoIO final : ox::RenderIOInterface {
-        bool isAborted() const override { return false; }
-        bool isReleased() override { return false; }
-        void setProgressTitle(const std::string &) override {}
-        void beginCommand() override {}
-        void endCommand() override {}
-        void finish() override {}
-        void setProgress(float) override {}
-        void abort() override {}
-        void release() override {}
-        void clearRelease() override {}
-        void refreshDisplay() override {}
-    } io;
+    NoIO io;
     for (auto _ : state) {
         const bool ok = premultiply.execute(*frame, noContext(), io) && dilation.run(*frame, &io) &&
                         normalization.run(*frame, &io);

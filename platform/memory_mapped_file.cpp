@@ -14,14 +14,18 @@
 namespace ox {
 namespace {
 
-/// Plain blocks from this size on are mapped on their own, aligned to a huge page and offered
-/// to the kernel as huge pages: a frame layer then faults in and zero-fills in 2 MiB steps
-/// instead of 4 KiB ones, and tile walks over it miss the TLB far less often.
-constexpr uint64_t kHugePage = uint64_t(2) << 20;
+std::string tempDirectory() {
+    const char *dir = std::getenv("TMPDIR");
+    std::string d = (dir && *dir) ? dir : "/tmp";
+    if (d.back() != '/') d += '/';
+    return d;
+}
 
-/// A zero-filled anonymous mapping of size bytes (a multiple of kHugePage) aligned to
-/// kHugePage; null when it cannot be had.
-void *mapHugeAligned(uint64_t size) {
+}  // namespace
+
+void *allocateHugeBlock(uint64_t bytes) {
+    if (bytes == 0 || bytes > SIZE_MAX - 2 * kHugePage) return nullptr;
+    const uint64_t size = (bytes + kHugePage - 1) & ~(kHugePage - 1);
     const size_t span = size_t(size + kHugePage);
     void *p = mmap(nullptr, span, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
     if (p == MAP_FAILED) return nullptr;
@@ -35,14 +39,9 @@ void *mapHugeAligned(uint64_t size) {
     return reinterpret_cast<void *>(aligned);
 }
 
-std::string tempDirectory() {
-    const char *dir = std::getenv("TMPDIR");
-    std::string d = (dir && *dir) ? dir : "/tmp";
-    if (d.back() != '/') d += '/';
-    return d;
+void releaseHugeBlock(void *block, uint64_t bytes) {
+    if (block) munmap(block, size_t((bytes + kHugePage - 1) & ~(kHugePage - 1)));
 }
-
-}  // namespace
 
 MemoryMappedFile::MemoryMappedFile(uint64_t size, uint64_t memoryLimit) : size_(size) {
     if (size == 0) return;
@@ -51,10 +50,9 @@ MemoryMappedFile::MemoryMappedFile(uint64_t size, uint64_t memoryLimit) : size_(
             fail("Cannot allocate memory block", ENOMEM);
             return;
         }
-        if (size >= kHugePage && size <= SIZE_MAX - 2 * kHugePage) {
-            mapped_ = (size + kHugePage - 1) & ~(kHugePage - 1);
-            base_ = static_cast<unsigned char *>(mapHugeAligned(mapped_));
-            if (!base_) mapped_ = 0;
+        if (size >= kHugePage) {
+            base_ = static_cast<unsigned char *>(allocateHugeBlock(size));
+            huge_ = base_ != nullptr;
         }
         if (!base_) base_ = static_cast<unsigned char *>(std::calloc(size_t(size), 1));
         if (!base_) fail("Cannot allocate memory block", ENOMEM);
@@ -90,8 +88,8 @@ MemoryMappedFile::~MemoryMappedFile() {
     if (fd_ >= 0) {
         if (base_) munmap(base_, size_t(size_));
         close(fd_);
-    } else if (mapped_ > 0) {
-        munmap(base_, size_t(mapped_));
+    } else if (huge_) {
+        releaseHugeBlock(base_, size_);
     } else {
         std::free(base_);
     }

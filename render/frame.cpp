@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "core/message.h"
+#include "platform/memory_mapped_file.h"
 
 namespace ox {
 
@@ -13,6 +14,20 @@ namespace ox {
 namespace {
 
 constexpr std::align_val_t kScratchAlign{64};
+
+/// Blocks from a huge page on live on huge pages (a fresh table of a large frame then faults
+/// in 2 MiB at a time); smaller ones come from the heap.
+void *newBlock(size_t bytes) {
+    if (bytes >= kHugePage) return allocateHugeBlock(bytes);
+    return ::operator new(bytes, kScratchAlign, std::nothrow);
+}
+
+void deleteBlock(void *data, size_t bytes) {
+    if (bytes >= kHugePage)
+        releaseHugeBlock(data, bytes);
+    else
+        ::operator delete(data, kScratchAlign);
+}
 
 }  // namespace
 
@@ -48,7 +63,9 @@ ScratchBlock ScratchPool::borrow(size_t bytes) {
             return block;
         }
     }
-    void *data = ::operator new(bytes, kScratchAlign, std::nothrow);
+    // A huge block is rounded to whole pages: the rest of its last page is usable too.
+    if (bytes >= kHugePage) bytes = (bytes + kHugePage - 1) & ~size_t(kHugePage - 1);
+    void *data = newBlock(bytes);
     if (data) block.pool_ = this, block.data_ = data, block.bytes_ = bytes;
     return block;
 }
@@ -61,10 +78,10 @@ void ScratchPool::giveBack(void *data, size_t bytes) {
             std::min_element(kept_.begin(), kept_.end(),
                              [](const Kept &a, const Kept &b) { return a.bytes < b.bytes; });
         if (smallest->bytes >= bytes) {
-            ::operator delete(data, kScratchAlign);
+            deleteBlock(data, bytes);
             return;
         }
-        ::operator delete(smallest->data, kScratchAlign);
+        deleteBlock(smallest->data, smallest->bytes);
         kept_.erase(smallest);
     }
     kept_.push_back({data, bytes});
@@ -72,7 +89,7 @@ void ScratchPool::giveBack(void *data, size_t bytes) {
 
 void ScratchPool::release() {
     std::lock_guard<std::mutex> lock(mutex_);
-    for (const Kept &k : kept_) ::operator delete(k.data, kScratchAlign);
+    for (const Kept &k : kept_) deleteBlock(k.data, k.bytes);
     kept_.clear();
 }
 

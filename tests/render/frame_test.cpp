@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstring>
 #include <functional>
 #include <memory>
 #include <string>
@@ -450,6 +451,31 @@ TEST(FrameTest, RetiredStorageServesTheNextScratchLayerOnly) {
     frame.retireLayer("temp1");
     frame.releaseRetiredLayers();
     EXPECT_EQ(frame.retiredLayerCount(), 0u);
+}
+
+TEST(ScratchPoolTest, BlocksOfEverySizeAreAlignedWholeAndReused) {
+    ox::ScratchPool pool;
+    // Below, at and above a huge page: aligned, usable to the last byte, given back on reset.
+    for (size_t bytes : {size_t(100), size_t(2) << 20, (size_t(5) << 20) + 3}) {
+        void *first = nullptr;
+        {
+            ox::ScratchBlock block = pool.borrow(bytes);
+            ASSERT_NE(block.as<char>(), nullptr) << bytes;
+            EXPECT_GE(block.bytes(), bytes);
+            EXPECT_EQ(reinterpret_cast<uintptr_t>(block.as<char>()) % 64, 0u);
+            std::memset(block.as<char>(), 0x5A, block.bytes());
+            first = block.as<void>();
+        }
+        EXPECT_GE(pool.keptBytes(), bytes);
+        // The block kept serves the next request of its size, a much smaller one does not.
+        ox::ScratchBlock again = pool.borrow(bytes);
+        EXPECT_EQ(again.as<void>(), first) << bytes;
+        again.reset();
+        ox::ScratchBlock tiny = pool.borrow(bytes / 8 + 1);
+        EXPECT_NE(tiny.as<void>(), first);
+    }
+    pool.release();
+    EXPECT_EQ(pool.keptBytes(), 0u);
 }
 
 TEST(LayerViewTest, ColourAndCustomFloatViews) {
