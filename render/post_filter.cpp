@@ -99,15 +99,33 @@ TexelRuns::TexelRuns(LayerT<Color> &in, LayerT<Color> *out, LayerT<float> *z)
 
 // ---------------------------------------------------------------------------------------------
 
+bool InPlaceTexels::possible(LayerT<Color> &layer) {
+    TileGrid<Color> grid;
+    return layer.observers().empty() && layer.tileGrid(grid);
+}
+
+InPlaceTexels::InPlaceTexels(LayerT<Color> &layer, ScratchPool &pool)
+    : width_(layer.width()), height_(layer.height()) {
+    if (!layer.tileGrid(grid_) || grid_.tileWidth <= 0 || grid_.tileHeight <= 0) return;
+    done_.assign(size_t(std::max(height_, 0)), 0);
+    first_.assign(done_.size(), 0);
+    log_ = pool.borrow(std::max<size_t>(size_t(width_) * size_t(height_), 1) * sizeof(Color));
+}
+
+// ---------------------------------------------------------------------------------------------
+
 FilterResults::~FilterResults() { discard(); }
+
+bool FilterResults::nameFree(const std::string &name, const char *filterName) const {
+    if (!frame_.hasLayer(name)) return true;
+    message(kMsgError, 6, "Layer %s already exists; the %s cannot write its result there",
+            name.c_str(), filterName);
+    return false;
+}
 
 LayerT<Color> *FilterResults::addColor(const std::string &name, const std::string &target,
                                        const char *filterName) {
-    if (frame_.hasLayer(name)) {
-        message(kMsgError, 6, "Layer %s already exists; the %s cannot write its result there",
-                name.c_str(), filterName);
-        return nullptr;
-    }
+    if (!nameFree(name, filterName)) return nullptr;
     // Every filter writes all of its result before placing it, so recycled storage serves.
     LayerT<Color> *layer = frame_.addScratchColorLayer(name);
     if (layer) entries_.push_back({name, target});

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <algorithm>
+#include <atomic>
 #include <cstdint>
 #include <cstring>
 #include <functional>
@@ -44,7 +45,10 @@
 /// deleted and the results renamed to the source names, so the next command finds the filtered
 /// layer under the old name. A failure or an abort (through the io's isAborted, checked between
 /// bands of rows, progress reported every tenth) removes the unfinished result layers and
-/// leaves the sources untouched. Results do not depend on the thread count.
+/// leaves the sources untouched. Premultiply and shape normalization, which change only some
+/// texels, rewrite those in the source's tiles instead when the source allows it (see
+/// InPlaceTexels): the originals are kept until the end and go back on a failure or an abort,
+/// and the result names must be free all the same. Results do not depend on the thread count.
 namespace ox {
 
 /// The rows of a band of filter work: one tile row of the frame's tiled layers, so that every
@@ -136,6 +140,64 @@ private:
     TileGrid<float> zGrid_;
 };
 
+/// Rewrites chosen texels of a colour layer straight in its tiles, keeping their originals so
+/// that the layer can be put back as it was after an abort or a failure. A filter whose result
+/// replaces its source thereby spares writing a whole new layer (and reading and writing every
+/// texel it leaves alone). The choice of a texel must not depend on what the rewrite changes: it
+/// is made again when the originals go back.
+class InPlaceTexels {
+public:
+    /// True when the layer keeps addressable tiles and has no observers (writes through the
+    /// tiles reach none).
+    static bool possible(LayerT<Color> &layer);
+
+    /// For a layer for which possible() holds. The room for the originals (as many as the
+    /// layer has texels) is borrowed from pool; the originals are packed into it, so that only
+    /// as much is touched as they take.
+    InPlaceTexels(LayerT<Color> &layer, ScratchPool &pool);
+    /// False when the room for the originals could not be had.
+    bool ok() const { return log_.as<Color>() != nullptr; }
+
+    /// Rewrites the chosen texels of rows [y0, y1) (disjoint for concurrent calls, each row
+    /// once): chosen(x, y, c) picks a texel, rewrite(x, y, c) changes it. The originals pass
+    /// through the calling thread's scratch.
+    template <typename Chosen, typename Rewrite>
+    void run(int32_t y0, int32_t y1, BandScratch &scratch, Chosen &&chosen, Rewrite &&rewrite);
+    /// Puts back the originals of every row rewritten so far (no run may be going on).
+    template <typename Chosen>
+    void restore(Chosen &&chosen);
+    /// Texel (x, y) in the layer's tiles (for single texels; their originals are the caller's).
+    Color &at(int32_t x, int32_t y) const {
+        const int32_t tx = x / grid_.tileWidth, ty = y / grid_.tileHeight;
+        return grid_.tile(uint32_t(tx),
+                          uint32_t(ty))[int64_t(y - ty * grid_.tileHeight) * grid_.tileWidth +
+                                        (x - tx * grid_.tileWidth)];
+    }
+
+private:
+    /// Calls f(x, y, texels of the run, n) for rows [y0, y1), tile by tile.
+    template <typename F>
+    void eachRun(int32_t y0, int32_t y1, F &&f) const {
+        const int32_t tw = grid_.tileWidth, th = grid_.tileHeight;
+        for (int32_t ty = y0 / th; ty * th < y1; ++ty) {
+            const int32_t ya = std::max(y0, ty * th), yb = std::min(y1, (ty + 1) * th);
+            for (int32_t x = 0, tx = 0; x < width_; x += tw, ++tx) {
+                Color *tile = grid_.tile(uint32_t(tx), uint32_t(ty));
+                const int32_t n = std::min(tw, width_ - x);
+                for (int32_t y = ya; y < yb; ++y) f(x, y, tile + int64_t(y - ty * th) * tw, n);
+            }
+        }
+    }
+
+    int32_t width_, height_;
+    TileGrid<Color> grid_;
+    ScratchBlock log_;
+    std::atomic<size_t> used_{0};  // originals in log_
+    /// Per row y that starts a run: the end of its rows (0: none) and its first original.
+    std::vector<int32_t> done_;
+    std::vector<size_t> first_;
+};
+
 /// Runs a body over bands of rows of an image on a number of threads, with progress and abort.
 class RowBands {
 public:
@@ -180,6 +242,9 @@ public:
     /// may reuse a retired layer's storage: the filter must write every texel before placing.
     LayerT<Color> *addColor(const std::string &name, const std::string &target,
                             const char *filterName);
+    /// True when `name` is free for a result; false after the error message addColor gives
+    /// (for a filter that finds it can do without the layer).
+    bool nameFree(const std::string &name, const char *filterName) const;
     /// Retires every source given (may repeat or be absent), then renames each result to
     /// its target. False after one error message when a rename fails.
     bool place(const std::vector<std::string> &sources);
@@ -229,6 +294,47 @@ bool TexelRuns::run(int32_t y0, int32_t y1, BandScratch &scratch, F &&body) {
         body(0, y, w, colors + row, out_ ? colors + row : nullptr, depth ? depth + row : nullptr);
     }
     return !out_ || out_->paste(rows, colors);
+}
+
+template <typename Chosen, typename Rewrite>
+void InPlaceTexels::run(int32_t y0, int32_t y1, BandScratch &scratch, Chosen &&chosen,
+                        Rewrite &&rewrite) {
+    y1 = std::min(y1, height_);
+    if (y0 < 0 || y0 >= y1) return;
+    // The originals of the rows are gathered in the thread's buffer, then packed into the log
+    // past the cache (no other thread reads them before the run has ended).
+    Color *const buffer = scratch.colorBuffer(size_t(y1 - y0) * size_t(width_));
+    Color *keep = buffer;
+    eachRun(y0, y1, [&](int32_t x, int32_t y, Color *c, int32_t n) {
+        for (int32_t i = 0; i < n; ++i)
+            if (chosen(x + i, y, c[i])) {
+                *keep++ = c[i];
+                rewrite(x + i, y, c[i]);
+            }
+    });
+    const size_t count = size_t(keep - buffer);
+    const size_t first = used_.fetch_add(count, std::memory_order_relaxed);
+    for (size_t done = 0; done < count;) {
+        const int32_t part = int32_t(std::min<size_t>(count - done, 1 << 20));
+        streamColors(log_.as<Color>() + first + done, buffer + done, part);
+        done += size_t(part);
+    }
+    streamFence();
+    first_[size_t(y0)] = first;
+    done_[size_t(y0)] = y1;
+}
+
+template <typename Chosen>
+void InPlaceTexels::restore(Chosen &&chosen) {
+    for (size_t y0 = 0; y0 < done_.size(); ++y0) {
+        if (done_[y0] == 0) continue;
+        const Color *kept = log_.as<Color>() + first_[y0];
+        eachRun(int32_t(y0), done_[y0], [&](int32_t x, int32_t y, Color *c, int32_t n) {
+            for (int32_t i = 0; i < n; ++i)
+                if (chosen(x + i, y, c[i])) c[i] = *kept++;
+        });
+        done_[y0] = 0;
+    }
 }
 
 // ---------------------------------------------------------------------------------------------
@@ -281,7 +387,7 @@ private:
 
 /// Removes a background colour mixed into semi-transparent texels: where a > max(t, 0),
 /// rgb' = (rgb - bg (1 - a)) / a; elsewhere the texel is copied. One result layer per source,
-/// "temp" (then "temp1", "temp2", ...).
+/// "temp" (then "temp1", "temp2", ...), unless the sources are rewritten in place.
 class PremultiplyFilter final : public PostFilter {
 public:
     PremultiplyFilter(std::vector<std::string> sources, float threshold, const Color &background)
@@ -304,12 +410,23 @@ public:
     }
 
 private:
+    /// True for a texel that the filter changes (its alpha, which the filter keeps, decides).
+    bool chosen(const Color &c) const { return c.a > threshold_ && c.a > 0.0f; }
+
     std::vector<std::string> sources_;
     float threshold_;
     Color background_;
     std::vector<LayerT<Color> *> in_, out_;
     std::vector<std::unique_ptr<TexelRuns>> runs_;
     std::unique_ptr<FilterResults> results_;
+    // Sources rewritten in place (instead of out_), and single texels rewritten so.
+    std::vector<std::unique_ptr<InPlaceTexels>> inPlace_;
+    struct PixelUndo {
+        size_t layer;
+        int32_t x, y;
+        Color original;
+    };
+    std::vector<PixelUndo> pixelUndo_;
 };
 
 /// Maps the covered texels ("Z" >= 0; every texel when the frame has no "Z") of one colour

@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <cmath>
+#include <functional>
 #include <optional>
 #include <type_traits>
 #ifdef __SSE2__
@@ -151,12 +152,17 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     const int32_t count = instances_ ? std::max(0, instances_->instanceCount()) : 0;
     const int32_t slots = count + 1;
 
+    // The remapped texels are rewritten in the source's tiles when it allows (their originals
+    // kept until the end), else the result goes to "temp" and replaces the source.
+    const int32_t bandRows = kFilterBandRows;
+    const bool inPlace = InPlaceTexels::possible(*in);
     FilterResults results(frame);
-    LayerT<Color> *out = results.addColor("temp", source_, "shape normalization filter");
-    if (!out) return false;
+    LayerT<Color> *out = nullptr;
+    if (inPlace ? !results.nameFree("temp", "shape normalization filter")
+                : !(out = results.addColor("temp", source_, "shape normalization filter")))
+        return false;
 
     // Gather: per thread ranges, the instance of every texel, texels without one per band.
-    const int32_t bandRows = kFilterBandRows;
     const int32_t bandCount = (h + bandRows - 1) / bandRows;
     // The slot of every texel, in 16 bits when the slots allow (most runs): the table is
     // written once and read once, so its size is memory traffic.
@@ -308,25 +314,64 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         }
     }
 
-    // Remap the covered texels that have an instance; the rest are copied.
-    TexelRuns remapRuns(*in, out, nullptr);
+    // Remap the covered texels that have an instance; the rest stay (or are copied).
+    // Background Id(-1) and no instance Id(-2) are the two largest codes of the unsigned table,
+    // the two negative ones of the signed one.
+    auto hasSlot = [](auto id) {
+        if constexpr (std::is_signed_v<decltype(id)>)
+            return id >= 0;
+        else
+            return id < decltype(id)(-2);
+    };
+    std::optional<InPlaceTexels> rewrite;
+    if (inPlace) {
+        rewrite.emplace(*in, frame.scratch());
+        if (!rewrite->ok()) {
+            message(kMsgError, 6, "Shape normalization of %s is out of memory", source_.c_str());
+            return false;
+        }
+    }
+    // Until the end, whatever way the run ends, rewritten texels go back.
+    auto restore = [&](const auto *ids) {
+        rewrite->restore([&](int32_t x, int32_t y, const Color &) {
+            return hasSlot(ids[size_t(y) * size_t(w) + size_t(x)]);
+        });
+    };
+    struct Undo {
+        std::function<void()> undo;
+        ~Undo() {
+            if (undo) undo();
+        }
+    } undo;
+    if (inPlace)
+        undo.undo = [&] {
+            if (compact)
+                restore(static_cast<const uint16_t *>(idTable));
+            else
+                restore(static_cast<const int32_t *>(idTable));
+        };
+
+    std::optional<TexelRuns> remapRuns;
+    if (!inPlace) remapRuns.emplace(*in, out, nullptr);
     RowBands remap(h, bandRows, threads, io);
     auto remapBand = [&](const auto *ids, int32_t y0, int32_t y1, int thread) {
-        using Id = std::remove_const_t<std::remove_pointer_t<decltype(ids)>>;
-        return remapRuns.run(
+        if (inPlace) {
+            rewrite->run(
+                y0, y1, scratch[size_t(thread)],
+                [&](int32_t x, int32_t y, const Color &) {
+                    return hasSlot(ids[size_t(y) * size_t(w) + size_t(x)]);
+                },
+                [&](int32_t x, int32_t y, Color &c) {
+                    c = remaps[size_t(ids[size_t(y) * size_t(w) + size_t(x)])].apply(c);
+                });
+            return true;
+        }
+        return remapRuns->run(
             y0, y1, scratch[size_t(thread)],
             [&](int32_t x0, int32_t y, int32_t n, const Color *src, Color *dst, const float *) {
-                const Id *id = ids + size_t(y) * size_t(w) + size_t(x0);
-                for (int32_t i = 0; i < n; ++i) {
-                    // Background Id(-1) and no instance Id(-2) are the two largest codes of
-                    // the unsigned table, the two negative ones of the signed one.
-                    bool slot;
-                    if constexpr (std::is_signed_v<Id>)
-                        slot = id[i] >= 0;
-                    else
-                        slot = id[i] < Id(-2);
-                    dst[i] = slot ? remaps[size_t(id[i])].apply(src[i]) : src[i];
-                }
+                const auto *id = ids + size_t(y) * size_t(w) + size_t(x0);
+                for (int32_t i = 0; i < n; ++i)
+                    dst[i] = hasSlot(id[i]) ? remaps[size_t(id[i])].apply(src[i]) : src[i];
             });
     };
     const bool ok = remap.run([&](int32_t y0, int32_t y1, int thread) {
@@ -344,6 +389,10 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         return false;
     }
     if (!recordFile_.empty() && !writeMinMaxData(recordFile_, record_)) return false;
+    if (inPlace) {
+        undo.undo = nullptr;  // the rewritten source is the result
+        return true;
+    }
     return results.place({source_});
 }
 

@@ -23,6 +23,9 @@ Region rowsOf(int32_t width, int32_t y0, int32_t y1) { return Region(0, y0, widt
 bool PremultiplyFilter::init(Frame &frame, RenderContext &) {
     in_.clear();
     out_.clear();
+    runs_.clear();
+    inPlace_.clear();
+    pixelUndo_.clear();
     for (const std::string &name : sources_) {
         LayerT<Color> *layer = frame.getColorLayer(name);
         if (!layer) {
@@ -32,12 +35,30 @@ bool PremultiplyFilter::init(Frame &frame, RenderContext &) {
         in_.push_back(layer);
     }
     results_ = std::make_unique<FilterResults>(frame);
+    // Distinct sources that allow it are rewritten in place: only their semi-transparent
+    // texels are touched. The result names must be free all the same.
+    bool inPlace = true;
+    for (size_t i = 0; i < in_.size(); ++i)
+        inPlace = inPlace && InPlaceTexels::possible(*in_[i]) &&
+                  std::find(in_.begin(), in_.begin() + ptrdiff_t(i), in_[i]) ==
+                      in_.begin() + ptrdiff_t(i);
+    if (inPlace) {
+        for (size_t i = 0; i < sources_.size(); ++i) {
+            if (!results_->nameFree(tempName(i), "premultiply filter")) return false;
+            inPlace_.push_back(std::make_unique<InPlaceTexels>(*in_[i], frame.scratch()));
+            if (!inPlace_.back()->ok()) {
+                message(kMsgError, 6, "Premultiply filter of %s is out of memory",
+                        sources_[i].c_str());
+                return false;
+            }
+        }
+        return true;
+    }
     for (size_t i = 0; i < sources_.size(); ++i) {
         LayerT<Color> *out = results_->addColor(tempName(i), sources_[i], "premultiply filter");
         if (!out) return false;
         out_.push_back(out);
     }
-    runs_.clear();
     for (size_t i = 0; i < sources_.size(); ++i)
         runs_.push_back(std::make_unique<TexelRuns>(*in_[i], out_[i], nullptr));
     return true;
@@ -47,6 +68,10 @@ bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch,
                                    int32_t &failedY) {
     const float t = threshold_;
     const Color bg = background_;
+    for (const auto &texels : inPlace_)
+        texels->run(
+            y0, y1, scratch, [&](int32_t, int32_t, const Color &c) { return chosen(c); },
+            [&](int32_t, int32_t, Color &c) { c = premultiply(c, t, bg); });
     for (const auto &runs : runs_) {
         const bool ok = runs->run(
             y0, y1, scratch,
@@ -62,6 +87,15 @@ bool PremultiplyFilter::filterRows(int32_t y0, int32_t y1, BandScratch &scratch,
 }
 
 bool PremultiplyFilter::filterPixel(int32_t x, int32_t y) {
+    if (!inPlace_.empty()) {
+        for (size_t l = 0; l < inPlace_.size(); ++l) {
+            Color &c = inPlace_[l]->at(x, y);
+            if (!chosen(c)) continue;
+            pixelUndo_.push_back({l, x, y, c});
+            c = premultiply(c, threshold_, background_);
+        }
+        return true;
+    }
     runs_.clear();  // the layers are then used through reads and pastes
     const Region r(x, y, x + 1, y + 1);
     for (size_t l = 0; l < in_.size(); ++l) {
@@ -75,13 +109,22 @@ bool PremultiplyFilter::filterPixel(int32_t x, int32_t y) {
 
 bool PremultiplyFilter::finish(Frame &) {
     runs_.clear();
-    const bool ok = results_ && results_->place(sources_);
+    // Sources rewritten in place are the results already.
+    const bool ok = !inPlace_.empty() || (results_ && results_->place(sources_));
+    inPlace_.clear();
+    pixelUndo_.clear();
     results_.reset();
     return ok;
 }
 
 void PremultiplyFilter::discard(Frame &) {
     runs_.clear();
+    for (auto it = pixelUndo_.rbegin(); it != pixelUndo_.rend(); ++it)
+        inPlace_[it->layer]->at(it->x, it->y) = it->original;
+    pixelUndo_.clear();
+    for (const auto &texels : inPlace_)
+        texels->restore([&](int32_t, int32_t, const Color &c) { return chosen(c); });
+    inPlace_.clear();
     results_.reset();  // removes what was not placed
 }
 

@@ -295,6 +295,27 @@ TEST(PremultiplyTest, RemovesTheBackgroundAboveTheThresholdOnly) {
     }
 }
 
+TEST(PremultiplyTest, SingleTexelsInPlaceGoBackOnDiscard) {
+    const Color bg(0.1f, 0.2f, 0.3f, 1);
+    const std::vector<Color> c = {Color(1, 1, 1, 0.5f), Color(1, 1, 1, 0), Color(2, 2, 2, 0.25f)};
+    for (bool keep : {false, true}) {
+        auto f = makeFrame(3, 1, {1, 1, 1}, {{"beauty", c}});
+        ox::PremultiplyFilter filter({"beauty"}, 0.0f, bg);
+        ASSERT_TRUE(filter.init(*f, noContext()));
+        for (int x = 0; x < 3; ++x) ASSERT_TRUE(filter.filterPixel(x, 0));
+        if (keep) {
+            ASSERT_TRUE(filter.finish(*f));
+            const std::vector<Color> out = readColors(*f, "beauty");
+            for (int x = 0; x < 3; ++x)
+                EXPECT_EQ(out[size_t(x)], ox::PremultiplyFilter::premultiply(c[size_t(x)], 0, bg));
+        } else {
+            filter.discard(*f);
+            EXPECT_EQ(readColors(*f, "beauty"), c);
+        }
+        EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
+    }
+}
+
 TEST(PostFilterCommandTest, FailuresAndAbortLeaveTheSourcesAndNoResult) {
     const std::vector<Color> c(16, Color(0.5f, 0.5f, 0.5f, 0.5f));
     struct Case {
@@ -755,6 +776,92 @@ TEST_F(ShapeNormalizationTest, ChainGivesTheSameBytesWhateverTilesAndThreads) {
                 EXPECT_TRUE(sameBits(out, first)) << "tile " << tile << " threads " << threads;
             }
         }
+}
+
+TEST_F(ShapeNormalizationTest, RewritesInPlaceOrThroughResultsAndAbortsPutEverythingBack) {
+    // Premultiply and normalization rewrite the texels they change in the source's tiles,
+    // unless an observer watches the source: both ways give the same bytes. An abort after the
+    // first bands (on one and on two threads) leaves the source exactly as it was.
+    struct Quiet final : ox::LayerObserver {
+        std::string observedLayer() const override { return "beauty"; }
+        void notify(const Region &, const Color *, int64_t, const std::string &) override {}
+    };
+    const int w = 70, h = 300;  // several bands of rows, partial tiles at the right
+    std::mt19937 rng(5);
+    std::uniform_real_distribution<float> u(0.0f, 1.0f);
+    std::vector<float> z(size_t(w * h));
+    std::vector<Color> c(size_t(w * h));
+    for (size_t i = 0; i < z.size(); ++i) {
+        z[i] = u(rng) < 0.4f ? 1.0f : kBg;
+        // Alpha 0, 1, negative, NaN or in between: only some texels change.
+        const float pick = u(rng);
+        const float a = pick < 0.2f    ? 0.0f
+                        : pick < 0.3f  ? 1.0f
+                        : pick < 0.35f ? -0.5f
+                        : pick < 0.4f  ? std::numeric_limits<float>::quiet_NaN()
+                                       : u(rng);
+        c[i] = Color(u(rng) * 4, u(rng), u(rng) * 2, a);
+    }
+    FakeInstances instances(30, {{3, 250}});
+    const ox::NormalizeOptions options{ox::NormalizeRange::MinMax, ox::NormalizeOutput::PerChannel,
+                                       ox::NormalizeComponent::Shape, false};
+    auto premultiply = [&](int threads) {
+        return ox::PostFilterCommand(
+            std::make_unique<ox::PremultiplyFilter>(std::vector<std::string>{"beauty"}, 0.25f,
+                                                    Color(0.1f, 0.2f, 0.3f, 1)),
+            threads);
+    };
+    std::vector<Color> want[2];
+    for (bool observed : {false, true}) {
+        auto f = makeFrame(w, h, z, {{"beauty", c}});
+        Quiet quiet;
+        if (observed) {
+            ASSERT_TRUE(f->registerObserver("beauty", &quiet));
+        }
+        oxtest::FakeIO io;
+        ASSERT_TRUE(premultiply(2).execute(*f, noContext(), io));
+        if (observed) {
+            EXPECT_TRUE(sameBits(readColors(*f, "beauty"), want[0]));
+            // The placed result is a new layer: it is watched again.
+            ASSERT_TRUE(f->registerObserver("beauty", &quiet));
+        } else {
+            want[0] = readColors(*f, "beauty");
+        }
+        ox::ShapeNormalizationFilter normalization("beauty", options, &instances);
+        normalization.setThreadCount(2);
+        ASSERT_TRUE(normalization.run(*f, &io));
+        if (!observed) {
+            for (size_t i = 0; i < c.size(); ++i)
+                ASSERT_TRUE(
+                    std::memcmp(&want[0][i], &c[i], sizeof(Color)) == 0 ||
+                    (c[i].a > 0.25f && want[0][i] == ox::PremultiplyFilter::premultiply(
+                                                         c[i], 0.25f, Color(0.1f, 0.2f, 0.3f, 1))))
+                    << i;
+            want[1] = readColors(*f, "beauty");
+            continue;
+        }
+        EXPECT_TRUE(sameBits(readColors(*f, "beauty"), want[1]));
+        EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
+    }
+
+    for (int threads : {1, 2}) {
+        auto f = makeFrame(w, h, z, {{"beauty", c}});
+        oxtest::FakeIO io;
+        io.abortAfter = 2;  // the start, then the first tenth
+        const std::string log = oxtest::captureOutput(
+            [&] { EXPECT_FALSE(premultiply(threads).execute(*f, noContext(), io)); });
+        EXPECT_TRUE(has(log, "Post filtering aborted")) << log;
+        EXPECT_TRUE(sameBits(readColors(*f, "beauty"), c)) << threads;
+
+        ox::ShapeNormalizationFilter normalization("beauty", options, &instances);
+        normalization.setThreadCount(threads);
+        oxtest::FakeIO later;
+        later.abortAfter = 1;
+        EXPECT_TRUE(has(oxtest::captureOutput([&] { EXPECT_FALSE(normalization.run(*f, &later)); }),
+                        "Shape normalization aborted"));
+        EXPECT_TRUE(sameBits(readColors(*f, "beauty"), c)) << threads;
+        EXPECT_EQ(f->layerNames(), (std::vector<std::string>{"Z", "beauty"}));
+    }
 }
 
 // ---------------------------------------------------------------------------------------------
