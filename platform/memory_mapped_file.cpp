@@ -7,7 +7,10 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <iterator>
+#include <mutex>
 #include <string>
+#include <vector>
 
 #include "core/message.h"
 
@@ -23,9 +26,49 @@ std::string tempDirectory() {
 
 }  // namespace
 
-void *allocateHugeBlock(uint64_t bytes) {
+namespace {
+
+/// Huge blocks given back and kept for the next request of their size (a new frame's layers
+/// and tables then reuse the pages of the last one instead of faulting in and zero-filling
+/// fresh ones), up to kKeptHugeBytes in all, the oldest going first. They are marked as
+/// lazily freeable: under memory pressure the kernel takes their pages back (a reuse then
+/// faults in zero pages like a fresh block).
+struct HugeBlockCache {
+    std::mutex mutex;
+    struct Kept {
+        void *data;
+        uint64_t size;
+    };
+    std::vector<Kept> kept;  // oldest first
+    uint64_t total = 0;
+};
+
+HugeBlockCache &hugeBlockCache() {
+    static HugeBlockCache *cache = new HugeBlockCache;  // never destroyed: used up to the exit
+    return *cache;
+}
+
+uint64_t hugeRounded(uint64_t bytes) { return (bytes + kHugePage - 1) & ~(kHugePage - 1); }
+
+}  // namespace
+
+void *allocateHugeBlock(uint64_t bytes, bool zeroed) {
     if (bytes == 0 || bytes > SIZE_MAX - 2 * kHugePage) return nullptr;
-    const uint64_t size = (bytes + kHugePage - 1) & ~(kHugePage - 1);
+    const uint64_t size = hugeRounded(bytes);
+    {
+        HugeBlockCache &cache = hugeBlockCache();
+        std::unique_lock<std::mutex> lock(cache.mutex);
+        // The newest first: its pages are the likeliest to be still there.
+        for (auto it = cache.kept.rbegin(); it != cache.kept.rend(); ++it) {
+            if (it->size != size) continue;
+            void *p = it->data;
+            cache.total -= size;
+            cache.kept.erase(std::next(it).base());
+            lock.unlock();
+            if (zeroed) std::memset(p, 0, size_t(bytes));
+            return p;
+        }
+    }
     const size_t span = size_t(size + kHugePage);
     void *p = mmap(nullptr, span, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
     if (p == MAP_FAILED) return nullptr;
@@ -40,7 +83,34 @@ void *allocateHugeBlock(uint64_t bytes) {
 }
 
 void releaseHugeBlock(void *block, uint64_t bytes) {
-    if (block) munmap(block, size_t((bytes + kHugePage - 1) & ~(kHugePage - 1)));
+    if (!block) return;
+    const uint64_t size = hugeRounded(bytes);
+    if (size > kKeptHugeBytes) {
+        munmap(block, size_t(size));
+        return;
+    }
+#ifdef MADV_FREE
+    madvise(block, size_t(size), MADV_FREE);
+#endif
+    std::vector<HugeBlockCache::Kept> drop;
+    {
+        HugeBlockCache &cache = hugeBlockCache();
+        std::lock_guard<std::mutex> lock(cache.mutex);
+        cache.kept.push_back({block, size});
+        cache.total += size;
+        while (cache.total > kKeptHugeBytes) {
+            drop.push_back(cache.kept.front());
+            cache.total -= cache.kept.front().size;
+            cache.kept.erase(cache.kept.begin());
+        }
+    }
+    for (const auto &k : drop) munmap(k.data, size_t(k.size));
+}
+
+uint64_t keptHugeBytes() {
+    HugeBlockCache &cache = hugeBlockCache();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    return cache.total;
 }
 
 MemoryMappedFile::MemoryMappedFile(uint64_t size, uint64_t memoryLimit) : size_(size) {

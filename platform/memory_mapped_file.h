@@ -12,13 +12,21 @@ namespace ox {
 /// The huge page size that allocateHugeBlock aligns and rounds to (2 MiB).
 constexpr uint64_t kHugePage = uint64_t(2) << 20;
 
-/// Zero-filled memory of at least `bytes` bytes in an anonymous mapping of its own, aligned to
-/// kHugePage and offered to the kernel as huge pages: a large block then faults in and
-/// zero-fills in 2 MiB steps instead of 4 KiB ones, and walks over it miss the TLB far less.
-/// Null when it cannot be had. Give it back with releaseHugeBlock and the same size.
-void *allocateHugeBlock(uint64_t bytes);
-/// Unmaps a block from allocateHugeBlock (null is ignored).
+/// Memory of at least `bytes` bytes in an anonymous mapping of its own, aligned to kHugePage
+/// and offered to the kernel as huge pages: a large block then faults in and zero-fills in
+/// 2 MiB steps instead of 4 KiB ones, and walks over it miss the TLB far less. A block given
+/// back before is reused when one of the same rounded size is kept (see releaseHugeBlock).
+/// Zero-filled when `zeroed`, else of undefined contents. Null when it cannot be had. Give it
+/// back with releaseHugeBlock and the same size.
+void *allocateHugeBlock(uint64_t bytes, bool zeroed = true);
+/// Gives back a block from allocateHugeBlock (null is ignored). It is kept for reuse while
+/// the blocks kept stay within kKeptHugeBytes (the oldest are unmapped first), its pages left
+/// for the kernel to take back under memory pressure.
 void releaseHugeBlock(void *block, uint64_t bytes);
+/// The most bytes of given-back huge blocks kept for reuse (1 GiB).
+constexpr uint64_t kKeptHugeBytes = uint64_t(1) << 30;
+/// The bytes of given-back huge blocks kept now.
+uint64_t keptHugeBytes();
 
 class MemoryMappedFile {
 public:

@@ -18,7 +18,7 @@ constexpr std::align_val_t kScratchAlign{64};
 /// Blocks from a huge page on live on huge pages (a fresh table of a large frame then faults
 /// in 2 MiB at a time); smaller ones come from the heap.
 void *newBlock(size_t bytes) {
-    if (bytes >= kHugePage) return allocateHugeBlock(bytes);
+    if (bytes >= kHugePage) return allocateHugeBlock(bytes, false);
     return ::operator new(bytes, kScratchAlign, std::nothrow);
 }
 

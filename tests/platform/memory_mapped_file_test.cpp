@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <optional>
 #include <string>
@@ -79,6 +80,30 @@ TEST_F(MemoryMappedFileTest, LargeMemoryBlockOfOddSizeIsZeroedAndWritableToTheLa
         ASSERT_TRUE(block.read((size / 16) * 8, &back, 8));
         EXPECT_EQ(back, pattern(size / 16));
     }
+}
+
+TEST(HugeBlockTest, GivenBackBlocksServeTheNextRequestOfTheirSizeZeroed) {
+    const uint64_t size = (3ull << 20) + 5;  // four huge pages
+    auto *a = static_cast<unsigned char *>(ox::allocateHugeBlock(size));
+    ASSERT_NE(a, nullptr);
+    EXPECT_EQ(reinterpret_cast<uintptr_t>(a) % ox::kHugePage, 0u);
+    std::memset(a, 0xC3, size);
+    const uint64_t before = ox::keptHugeBytes();
+    ox::releaseHugeBlock(a, size);
+    EXPECT_EQ(ox::keptHugeBytes(), before + (4ull << 20));
+    // The same rounded size takes the kept block back, zero-filled again.
+    auto *b = static_cast<unsigned char *>(ox::allocateHugeBlock((4ull << 20) - 1));
+    EXPECT_EQ(b, a);
+    EXPECT_EQ(ox::keptHugeBytes(), before);
+    EXPECT_TRUE(std::all_of(b, b + (4ull << 20) - 1, [](unsigned char v) { return v == 0; }));
+    ox::releaseHugeBlock(b, (4ull << 20) - 1);
+    // Blocks beyond what may be kept go at once.
+    void *big = ox::allocateHugeBlock(ox::kKeptHugeBytes + 1, false);
+    ASSERT_NE(big, nullptr);
+    const uint64_t kept = ox::keptHugeBytes();
+    ox::releaseHugeBlock(big, ox::kKeptHugeBytes + 1);
+    EXPECT_EQ(ox::keptHugeBytes(), kept);
+    ox::releaseHugeBlock(nullptr, 0);
 }
 
 TEST_F(MemoryMappedFileTest, SpillBlockOf300MiBRoundTripsAndLeavesNoFile) {
