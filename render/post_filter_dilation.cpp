@@ -333,6 +333,69 @@ inline bool brightestOnInnerRing(const float *lum, int64_t c, int64_t w, int32_t
     return true;
 }
 
+#ifdef __SSE2__
+/// brightestOnInnerRing for the four texels from window index c on, which share the ring
+/// radius R and whose rings lie inside the image: the four rings are scanned side by side, one
+/// vector lane each, with the same comparisons in the same order. found[j] is false when no
+/// candidate of texel j beats the starting luminance.
+template <int R>
+inline void brightestOnInnerRing4(const float *lum, int64_t c, int64_t w, int32_t dx[4],
+                                  int32_t dy[4], bool found[4]) {
+    struct Side {
+        __m128 best = _mm_set1_ps(-3.4028235e38f);
+        __m128i k = _mm_set1_epi32(-1);
+        void visit(const float *at, int32_t ordinal) {
+            const __m128 v = _mm_loadu_ps(at);
+            const __m128i better = _mm_castps_si128(_mm_cmpgt_ps(v, best));
+            best = _mm_max_ps(v, best);  // no NaN: equal values keep the same value
+            k = _mm_or_si128(_mm_and_si128(better, _mm_set1_epi32(ordinal)),
+                             _mm_andnot_si128(better, k));
+        }
+    } left, right, top, bottom;
+    for (int i = 0; i <= 2 * R; ++i) {
+        left.visit(lum + c + (i - R) * w - R, i);
+        right.visit(lum + c + (i - R) * w + R, i);
+    }
+    for (int i = 0; i <= 2 * R - 2; ++i) {
+        top.visit(lum + c + R * w + i - R + 1, i);
+        bottom.visit(lum + c - R * w + i - R + 1, i);
+    }
+    // The sides in ring order, a later one winning only when brighter.
+    __m128 best = left.best;
+    __m128i k = left.k, side = _mm_setzero_si128();
+    auto take = [&](const Side &o, int32_t which) {
+        const __m128i better = _mm_castps_si128(_mm_cmpgt_ps(o.best, best));
+        best = _mm_max_ps(o.best, best);
+        k = _mm_or_si128(_mm_and_si128(better, o.k), _mm_andnot_si128(better, k));
+        side = _mm_or_si128(_mm_and_si128(better, _mm_set1_epi32(which)),
+                            _mm_andnot_si128(better, side));
+    };
+    take(right, 1);
+    take(top, 2);
+    take(bottom, 3);
+    alignas(16) int32_t ks[4], sides[4];
+    _mm_store_si128(reinterpret_cast<__m128i *>(ks), k);
+    _mm_store_si128(reinterpret_cast<__m128i *>(sides), side);
+    for (int j = 0; j < 4; ++j) {
+        found[j] = ks[j] >= 0;
+        switch (sides[j]) {
+            case 0:
+                dx[j] = -R, dy[j] = ks[j] - R;
+                break;
+            case 1:
+                dx[j] = R, dy[j] = ks[j] - R;
+                break;
+            case 2:
+                dx[j] = ks[j] - R + 1, dy[j] = R;
+                break;
+            default:
+                dx[j] = ks[j] - R + 1, dy[j] = -R;
+                break;
+        }
+    }
+}
+#endif
+
 /// Rings up to this size are scanned texel by texel; larger ones use RunPeaks.
 constexpr int32_t kDirectScanMax = 6;
 static_assert(kDirectScanMax == 6, "brightestOnInnerRing is dispatched for radii 1 to 6");
@@ -616,6 +679,40 @@ bool EdgeDilationFilter::run(Frame &frame, RenderIOInterface *io) {
                             win = brightestOnRingFast(s.runs, lum, rowBase, w, h, x, y, r);
                         } else if (x >= r && x + r < w && y >= r && y + r < h) {
                             const int64_t c = int64_t(y - rowBase) * w + x;
+#ifdef __SSE2__
+                            // Four neighbours on rings of the same radius (common along the
+                            // edges of islands) are searched together.
+                            if (i + 4 <= len && x + 3 + r < w && d[x + 1] == r && d[x + 2] == r &&
+                                d[x + 3] == r) {
+                                int32_t dx4[4], dy4[4];
+                                bool found4[4];
+                                switch (r) {
+                                    case 1:
+                                        brightestOnInnerRing4<1>(lum, c, w, dx4, dy4, found4);
+                                        break;
+                                    case 2:
+                                        brightestOnInnerRing4<2>(lum, c, w, dx4, dy4, found4);
+                                        break;
+                                    case 3:
+                                        brightestOnInnerRing4<3>(lum, c, w, dx4, dy4, found4);
+                                        break;
+                                    case 4:
+                                        brightestOnInnerRing4<4>(lum, c, w, dx4, dy4, found4);
+                                        break;
+                                    case 5:
+                                        brightestOnInnerRing4<5>(lum, c, w, dx4, dy4, found4);
+                                        break;
+                                    default:
+                                        brightestOnInnerRing4<6>(lum, c, w, dx4, dy4, found4);
+                                        break;
+                                }
+                                for (int j = 0; j < 4; ++j)
+                                    to[i + j] = found4[j] ? src.at(x + j + dx4[j], y + dy4[j])
+                                                          : background_;
+                                i += 3;
+                                continue;
+                            }
+#endif
                             int32_t dx = 0, dy = 0;
                             bool found = false;
                             switch (r) {
