@@ -55,6 +55,7 @@ uint64_t hugeRounded(uint64_t bytes) { return (bytes + kHugePage - 1) & ~(kHugeP
 void *allocateHugeBlock(uint64_t bytes, bool zeroed) {
     if (bytes == 0 || bytes > SIZE_MAX - 2 * kHugePage) return nullptr;
     const uint64_t size = hugeRounded(bytes);
+    std::vector<HugeBlockCache::Kept> drop;
     {
         HugeBlockCache &cache = hugeBlockCache();
         std::unique_lock<std::mutex> lock(cache.mutex);
@@ -68,7 +69,17 @@ void *allocateHugeBlock(uint64_t bytes, bool zeroed) {
             if (zeroed) std::memset(p, 0, size_t(bytes));
             return p;
         }
+        // A new block: as much kept memory goes, the oldest first, so that keeping blocks
+        // never makes the process larger than it would be without.
+        uint64_t freed = 0;
+        while (freed < size && !cache.kept.empty()) {
+            drop.push_back(cache.kept.front());
+            freed += cache.kept.front().size;
+            cache.total -= cache.kept.front().size;
+            cache.kept.erase(cache.kept.begin());
+        }
     }
+    for (const auto &k : drop) munmap(k.data, size_t(k.size));
     const size_t span = size_t(size + kHugePage);
     void *p = mmap(nullptr, span, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
     if (p == MAP_FAILED) return nullptr;

@@ -15,7 +15,8 @@ constexpr uint64_t kHugePage = uint64_t(2) << 20;
 /// Memory of at least `bytes` bytes in an anonymous mapping of its own, aligned to kHugePage
 /// and offered to the kernel as huge pages: a large block then faults in and zero-fills in
 /// 2 MiB steps instead of 4 KiB ones, and walks over it miss the TLB far less. A block given
-/// back before is reused when one of the same rounded size is kept (see releaseHugeBlock).
+/// back before is reused when one of the same rounded size is kept (see releaseHugeBlock);
+/// otherwise kept blocks at least as large as the new one are unmapped first.
 /// Zero-filled when `zeroed`, else of undefined contents. Null when it cannot be had. Give it
 /// back with releaseHugeBlock and the same size.
 void *allocateHugeBlock(uint64_t bytes, bool zeroed = true);

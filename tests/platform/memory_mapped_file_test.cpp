@@ -97,6 +97,13 @@ TEST(HugeBlockTest, GivenBackBlocksServeTheNextRequestOfTheirSizeZeroed) {
     EXPECT_EQ(ox::keptHugeBytes(), before);
     EXPECT_TRUE(std::all_of(b, b + (4ull << 20) - 1, [](unsigned char v) { return v == 0; }));
     ox::releaseHugeBlock(b, (4ull << 20) - 1);
+    // A size not kept makes room first: kept blocks as large as it go, the oldest first.
+    const uint64_t keptBefore = ox::keptHugeBytes();
+    void *odd = ox::allocateHugeBlock(14ull << 20);
+    ASSERT_NE(odd, nullptr);
+    EXPECT_LE(ox::keptHugeBytes(),
+              keptBefore > (14ull << 20) ? keptBefore - (14ull << 20) : uint64_t(0));
+    ox::releaseHugeBlock(odd, 14ull << 20);
     // Blocks beyond what may be kept go at once.
     void *big = ox::allocateHugeBlock(ox::kKeptHugeBytes + 1, false);
     ASSERT_NE(big, nullptr);
