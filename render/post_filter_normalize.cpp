@@ -155,7 +155,13 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
     // The remapped texels are rewritten in the source's tiles when it allows (their originals
     // kept until the end), else the result goes to "temp" and replaces the source.
     const int32_t bandRows = kFilterBandRows;
-    const bool inPlace = InPlaceTexels::possible(*in);
+    std::optional<InPlaceTexels> rewrite;
+    if (InPlaceTexels::possible(*in)) {
+        rewrite.emplace(*in, frame.scratch());
+        // Without room for the originals the result goes to "temp" after all.
+        if (!rewrite->ok()) rewrite.reset();
+    }
+    const bool inPlace = rewrite.has_value();
     FilterResults results(frame);
     LayerT<Color> *out = nullptr;
     if (inPlace ? !results.nameFree("temp", "shape normalization filter")
@@ -323,14 +329,6 @@ bool ShapeNormalizationFilter::run(Frame &frame, RenderIOInterface *io) {
         else
             return id < decltype(id)(-2);
     };
-    std::optional<InPlaceTexels> rewrite;
-    if (inPlace) {
-        rewrite.emplace(*in, frame.scratch());
-        if (!rewrite->ok()) {
-            message(kMsgError, 6, "Shape normalization of %s is out of memory", source_.c_str());
-            return false;
-        }
-    }
     // Until the end, whatever way the run ends, rewritten texels go back.
     auto restore = [&](const auto *ids) {
         rewrite->restore([&](int32_t x, int32_t y, const Color &) {

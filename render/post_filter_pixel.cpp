@@ -43,16 +43,15 @@ bool PremultiplyFilter::init(Frame &frame, RenderContext &) {
                   std::find(in_.begin(), in_.begin() + ptrdiff_t(i), in_[i]) ==
                       in_.begin() + ptrdiff_t(i);
     if (inPlace) {
-        for (size_t i = 0; i < sources_.size(); ++i) {
+        for (size_t i = 0; i < sources_.size(); ++i)
             if (!results_->nameFree(tempName(i), "premultiply filter")) return false;
+        for (size_t i = 0; i < sources_.size() && inPlace; ++i) {
             inPlace_.push_back(std::make_unique<InPlaceTexels>(*in_[i], frame.scratch()));
-            if (!inPlace_.back()->ok()) {
-                message(kMsgError, 6, "Premultiply filter of %s is out of memory",
-                        sources_[i].c_str());
-                return false;
-            }
+            inPlace = inPlace_.back()->ok();
         }
-        return true;
+        if (inPlace) return true;
+        // Without room for the originals the results go to new layers after all.
+        inPlace_.clear();
     }
     for (size_t i = 0; i < sources_.size(); ++i) {
         LayerT<Color> *out = results_->addColor(tempName(i), sources_[i], "premultiply filter");
