@@ -248,6 +248,29 @@ TEST(CompleteGridTest, MatchesBruteForceOverLargeEmptySpacesWithDefaultSettings)
     checkAgainstBruteForce(ins, p, 3000, 77, 100);
 }
 
+TEST(CompleteGridTest, MatchesBruteForceInCoarseCellsOfManyPacketGroups) {
+    // A few cells hold thousands of triangles each, with long ones that cross them all: a cell's
+    // packets lie far apart in the store and fill many groups, and rays pass through cells
+    // whose groups are too many to be collected before testing.
+    Mesh blob = testmesh::blob(60, 64);
+    for (uint32_t k = 0; k < 24; ++k) {
+        uint32_t base = uint32_t(blob.positions.size());
+        float a = 0.26f * float(k);
+        blob.positions.insert(blob.positions.end(),
+                              {{-1.5f * std::cos(a), -1.5f * std::sin(a), -0.9f},
+                               {1.5f * std::cos(a), 1.5f * std::sin(a), 0.9f},
+                               {1.5f * std::cos(a), 1.5f * std::sin(a) + 0.05f, 0.95f}});
+        blob.indices.insert(blob.indices.end(), {base, base + 1, base + 2});
+    }
+    for (float density : {0.001f, 0.01f}) {
+        SCOPED_TRACE(::testing::Message() << "density " << density);
+        ADSParameters p;
+        p.gridMaxDepth = 0;
+        p.gridDensity = density;
+        checkAgainstBruteForce({instanceOf(blob, 0, Mtx4(), kAllFlags, 0)}, p, 400, 5);
+    }
+}
+
 TEST(CompleteGridTest, MatchesBruteForceOnPlatesAlongCellPlanesAndPartialPackets) {
     // Square plates in the planes z = k / 4 and x = k / 4 (on cell planes of the grid and of its
     // nested grids, where the packed boxes are clipped and stored in steps of the cell), rays
