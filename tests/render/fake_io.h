@@ -9,10 +9,14 @@
 
 namespace oxtest {
 
-/// Records what a run reports; can abort itself after a number of progress reports.
+/// Records what a run reports; can abort itself after a number of progress reports or, whatever
+/// the threads' timing, at a given abort check.
 class FakeIO : public ox::RenderIOInterface {
 public:
-    bool isAborted() const override { return aborted.load(); }
+    bool isAborted() const override {
+        if (abortAtCheck > 0 && checks.fetch_add(1) + 1 >= abortAtCheck) aborted = true;
+        return aborted.load();
+    }
     bool isReleased() override { return false; }
     void setProgressTitle(const std::string &title) override { record("title " + title); }
     void beginCommand() override { record("begin"); }
@@ -36,8 +40,10 @@ public:
     std::mutex mutex;
     std::vector<std::string> events;
     std::vector<float> progress;
-    std::atomic<bool> aborted{false};
+    mutable std::atomic<bool> aborted{false};
+    mutable std::atomic<int> checks{0};
     int abortAfter = 0;
+    int abortAtCheck = 0;
 };
 
 }  // namespace oxtest

@@ -847,7 +847,8 @@ TEST_F(ShapeNormalizationTest, RewritesInPlaceOrThroughResultsAndAbortsPutEveryt
     for (int threads : {1, 2}) {
         auto f = makeFrame(w, h, z, {{"beauty", c}});
         oxtest::FakeIO io;
-        io.abortAfter = 2;  // the start, then the first tenth
+        // Aborted at the third check: after two bands, however the threads are scheduled.
+        io.abortAtCheck = 3;
         const std::string log = oxtest::captureOutput(
             [&] { EXPECT_FALSE(premultiply(threads).execute(*f, noContext(), io)); });
         EXPECT_TRUE(has(log, "Post filtering aborted")) << log;
@@ -856,7 +857,7 @@ TEST_F(ShapeNormalizationTest, RewritesInPlaceOrThroughResultsAndAbortsPutEveryt
         ox::ShapeNormalizationFilter normalization("beauty", options, &instances);
         normalization.setThreadCount(threads);
         oxtest::FakeIO later;
-        later.abortAfter = 1;
+        later.abortAtCheck = 3;
         EXPECT_TRUE(has(oxtest::captureOutput([&] { EXPECT_FALSE(normalization.run(*f, &later)); }),
                         "Shape normalization aborted"));
         EXPECT_TRUE(sameBits(readColors(*f, "beauty"), c)) << threads;
