@@ -820,6 +820,27 @@ struct WideFrame {
     __m256 ax, ay, az, bx, by, bz;
 };
 
+// Fetches the run of groups starting at g (the first three lines before its length is read
+// from the first), sets n to its length and maps the ray into the cell frame: t = byte * a + b
+// per axis.
+OX_WIDE_INLINE WideFrame openGroupRun(const PacketGroup *g, uint32_t &n, const Vec3 &step,
+                                      const Vec3 &frame, const TraceRay &r) {
+    const char *bytes = reinterpret_cast<const char *>(g);
+    __builtin_prefetch(bytes);
+    __builtin_prefetch(bytes + 64);
+    __builtin_prefetch(bytes + 128);
+    n = g->run;
+    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    WideFrame f;
+    f.ax = wide_ops::mul(_mm256_set1_ps(step.x), wide(r.ix));
+    f.ay = wide_ops::mul(_mm256_set1_ps(step.y), wide(r.iy));
+    f.az = wide_ops::mul(_mm256_set1_ps(step.z), wide(r.iz));
+    f.bx = wide_ops::mul(wide_ops::sub(_mm256_set1_ps(frame.x), wide(r.ox)), wide(r.ix));
+    f.by = wide_ops::mul(wide_ops::sub(_mm256_set1_ps(frame.y), wide(r.oy)), wide(r.iy));
+    f.bz = wide_ops::mul(wide_ops::sub(_mm256_set1_ps(frame.z), wide(r.oz)), wide(r.iz));
+    return f;
+}
+
 OX_WIDE_INLINE __m256 wideBytes(__m128i v, bool high) {
     return _mm256_cvtepi32_ps(_mm256_cvtepu8_epi32(high ? _mm_srli_si128(v, 8) : v));
 }
@@ -873,19 +894,8 @@ __attribute__((target("avx2"))) bool Grid::closestInGroupsWide(uint32_t index, c
                                                                const Vec3 &frame) const {
     using namespace wide_ops;
     const PacketGroup *g = groups_.data() + index;
-    const char *bytes = reinterpret_cast<const char *>(g);
-    __builtin_prefetch(bytes);
-    __builtin_prefetch(bytes + 64);
-    __builtin_prefetch(bytes + 128);
-    const uint32_t n = g->run;
-    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
-    WideFrame f;
-    f.ax = mul(_mm256_set1_ps(frameStep_.x), wide(r.ix));
-    f.ay = mul(_mm256_set1_ps(frameStep_.y), wide(r.iy));
-    f.az = mul(_mm256_set1_ps(frameStep_.z), wide(r.iz));
-    f.bx = mul(sub(_mm256_set1_ps(frame.x), wide(r.ox)), wide(r.ix));
-    f.by = mul(sub(_mm256_set1_ps(frame.y), wide(r.oy)), wide(r.iy));
-    f.bz = mul(sub(_mm256_set1_ps(frame.z), wide(r.oz)), wide(r.iz));
+    uint32_t n;
+    const WideFrame f = openGroupRun(g, n, frameStep_, frame, r);
     bool hit = false;
     constexpr uint32_t kMaxCandidates = 16;
     if (n * 4 <= kMaxCandidates) {
@@ -944,19 +954,8 @@ __attribute__((target("avx2"))) bool Grid::anyHitInGroupsWide(uint32_t index, co
                                                               const Vec3 &frame) const {
     using namespace wide_ops;
     const PacketGroup *g = groups_.data() + index;
-    const char *bytes = reinterpret_cast<const char *>(g);
-    __builtin_prefetch(bytes);
-    __builtin_prefetch(bytes + 64);
-    __builtin_prefetch(bytes + 128);
-    const uint32_t n = g->run;
-    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
-    WideFrame f;
-    f.ax = mul(_mm256_set1_ps(frameStep_.x), wide(r.ix));
-    f.ay = mul(_mm256_set1_ps(frameStep_.y), wide(r.iy));
-    f.az = mul(_mm256_set1_ps(frameStep_.z), wide(r.iz));
-    f.bx = mul(sub(_mm256_set1_ps(frame.x), wide(r.ox)), wide(r.ix));
-    f.by = mul(sub(_mm256_set1_ps(frame.y), wide(r.oy)), wide(r.iy));
-    f.bz = mul(sub(_mm256_set1_ps(frame.z), wide(r.oz)), wide(r.iz));
+    uint32_t n;
+    const WideFrame f = openGroupRun(g, n, frameStep_, frame, r);
     // Two groups at a time, the packets they let through two at a time.
     for (uint32_t i = 0; i < n; i += 2) {
         const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
