@@ -1158,16 +1158,23 @@ __attribute__((always_inline)) inline bool followAxis(WalkAxis &A, float o, floa
 
 }  // namespace
 
-template <bool kAny>
-bool Grid::traverse(const TraceRay &r, TraceState &s) const {
+bool Grid::enters(const TraceRay &r, float limit, float &t0, float &t1) const {
     if (cells_.empty()) return false;
     // Clip the ray against the box (slab test).
-    float t0 = 0.0f, t1 = s.limit;
-    if (!clipAxis(r.o.x, r.d.x, r.inv.x, box_.min.x, box_.max.x, t0, t1) ||
-        !clipAxis(r.o.y, r.d.y, r.inv.y, box_.min.y, box_.max.y, t0, t1) ||
-        !clipAxis(r.o.z, r.d.z, r.inv.z, box_.min.z, box_.max.z, t0, t1) || !(t0 <= t1))
-        return false;
+    t0 = 0.0f, t1 = limit;
+    return clipAxis(r.o.x, r.d.x, r.inv.x, box_.min.x, box_.max.x, t0, t1) &&
+           clipAxis(r.o.y, r.d.y, r.inv.y, box_.min.y, box_.max.y, t0, t1) &&
+           clipAxis(r.o.z, r.d.z, r.inv.z, box_.min.z, box_.max.z, t0, t1) && t0 <= t1;
+}
 
+template <bool kAny>
+bool Grid::traverse(const TraceRay &r, TraceState &s) const {
+    float t0, t1;
+    return enters(r, s.limit, t0, t1) && walk<kAny>(r, s, t0, t1);
+}
+
+template <bool kAny>
+bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
     WalkAxis X, Y, Z;
     const int64_t strideY = nx_, strideZ = nx_ * ny_;
     int64_t cell =
@@ -1318,5 +1325,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
 
 template bool Grid::traverse<false>(const TraceRay &, TraceState &) const;
 template bool Grid::traverse<true>(const TraceRay &, TraceState &) const;
+template bool Grid::walk<false>(const TraceRay &, TraceState &, float, float) const;
+template bool Grid::walk<true>(const TraceRay &, TraceState &, float, float) const;
 
 }  // namespace ox

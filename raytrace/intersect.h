@@ -53,6 +53,13 @@ struct TraceRay {
 
     /// Prepares the data; false when the ray can hit nothing (non-finite or zero direction).
     bool prepare(const Vec3 &origin, const Vec3 &direction, uint32_t requiredFlags, float t) {
+        if (!prepareRay(origin, direction, requiredFlags, t)) return false;
+        prepareLanes();
+        return true;
+    }
+    /// The first half of prepare: origin, direction, reciprocals, flags and time (all a box
+    /// test needs); false when the ray can hit nothing.
+    bool prepareRay(const Vec3 &origin, const Vec3 &direction, uint32_t requiredFlags, float t) {
         o = origin;
         d = direction;
         required = requiredFlags;
@@ -62,6 +69,10 @@ struct TraceRay {
         // never form 0 * inf; the grid walk tests zero components itself.
         auto recip = [](float x) { return x != 0.0f ? 1.0f / x : 1e30f; };
         inv = {recip(d.x), recip(d.y), recip(d.z)};
+        return true;
+    }
+    /// The second half of prepare: the four-wide copies the packed tests read.
+    void prepareLanes() {
         ix = float4(inv.x), iy = float4(inv.y), iz = float4(inv.z);
         ox = float4(o.x), oy = float4(o.y), oz = float4(o.z);
         dx = float4(d.x), dy = float4(d.y), dz = float4(d.z);
@@ -70,7 +81,6 @@ struct TraceRay {
         flagSet = int4(0);
         required4 = int4(int32_t(required));
         wide = wideTestsEnabled();
-        return true;
     }
 };
 
