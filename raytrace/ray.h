@@ -47,22 +47,25 @@ enum RenderStatsFlag : uint32_t {
     kFlagShadowBias = 0x80000,
 };
 
+/// Flag bits of which an object needs at least one to be seen, per ray type (in static storage,
+/// so that a query does not build the table on its stack).
+inline constexpr uint32_t kRayTypeRequiredFlags[kRayTypeCount] = {
+    kFlagPrimaryVisibility,        // primary
+    kFlagVisibleInReflections,     // reflection
+    kFlagVisibleInRefractions,     // refraction
+    kFlagCastShadows,              // shadow
+    kFlagCastGI | kFlagReceiveGI,  // photon
+    kFlagVisibleInFG,              // final gather
+    kFlagVisibleInReflections,     // glossy reflection
+    0u,                            // environment: sees nothing
+    kFlagCastOcclusion,            // occlusion
+    kFlagEnvelop,                  // envelope
+    kFlagIsImagePlane,             // image plane
+};
+
 /// Flag bits of which an object needs at least one to be seen by a ray type (0 = sees nothing).
 constexpr uint32_t rayTypeRequiredFlags(int type) {
-    constexpr uint32_t kTable[kRayTypeCount] = {
-        kFlagPrimaryVisibility,        // primary
-        kFlagVisibleInReflections,     // reflection
-        kFlagVisibleInRefractions,     // refraction
-        kFlagCastShadows,              // shadow
-        kFlagCastGI | kFlagReceiveGI,  // photon
-        kFlagVisibleInFG,              // final gather
-        kFlagVisibleInReflections,     // glossy reflection
-        0u,                            // environment: sees nothing
-        kFlagCastOcclusion,            // occlusion
-        kFlagEnvelop,                  // envelope
-        kFlagIsImagePlane,             // image plane
-    };
-    return type >= 0 && type < kRayTypeCount ? kTable[type] : 0u;
+    return type >= 0 && type < kRayTypeCount ? kRayTypeRequiredFlags[type] : 0u;
 }
 
 /// Statistics name of a ray type; "Unknown" for any other index.
