@@ -1074,9 +1074,17 @@ namespace {
 // beyond. An axis the ray does not move along has its next plane at infinity and never leaves.
 // The walk keeps three of these as named locals and reaches them only through the inlined
 // helpers below, never by a run-time index, so that they stay in registers.
+// What an axis reads of the grid and the ray (the grid's lower bound, cell size and its
+// reciprocal, the ray's reciprocal direction and the cell count) is not kept in it: the walk
+// passes it in from the grid and the ray at each use, so that setting up an axis copies nothing.
 struct WalkAxis {
-    int64_t next, ahead, step, beyond, cellStep, n;
-    float tNext, base, size, inv, delta, lo, invSize;
+    int64_t next, ahead, step, beyond, cellStep;
+    float tNext, base, delta;
+};
+
+struct AxisFixed {
+    float lo, size, invSize, inv;
+    int64_t n;
 };
 
 // Cell index of coordinate v along an axis. Clamps in floating point first: NaN and huge values
@@ -1102,58 +1110,59 @@ __attribute__((always_inline)) inline bool clipAxis(float o, float d, float inv,
     return true;
 }
 
-__attribute__((always_inline)) inline float planeDistance(const WalkAxis &A) {
-    return (A.base + float(A.next) * A.size) * A.inv;
+__attribute__((always_inline)) inline float planeDistance(const WalkAxis &A, const AxisFixed &F) {
+    return (A.base + float(A.next) * F.size) * F.inv;
 }
 
 // Sets up an axis for a ray entering the grid at distance t0; returns the cell index.
-__attribute__((always_inline)) inline int64_t startAxis(WalkAxis &A, float o, float d, float inv,
-                                                        float lo, float size, float invSize,
-                                                        int64_t n, int64_t stride, float t0) {
+__attribute__((always_inline)) inline int64_t startAxis(WalkAxis &A, const AxisFixed &F, float o,
+                                                        float d, int64_t stride, float t0) {
+    const float lo = F.lo, size = F.size, inv = F.inv;
+    const int64_t n = F.n;
     float p = d == 0.0f ? o : o + d * t0;
-    int64_t idx = axisCell(p, lo, invSize, n);
-    A.lo = lo, A.invSize = invSize, A.size = size, A.inv = inv, A.n = n;
+    int64_t idx = axisCell(p, lo, F.invSize, n);
     A.base = lo - o;
     A.step = d > 0.0f ? 1 : (d < 0.0f ? -1 : 0);
     A.ahead = A.step > 0;
     A.next = idx + A.ahead;
     A.beyond = A.step > 0 ? n + 1 : (A.step < 0 ? -1 : -2);
     A.cellStep = A.step * stride;
-    A.tNext = A.step ? planeDistance(A) : kInfiniteDistance;
+    A.tNext = A.step ? planeDistance(A, F) : kInfiniteDistance;
     A.delta = A.step ? size * std::fabs(inv) : kInfiniteDistance;
     return idx;
 }
 
 // Crosses the axis's next cell plane.
-__attribute__((always_inline)) inline void advanceAxis(WalkAxis &A) {
+__attribute__((always_inline)) inline void advanceAxis(WalkAxis &A, const AxisFixed &F) {
     A.next += A.step;
-    A.tNext = planeDistance(A);
+    A.tNext = planeDistance(A, F);
 }
 
 // The axis whose far face of an empty cube the walk leaves through moves dist cells on; false
 // when that leaves the grid.
-__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, int64_t dist) {
+__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, const AxisFixed &F,
+                                                   int64_t dist) {
     A.next += A.step * dist;
-    if (uint64_t(A.next - A.ahead) >= uint64_t(A.n)) return false;
-    A.tNext = planeDistance(A);
+    if (uint64_t(A.next - A.ahead) >= uint64_t(F.n)) return false;
+    A.tNext = planeDistance(A, F);
     return true;
 }
 
 // Any other axis moves to the cell the ray is in at the exit distance (at most dist - 1 cells
 // on), with the plane ahead not before the exit; false when that leaves the grid.
-__attribute__((always_inline)) inline bool followAxis(WalkAxis &A, float o, float d, float tExit,
-                                                      int64_t dist) {
+__attribute__((always_inline)) inline bool followAxis(WalkAxis &A, const AxisFixed &F, float o,
+                                                      float d, float tExit, int64_t dist) {
     if (A.step == 0 || A.tNext >= tExit) return true;
     int64_t from = A.next - A.ahead;
     int64_t last = from + A.step * (dist - 1);
-    float f = (o + d * tExit - A.lo) * A.invSize;
-    f = f >= 0.0f ? (f < float(A.n) ? f : float(A.n)) : 0.0f;
+    float f = (o + d * tExit - F.lo) * F.invSize;
+    f = f >= 0.0f ? (f < float(F.n) ? f : float(F.n)) : 0.0f;
     int64_t at = int64_t(f);
     at = A.step > 0 ? std::clamp(at, from, last) : std::clamp(at, last, from);
     A.next = at + A.ahead;
-    A.tNext = planeDistance(A);
-    while (A.tNext < tExit && A.next - A.ahead != last) advanceAxis(A);
-    return uint64_t(A.next - A.ahead) < uint64_t(A.n);
+    A.tNext = planeDistance(A, F);
+    while (A.tNext < tExit && A.next - A.ahead != last) advanceAxis(A, F);
+    return uint64_t(A.next - A.ahead) < uint64_t(F.n);
 }
 
 }  // namespace
@@ -1176,13 +1185,19 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
 template <bool kAny>
 bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
     WalkAxis X, Y, Z;
+    const auto fx = [&] {
+        return AxisFixed{box_.min.x, cellSize_.x, invCellSize_.x, r.inv.x, nx_};
+    };
+    const auto fy = [&] {
+        return AxisFixed{box_.min.y, cellSize_.y, invCellSize_.y, r.inv.y, ny_};
+    };
+    const auto fz = [&] {
+        return AxisFixed{box_.min.z, cellSize_.z, invCellSize_.z, r.inv.z, nz_};
+    };
     const int64_t strideY = nx_, strideZ = nx_ * ny_;
-    int64_t cell =
-        startAxis(X, r.o.x, r.d.x, r.inv.x, box_.min.x, cellSize_.x, invCellSize_.x, nx_, 1, t0);
-    cell += strideY * startAxis(Y, r.o.y, r.d.y, r.inv.y, box_.min.y, cellSize_.y, invCellSize_.y,
-                                ny_, strideY, t0);
-    cell += strideZ * startAxis(Z, r.o.z, r.d.z, r.inv.z, box_.min.z, cellSize_.z, invCellSize_.z,
-                                nz_, strideZ, t0);
+    int64_t cell = startAxis(X, fx(), r.o.x, r.d.x, 1, t0);
+    cell += strideY * startAxis(Y, fy(), r.o.y, r.d.y, strideY, t0);
+    cell += strideZ * startAxis(Z, fz(), r.o.z, r.d.z, strideZ, t0);
     // Where empty cells keep the distance code of the ray's direction octant.
     const uint32_t shift = 3 * uint32_t((X.step < 0) | (Y.step < 0) << 1 | (Z.step < 0) << 2);
     const uint32_t *cells = cells_.data();
@@ -1291,19 +1306,19 @@ bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
             if (!(tExit < s.limit)) break;
             const int64_t d = int64_t(dist);
             if (j == 0) {
-                if (!leadAxis(X, d)) break;
-                if (!followAxis(Y, r.o.y, r.d.y, tExit, d) ||
-                    !followAxis(Z, r.o.z, r.d.z, tExit, d))
+                if (!leadAxis(X, fx(), d)) break;
+                if (!followAxis(Y, fy(), r.o.y, r.d.y, tExit, d) ||
+                    !followAxis(Z, fz(), r.o.z, r.d.z, tExit, d))
                     return found;
             } else if (j == 1) {
-                if (!leadAxis(Y, d)) break;
-                if (!followAxis(X, r.o.x, r.d.x, tExit, d) ||
-                    !followAxis(Z, r.o.z, r.d.z, tExit, d))
+                if (!leadAxis(Y, fy(), d)) break;
+                if (!followAxis(X, fx(), r.o.x, r.d.x, tExit, d) ||
+                    !followAxis(Z, fz(), r.o.z, r.d.z, tExit, d))
                     return found;
             } else {
-                if (!leadAxis(Z, d)) break;
-                if (!followAxis(X, r.o.x, r.d.x, tExit, d) ||
-                    !followAxis(Y, r.o.y, r.d.y, tExit, d))
+                if (!leadAxis(Z, fz(), d)) break;
+                if (!followAxis(X, fx(), r.o.x, r.d.x, tExit, d) ||
+                    !followAxis(Y, fy(), r.o.y, r.d.y, tExit, d))
                     return found;
             }
             cell = (Z.next - Z.ahead) * strideZ + (Y.next - Y.ahead) * strideY + X.next - X.ahead;
@@ -1314,11 +1329,11 @@ bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
         if (tA >= s.limit || !inside) break;
         cell += stepA;
         if (a == 0)
-            advanceAxis(X);
+            advanceAxis(X, fx());
         else if (a == 1)
-            advanceAxis(Y);
+            advanceAxis(Y, fy());
         else
-            advanceAxis(Z);
+            advanceAxis(Z, fz());
     }
     return found;
 }
