@@ -1248,7 +1248,7 @@ bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
         const uint32_t word = cells[cell];
         const uint32_t dist =
             (word >> kItemIndexBits) == kItemEmpty
-                ? (word >> shift & 7) == kEmptyAhead ? 255u : kCubeSide[word >> shift & 7]
+                ? uint32_t(kWalkDistance[word >> shift & 7])
                 : 0u;
         if (dist == 0) {
             const uint32_t *first = cells + cell, *last = first + 1;

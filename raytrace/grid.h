@@ -229,6 +229,13 @@ private:
     // holds items. The walk jumps over the cube, or stops; one load per cell tells it both.
     static constexpr uint32_t kEmptyAhead = 7;
     static constexpr uint8_t kCubeSide[7] = {1, 2, 3, 5, 8, 13, 21};
+    /// What the walk reads of a code: the cube side, or 255 for kEmptyAhead.
+    static constexpr uint8_t kWalkDistance[8] = {1, 2, 3, 5, 8, 13, 21, 255};
+    static_assert(kEmptyAhead == 7 && [] {
+        for (int i = 0; i < 7; ++i)
+            if (kWalkDistance[i] != kCubeSide[i]) return false;
+        return true;
+    }());
     /// Points along a ray whose cells the walk fetches before it starts, in grids of at least
     /// kFetchAheadMinCells cells (1 MiB of cell words).
     static constexpr int kFetchAhead = 6;
