@@ -64,12 +64,28 @@ struct TraceRay {
         d = direction;
         required = requiredFlags;
         time = t >= 0.0f ? (t <= 1.0f ? t : 1.0f) : 0.0f;  // NaN becomes 0
-        if (!isFinite(o) || !isFinite(d) || d.lengthSquared() == 0.0f) return false;
+        // All six coordinates at once (lane 3 is 0): v - v is 0 exactly when v is finite.
+        const __m128 ov = load3(o), dv = load3(d), zero = _mm_setzero_ps();
+        const __m128 finite = _mm_and_ps(_mm_cmpeq_ps(_mm_sub_ps(ov, ov), zero),
+                                         _mm_cmpeq_ps(_mm_sub_ps(dv, dv), zero));
+        if (_mm_movemask_ps(finite) != 15 || d.lengthSquared() == 0.0f) return false;
         // A zero component gets a huge finite reciprocal instead of infinity, so that slab tests
-        // never form 0 * inf; the grid walk tests zero components itself.
-        auto recip = [](float x) { return x != 0.0f ? 1.0f / x : 1e30f; };
-        inv = {recip(d.x), recip(d.y), recip(d.z)};
+        // never form 0 * inf; the grid walk tests zero components itself. (One division for the
+        // three; each lane gives the bits of the single division.)
+        // (Zero lanes divide 1 by 1, so that no division by zero is raised.)
+        const __m128 one = _mm_set1_ps(1.0f), moving = _mm_cmpneq_ps(dv, zero);
+        const __m128 q =
+            _mm_div_ps(one, _mm_or_ps(_mm_and_ps(moving, dv), _mm_andnot_ps(moving, one)));
+        const __m128 r =
+            _mm_or_ps(_mm_and_ps(moving, q), _mm_andnot_ps(moving, _mm_set1_ps(1e30f)));
+        _mm_storel_pi(reinterpret_cast<__m64 *>(&inv.x), r);
+        _mm_store_ss(&inv.z, _mm_movehl_ps(r, r));
         return true;
+    }
+    /// x, y, z in lanes 0-2 and 0 in lane 3, read without leaving the vector.
+    static __m128 load3(const Vec3 &v) {
+        return _mm_movelh_ps(_mm_loadl_pi(_mm_setzero_ps(), reinterpret_cast<const __m64 *>(&v.x)),
+                             _mm_load_ss(&v.z));
     }
     /// The second half of prepare: the four-wide copies the packed tests read.
     void prepareLanes() {
