@@ -357,15 +357,11 @@ bool CompleteGrid::query(const Grid &grid, const PrimitiveStore &store, const Ra
     }
     if (ray.type == kRayEnvironment || !(tmax > 0.0f)) return false;
     TraceRay r;
-    if (!r.prepareRay(ray.origin, ray.direction, rayTypeRequiredFlags(ray.type), ray.time))
+    if (!r.prepare(ray.origin, ray.direction, rayTypeRequiredFlags(ray.type), ray.time))
         return false;
-    // Rays that miss the grid's box skip the rest of the preparation.
-    float t0, t1;
-    if (!grid.enters(r, tmax, t0, t1)) return false;
-    r.prepareLanes();
     TraceState s;
     s.limit = tmax;
-    if (!grid.walk<kAny>(r, s, t0, t1)) return false;
+    if (!grid.traverse<kAny>(r, s)) return false;
     if constexpr (!kAny) {
         hit->t = s.limit;
         hit->u = s.u;

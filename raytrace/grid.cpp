@@ -1140,7 +1140,8 @@ __attribute__((always_inline)) inline void advanceAxis(WalkAxis &A, const AxisFi
 
 // The axis whose far face of an empty cube the walk leaves through moves dist cells on; false
 // when that leaves the grid.
-__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, const AxisFixed &F, int64_t dist) {
+__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, const AxisFixed &F,
+                                                   int64_t dist) {
     A.next += A.step * dist;
     if (uint64_t(A.next - A.ahead) >= uint64_t(F.n)) return false;
     A.tNext = planeDistance(A, F);
@@ -1166,23 +1167,16 @@ __attribute__((always_inline)) inline bool followAxis(WalkAxis &A, const AxisFix
 
 }  // namespace
 
-bool Grid::enters(const TraceRay &r, float limit, float &t0, float &t1) const {
-    if (cells_.empty()) return false;
-    // Clip the ray against the box (slab test).
-    t0 = 0.0f, t1 = limit;
-    return clipAxis(r.o.x, r.d.x, r.inv.x, box_.min.x, box_.max.x, t0, t1) &&
-           clipAxis(r.o.y, r.d.y, r.inv.y, box_.min.y, box_.max.y, t0, t1) &&
-           clipAxis(r.o.z, r.d.z, r.inv.z, box_.min.z, box_.max.z, t0, t1) && t0 <= t1;
-}
-
 template <bool kAny>
 bool Grid::traverse(const TraceRay &r, TraceState &s) const {
-    float t0, t1;
-    return enters(r, s.limit, t0, t1) && walk<kAny>(r, s, t0, t1);
-}
+    if (cells_.empty()) return false;
+    // Clip the ray against the box (slab test).
+    float t0 = 0.0f, t1 = s.limit;
+    if (!clipAxis(r.o.x, r.d.x, r.inv.x, box_.min.x, box_.max.x, t0, t1) ||
+        !clipAxis(r.o.y, r.d.y, r.inv.y, box_.min.y, box_.max.y, t0, t1) ||
+        !clipAxis(r.o.z, r.d.z, r.inv.z, box_.min.z, box_.max.z, t0, t1) || !(t0 <= t1))
+        return false;
 
-template <bool kAny>
-bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
     WalkAxis X, Y, Z;
     const auto fx = [&] {
         return AxisFixed{box_.min.x, cellSize_.x, invCellSize_.x, r.inv.x, nx_};
@@ -1245,9 +1239,10 @@ bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
                    : (a == 1 ? Y.next + Y.step != Y.beyond : Z.next + Z.step != Z.beyond);
         if (inside) __builtin_prefetch(cells + cell + stepA);
         const uint32_t word = cells[cell];
-        const uint32_t dist = (word >> kItemIndexBits) == kItemEmpty
-                                  ? uint32_t(kWalkDistance[word >> shift & 7])
-                                  : 0u;
+        const uint32_t dist =
+            (word >> kItemIndexBits) == kItemEmpty
+                ? uint32_t(kWalkDistance[word >> shift & 7])
+                : 0u;
         if (dist == 0) {
             const uint32_t *first = cells + cell, *last = first + 1;
             if ((word >> kItemIndexBits) == kItemList) {
@@ -1338,7 +1333,5 @@ bool Grid::walk(const TraceRay &r, TraceState &s, float t0, float t1) const {
 
 template bool Grid::traverse<false>(const TraceRay &, TraceState &) const;
 template bool Grid::traverse<true>(const TraceRay &, TraceState &) const;
-template bool Grid::walk<false>(const TraceRay &, TraceState &, float, float) const;
-template bool Grid::walk<true>(const TraceRay &, TraceState &, float, float) const;
 
 }  // namespace ox

@@ -149,12 +149,6 @@ public:
     /// The walk itself; kAny stops at the first hit.
     template <bool kAny>
     bool traverse(const TraceRay &ray, TraceState &state) const;
-    /// The interval [t0, t1] of the ray (prepareRay is enough) inside the grid's box below
-    /// limit; false when it misses the box or the grid is empty.
-    bool enters(const TraceRay &ray, float limit, float &t0, float &t1) const;
-    /// traverse over the interval enters gave (the ray fully prepared).
-    template <bool kAny>
-    bool walk(const TraceRay &ray, TraceState &state, float t0, float t1) const;
 
     bool empty() const { return cells_.empty(); }
     const BBox &box() const { return box_; }

@@ -53,42 +53,15 @@ struct TraceRay {
 
     /// Prepares the data; false when the ray can hit nothing (non-finite or zero direction).
     bool prepare(const Vec3 &origin, const Vec3 &direction, uint32_t requiredFlags, float t) {
-        if (!prepareRay(origin, direction, requiredFlags, t)) return false;
-        prepareLanes();
-        return true;
-    }
-    /// The first half of prepare: origin, direction, reciprocals, flags and time (all a box
-    /// test needs); false when the ray can hit nothing.
-    bool prepareRay(const Vec3 &origin, const Vec3 &direction, uint32_t requiredFlags, float t) {
         o = origin;
         d = direction;
         required = requiredFlags;
         time = t >= 0.0f ? (t <= 1.0f ? t : 1.0f) : 0.0f;  // NaN becomes 0
-        // All six coordinates at once (lane 3 is 0): v - v is 0 exactly when v is finite.
-        const __m128 ov = load3(o), dv = load3(d), zero = _mm_setzero_ps();
-        const __m128 finite = _mm_and_ps(_mm_cmpeq_ps(_mm_sub_ps(ov, ov), zero),
-                                         _mm_cmpeq_ps(_mm_sub_ps(dv, dv), zero));
-        if (_mm_movemask_ps(finite) != 15 || d.lengthSquared() == 0.0f) return false;
+        if (!isFinite(o) || !isFinite(d) || d.lengthSquared() == 0.0f) return false;
         // A zero component gets a huge finite reciprocal instead of infinity, so that slab tests
-        // never form 0 * inf; the grid walk tests zero components itself. (One division for the
-        // three; each lane gives the bits of the single division.)
-        // (Zero lanes divide 1 by 1, so that no division by zero is raised.)
-        const __m128 one = _mm_set1_ps(1.0f), moving = _mm_cmpneq_ps(dv, zero);
-        const __m128 q =
-            _mm_div_ps(one, _mm_or_ps(_mm_and_ps(moving, dv), _mm_andnot_ps(moving, one)));
-        const __m128 r =
-            _mm_or_ps(_mm_and_ps(moving, q), _mm_andnot_ps(moving, _mm_set1_ps(1e30f)));
-        _mm_storel_pi(reinterpret_cast<__m64 *>(&inv.x), r);
-        _mm_store_ss(&inv.z, _mm_movehl_ps(r, r));
-        return true;
-    }
-    /// x, y, z in lanes 0-2 and 0 in lane 3, read without leaving the vector.
-    static __m128 load3(const Vec3 &v) {
-        return _mm_movelh_ps(_mm_loadl_pi(_mm_setzero_ps(), reinterpret_cast<const __m64 *>(&v.x)),
-                             _mm_load_ss(&v.z));
-    }
-    /// The second half of prepare: the four-wide copies the packed tests read.
-    void prepareLanes() {
+        // never form 0 * inf; the grid walk tests zero components itself.
+        auto recip = [](float x) { return x != 0.0f ? 1.0f / x : 1e30f; };
+        inv = {recip(d.x), recip(d.y), recip(d.z)};
         ix = float4(inv.x), iy = float4(inv.y), iz = float4(inv.z);
         ox = float4(o.x), oy = float4(o.y), oz = float4(o.z);
         dx = float4(d.x), dy = float4(d.y), dz = float4(d.z);
@@ -97,6 +70,7 @@ struct TraceRay {
         flagSet = int4(0);
         required4 = int4(int32_t(required));
         wide = wideTestsEnabled();
+        return true;
     }
 };
 
