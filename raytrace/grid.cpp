@@ -1140,8 +1140,7 @@ __attribute__((always_inline)) inline void advanceAxis(WalkAxis &A, const AxisFi
 
 // The axis whose far face of an empty cube the walk leaves through moves dist cells on; false
 // when that leaves the grid.
-__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, const AxisFixed &F,
-                                                   int64_t dist) {
+__attribute__((always_inline)) inline bool leadAxis(WalkAxis &A, const AxisFixed &F, int64_t dist) {
     A.next += A.step * dist;
     if (uint64_t(A.next - A.ahead) >= uint64_t(F.n)) return false;
     A.tNext = planeDistance(A, F);
@@ -1239,10 +1238,9 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                    : (a == 1 ? Y.next + Y.step != Y.beyond : Z.next + Z.step != Z.beyond);
         if (inside) __builtin_prefetch(cells + cell + stepA);
         const uint32_t word = cells[cell];
-        const uint32_t dist =
-            (word >> kItemIndexBits) == kItemEmpty
-                ? uint32_t(kWalkDistance[word >> shift & 7])
-                : 0u;
+        const uint32_t dist = (word >> kItemIndexBits) == kItemEmpty
+                                  ? uint32_t(kWalkDistance[word >> shift & 7])
+                                  : 0u;
         if (dist == 0) {
             const uint32_t *first = cells + cell, *last = first + 1;
             if ((word >> kItemIndexBits) == kItemList) {

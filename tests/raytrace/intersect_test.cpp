@@ -87,6 +87,34 @@ TEST(IntersectTest, PackedAndWideLanesMatchTheSingleTriangleTest) {
 }
 
 // The switch: off always works; on only where the processor has AVX2; prepared rays carry it.
+TEST(IntersectTest, PrepareRejectsUnusableRaysAndKeepsZeroComponentsFinite) {
+    const float inf = std::numeric_limits<float>::infinity(), nan = std::nanf("");
+    struct Case {
+        Vec3 o, d;
+        bool usable;
+    };
+    const Case cases[] = {
+        {{0, 0, 0}, {0, 0, 0}, false},
+        {{0, 0, 0}, {1e-30f, 0, 0}, false},
+        {{inf, 0, 0}, {0, 0, 1}, false},
+        {{0, nan, 0}, {0, 0, 1}, false},
+        {{0, 0, -inf}, {0, 0, 1}, false},
+        {{0, 0, 0}, {nan, 0, 1}, false},
+        {{0, 0, 0}, {0, inf, 1}, false},
+        {{0, 0, 0}, {0, 0, -inf}, false},
+        {{1, 2, 3}, {0, 0, -1}, true},
+        {{-1, 0, 5}, {3, -0.0f, 0.25f}, true},
+        {{1e30f, -1e30f, 0}, {-7, 3, 1e-3f}, true},
+    };
+    for (const Case &c : cases) {
+        TraceRay r;
+        ASSERT_EQ(r.prepare(c.o, c.d, 1, 0.5f), c.usable) << c.d.x << " " << c.d.y << " " << c.d.z;
+        if (!c.usable) continue;
+        const float d[3] = {c.d.x, c.d.y, c.d.z}, inv[3] = {r.inv.x, r.inv.y, r.inv.z};
+        for (int a = 0; a < 3; ++a) EXPECT_EQ(inv[a], d[a] != 0.0f ? 1.0f / d[a] : 1e30f);
+    }
+}
+
 TEST(IntersectTest, WideTestsSwitch) {
     TraceRay r;
     EXPECT_FALSE(setWideTests(false));
