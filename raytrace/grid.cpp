@@ -704,6 +704,38 @@ __attribute__((always_inline)) inline bool testPacket(const PrimitiveStore &stor
     return true;
 }
 
+// Tests candidate packets (their box entry distances in tn) nearest first, until the nearest
+// left is entered beyond the closest hit found. True when a packet was hit.
+__attribute__((always_inline)) inline bool testNearestFirst(const PrimitiveStore &store,
+                                                            float *tn, uint32_t *packet,
+                                                            uint32_t count, const TraceRay &r,
+                                                            TraceState &s) {
+    bool hit = false;
+    while (count) {
+        uint32_t best = 0;
+        for (uint32_t i = 1; i < count; ++i)
+            if (tn[i] < tn[best]) best = i;
+        if (!(tn[best] <= s.limit)) break;
+        uint32_t k = packet[best];
+        --count;
+        tn[best] = tn[count], packet[best] = packet[count];
+        if (testPacket<false>(store, k, r, s)) hit = true;
+    }
+    return hit;
+}
+
+// Starts fetching the groups of a cell's run from g (most cells have several: the lines of the
+// next two are asked for before the first arrives); returns the run's length.
+__attribute__((always_inline)) inline uint32_t prefetchGroupRun(const PacketGroup *g) {
+    const char *bytes = reinterpret_cast<const char *>(g);
+    __builtin_prefetch(bytes);
+    __builtin_prefetch(bytes + 64);
+    __builtin_prefetch(bytes + 128);
+    const uint32_t n = g->run;
+    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    return n;
+}
+
 // Starts fetching packet k (three cache lines when the store is line-aligned).
 inline void prefetchPacket(const PrimitiveStore &store, uint32_t k) {
     const char *p = reinterpret_cast<const char *>(store.triangles.data() + size_t(k) * 4);
@@ -745,13 +777,7 @@ inline int groupMask(const PacketGroup &g, const GroupFrame &f, float limit, flo
 template <bool kAny>
 bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s, const Vec3 &frame) const {
     const PacketGroup *g = groups_.data() + index;
-    // Most cells have several groups: fetch the lines of the next two before the first arrives.
-    const char *bytes = reinterpret_cast<const char *>(g);
-    __builtin_prefetch(bytes);
-    __builtin_prefetch(bytes + 64);
-    __builtin_prefetch(bytes + 128);
-    uint32_t n = g->run;
-    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    uint32_t n = prefetchGroupRun(g);
     GroupFrame f;
     f.ax = float4(frameStep_.x) * r.ix, f.ay = float4(frameStep_.y) * r.iy;
     f.az = float4(frameStep_.z) * r.iz;
@@ -780,17 +806,7 @@ bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s, const Ve
                 }
                 count = kept;
             }
-            while (count) {
-                uint32_t best = 0;
-                for (uint32_t i = 1; i < count; ++i)
-                    if (tn[i] < tn[best]) best = i;
-                if (!(tn[best] <= s.limit)) break;
-                uint32_t k = packet[best];
-                --count;
-                tn[best] = tn[count], packet[best] = packet[count];
-                if (testPacket<false>(*store_, k, r, s)) hit = true;
-            }
-            return hit;
+            return testNearestFirst(*store_, tn, packet, count, r, s);
         }
     }
     for (; n > 0; --n, ++g) {
@@ -825,12 +841,7 @@ struct WideFrame {
 // per axis.
 OX_WIDE_INLINE WideFrame openGroupRun(const PacketGroup *g, uint32_t &n, const Vec3 &step,
                                       const Vec3 &frame, const TraceRay &r) {
-    const char *bytes = reinterpret_cast<const char *>(g);
-    __builtin_prefetch(bytes);
-    __builtin_prefetch(bytes + 64);
-    __builtin_prefetch(bytes + 128);
-    n = g->run;
-    for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
+    n = prefetchGroupRun(g);
     WideFrame f;
     f.ax = wide_ops::mul(_mm256_set1_ps(step.x), wide(r.ix));
     f.ay = wide_ops::mul(_mm256_set1_ps(step.y), wide(r.iy));
@@ -916,17 +927,7 @@ __attribute__((target("avx2"))) bool Grid::closestInGroupsWide(uint32_t index, c
             }
             count = kept;
         }
-        while (count) {
-            uint32_t best = 0;
-            for (uint32_t i = 1; i < count; ++i)
-                if (tn[i] < tn[best]) best = i;
-            if (!(tn[best] <= s.limit)) break;
-            uint32_t k = packet[best];
-            --count;
-            tn[best] = tn[count], packet[best] = packet[count];
-            if (testPacket<false>(*store_, k, r, s)) hit = true;
-        }
-        return hit;
+        return testNearestFirst(*store_, tn, packet, count, r, s);
     }
     for (uint32_t i = 0; i < n; i += 2) {
         const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
