@@ -291,6 +291,13 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     nx_ = res.nx, ny_ = res.ny, nz_ = res.nz;
     cellSize_ = {ext.x / float(nx_), ext.y / float(ny_), ext.z / float(nz_)};
     invCellSize_ = {float(nx_) / ext.x, float(ny_) / ext.y, float(nz_) / ext.z};
+    // Cell counts and strides fit 32 bits: the total is bounded by 2^28.
+    walk_.lo = _mm_setr_ps(b.min.x, b.min.y, b.min.z, 0.0f);
+    walk_.size = _mm_setr_ps(cellSize_.x, cellSize_.y, cellSize_.z, 0.0f);
+    walk_.invSize = _mm_setr_ps(invCellSize_.x, invCellSize_.y, invCellSize_.z, 0.0f);
+    walk_.top = _mm_setr_ps(float(nx_ - 1), float(ny_ - 1), float(nz_ - 1), 0.0f);
+    walk_.last = _mm_setr_epi32(int32_t(nx_ - 1), int32_t(ny_ - 1), int32_t(nz_ - 1), 0);
+    walk_.stride = _mm_setr_epi32(1, int32_t(nx_), int32_t(nx_ * ny_), 0);
     tolerance_ = std::max(0.001f, 1e-5f * cellSize_.length());
     // Cells take their primitives with a small margin, so that a ray walking next to a cell
     // boundary finds a triangle that only touches the neighbouring cell. The tolerance, bounded
@@ -1088,16 +1095,6 @@ struct AxisFixed {
     int64_t n;
 };
 
-// Cell index of coordinate v along an axis. Clamps in floating point first: NaN and huge values
-// never reach the integer conversion; above 2^24 cells n - 1 may round up to n in float, so the
-// index is clamped again.
-__attribute__((always_inline)) inline int64_t axisCell(float v, float lo, float invSize,
-                                                       int64_t n) {
-    float f = (v - lo) * invSize;
-    f = f >= 0.0f ? (f < float(n - 1) ? f : float(n - 1)) : 0.0f;
-    return std::min(int64_t(f), n - 1);  // truncation is floor for the non-negative values left
-}
-
 // Clips [t0, t1] to the slab of an axis; false when the ray misses it. A zero direction component
 // tests the slab only.
 __attribute__((always_inline)) inline bool clipAxis(float o, float d, float inv, float lo, float hi,
@@ -1115,22 +1112,22 @@ __attribute__((always_inline)) inline float planeDistance(const WalkAxis &A, con
     return (A.base + float(A.next) * F.size) * F.inv;
 }
 
-// Sets up an axis for a ray entering the grid at distance t0; returns the cell index.
-__attribute__((always_inline)) inline int64_t startAxis(WalkAxis &A, const AxisFixed &F, float o,
-                                                        float d, int64_t stride, float t0) {
-    const float lo = F.lo, size = F.size, inv = F.inv;
-    const int64_t n = F.n;
-    float p = d == 0.0f ? o : o + d * t0;
-    int64_t idx = axisCell(p, lo, F.invSize, n);
-    A.base = lo - o;
-    A.step = d > 0.0f ? 1 : (d < 0.0f ? -1 : 0);
+// The three axes of a walk as the set-up computes them, x, y and z in lanes 0 to 2.
+struct WalkStart {
+    alignas(16) int32_t cell[4], step[4], beyond[4], cellStep[4];
+    alignas(16) float tNext[4], base[4], delta[4];
+};
+
+// An axis from lane i of the set-up.
+__attribute__((always_inline)) inline void startAxis(WalkAxis &A, const WalkStart &w, int i) {
+    A.step = w.step[i];
     A.ahead = A.step > 0;
-    A.next = idx + A.ahead;
-    A.beyond = A.step > 0 ? n + 1 : (A.step < 0 ? -1 : -2);
-    A.cellStep = A.step * stride;
-    A.tNext = A.step ? planeDistance(A, F) : kInfiniteDistance;
-    A.delta = A.step ? size * std::fabs(inv) : kInfiniteDistance;
-    return idx;
+    A.next = int64_t(w.cell[i]) + A.ahead;
+    A.beyond = w.beyond[i];
+    A.cellStep = w.cellStep[i];
+    A.tNext = w.tNext[i];
+    A.base = w.base[i];
+    A.delta = w.delta[i];
 }
 
 // Crosses the axis's next cell plane.
@@ -1188,11 +1185,58 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         return AxisFixed{box_.min.z, cellSize_.z, invCellSize_.z, r.inv.z, nz_};
     };
     const int64_t strideY = nx_, strideZ = nx_ * ny_;
-    int64_t cell = startAxis(X, fx(), r.o.x, r.d.x, 1, t0);
-    cell += strideY * startAxis(Y, fy(), r.o.y, r.d.y, strideY, t0);
-    cell += strideZ * startAxis(Z, fz(), r.o.z, r.d.z, strideZ, t0);
+    // The three axes are set up side by side, with the operations the walk's steps use, lane
+    // for lane: the cell the ray enters at t0, the step towards the next plane and its
+    // distance (the largest float on an axis the ray does not move along).
+    WalkStart w;
+    uint32_t down;
+    {
+        const __m128 o = _mm_setr_ps(r.o.x, r.o.y, r.o.z, 0.0f);
+        const __m128 d = _mm_setr_ps(r.d.x, r.d.y, r.d.z, 0.0f);
+        const __m128 inv = _mm_setr_ps(r.inv.x, r.inv.y, r.inv.z, 0.0f);
+        const __m128 zero = _mm_setzero_ps();
+        // A zero direction component adds zero to the origin: t0 is finite.
+        const __m128 p = _mm_add_ps(o, _mm_mul_ps(d, _mm_set1_ps(t0)));
+        // The cell index: NaN and negative values clamp to 0 (max returns its second operand
+        // on NaN) before the conversion, large ones to the last cell before and after it
+        // (above 2^24 cells the last index may round up in float).
+        __m128 f = _mm_mul_ps(_mm_sub_ps(p, walk_.lo), walk_.invSize);
+        f = _mm_min_ps(_mm_max_ps(f, zero), walk_.top);
+        __m128i cell3 = _mm_cvttps_epi32(f);
+        const __m128i over = _mm_cmpgt_epi32(cell3, walk_.last);
+        cell3 = _mm_or_si128(_mm_and_si128(over, walk_.last), _mm_andnot_si128(over, cell3));
+        const __m128i up = _mm_castps_si128(_mm_cmpgt_ps(d, zero));
+        const __m128i back = _mm_castps_si128(_mm_cmplt_ps(d, zero));
+        const __m128 still = _mm_cmpeq_ps(d, zero);
+        const __m128i step = _mm_sub_epi32(back, up);
+        const __m128i next = _mm_sub_epi32(cell3, up);
+        // Beyond: the cell count + 1 going up, -1 going down, -2 standing still.
+        const __m128i beyond = _mm_or_si128(
+            _mm_and_si128(up, _mm_add_epi32(walk_.last, _mm_set1_epi32(2))),
+            _mm_andnot_si128(up, _mm_or_si128(back, _mm_set1_epi32(-2))));
+        const __m128i cellStep = _mm_sub_epi32(_mm_and_si128(up, walk_.stride),
+                                               _mm_and_si128(back, walk_.stride));
+        const __m128 base = _mm_sub_ps(walk_.lo, o);
+        const __m128 largest = _mm_set1_ps(kInfiniteDistance);
+        const __m128 tNext =
+            _mm_mul_ps(_mm_add_ps(base, _mm_mul_ps(_mm_cvtepi32_ps(next), walk_.size)), inv);
+        const __m128 absInv = _mm_andnot_ps(_mm_set1_ps(-0.0f), inv);
+        const __m128 delta = _mm_mul_ps(walk_.size, absInv);
+        _mm_store_si128(reinterpret_cast<__m128i *>(w.cell), cell3);
+        _mm_store_si128(reinterpret_cast<__m128i *>(w.step), step);
+        _mm_store_si128(reinterpret_cast<__m128i *>(w.beyond), beyond);
+        _mm_store_si128(reinterpret_cast<__m128i *>(w.cellStep), cellStep);
+        _mm_store_ps(w.tNext, _mm_or_ps(_mm_andnot_ps(still, tNext), _mm_and_ps(still, largest)));
+        _mm_store_ps(w.base, base);
+        _mm_store_ps(w.delta, _mm_or_ps(_mm_andnot_ps(still, delta), _mm_and_ps(still, largest)));
+        down = uint32_t(_mm_movemask_ps(_mm_castsi128_ps(back))) & 7u;
+    }
+    startAxis(X, w, 0);
+    startAxis(Y, w, 1);
+    startAxis(Z, w, 2);
+    int64_t cell = int64_t(w.cell[0]) + strideY * w.cell[1] + strideZ * w.cell[2];
     // Where empty cells keep the distance code of the ray's direction octant.
-    const uint32_t shift = 3 * uint32_t((X.step < 0) | (Y.step < 0) << 1 | (Z.step < 0) << 2);
+    const uint32_t shift = 3 * down;
     const uint32_t *cells = cells_.data();
     const uint32_t *items = items_.data();
     // The walk waits on each cell's word before it knows where to go next. In grids whose

@@ -214,6 +214,13 @@ private:
     float framePad_ = 0.0f;  ///< Frames of group boxes: the cell grown by this on every side.
     Vec3 frameStep_;         ///< One 1/255 step of a frame per axis.
     BBox box_;
+    /// What the walk's set-up reads, x, y and z in lanes 0 to 2: the lower bound, the cell size
+    /// and its reciprocal, the last cell index (as float and as integer) and the cell strides.
+    struct WalkFrame {
+        float4 lo, size, invSize, top;
+        int4 last, stride;
+    };
+    WalkFrame walk_;
     // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
     // the cell's item count followed by its codes (most cells reach their data without the
     // list), or for an empty cell a kItemEmpty code with three bits per direction octant (bits
