@@ -4,6 +4,7 @@
 // The build benchmarks report the build time and the bytes per triangle of both structures.
 #include <benchmark/benchmark.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cmath>
@@ -248,11 +249,8 @@ double threadSeconds() {
 // clock, so that the ratio stays meaningful on a machine shared with other work. Each turn first
 // warms its structure with 16k other rays, so that neither is timed with caches the other one
 // filled. Arguments as BM_Grid; counters: gridRaysPerCpuSecond, embreeRaysPerCpuSecond, ratio.
-void BM_Ratio(benchmark::State &state) {
-    Fixture &f = fixture(int(state.range(0)));
-    const std::vector<Ray> &rays = state.range(1) == 0 ? f.incoherent : f.camera;
-    float tmax = state.range(1) == 0 ? f.incoherentTmax : f.cameraTmax;
-    bool any = state.range(2) == 1;
+void ratioTurns(benchmark::State &state, Fixture &f, const std::vector<Ray> &rays, float tmax,
+                bool any) {
     constexpr size_t kTurn = 16384;
     auto gridRun = [&](size_t start, std::vector<char> &hits) {
         for (size_t k = 0; k < kTurn; ++k) {
@@ -289,6 +287,43 @@ void BM_Ratio(benchmark::State &state) {
     state.counters["embreeRaysPerCpuSecond"] = double(n) / embreeSeconds;
     state.counters["ratio"] = embreeSeconds / gridSeconds;
     state.counters["hitMismatches"] = double(mismatches);
+}
+
+void BM_Ratio(benchmark::State &state) {
+    Fixture &f = fixture(int(state.range(0)));
+    ratioTurns(state, f, state.range(1) == 0 ? f.incoherent : f.camera,
+               state.range(1) == 0 ? f.incoherentTmax : f.cameraTmax, state.range(2) == 1);
+}
+
+// BM_Ratio over one class of the rays, repeated to the set's size: those that miss the grid's
+// box (class 0), those that enter it and hit nothing (1), and those that hit (2). Where the two
+// structures differ most shows which part of a query to work on.
+void BM_RatioByClass(benchmark::State &state) {
+    Fixture &f = fixture(int(state.range(0)));
+    const std::vector<Ray> &all = state.range(1) == 0 ? f.incoherent : f.camera;
+    const float tmax = state.range(1) == 0 ? f.incoherentTmax : f.cameraTmax;
+    const bool any = state.range(2) == 1;
+    const BBox box = f.grid.bounds();
+    std::vector<Ray> rays;
+    for (const Ray &r : all) {
+        float t0 = 0.0f, t1 = tmax;
+        for (int a = 0; a < 3; ++a) {
+            const float inv = 1.0f / r.direction[a];
+            float ta = (box.min[a] - r.origin[a]) * inv, tb = (box.max[a] - r.origin[a]) * inv;
+            if (ta > tb) std::swap(ta, tb);
+            t0 = std::max(t0, ta), t1 = std::min(t1, tb);
+        }
+        Hit h;
+        const bool hit = any ? f.grid.occluded(r, tmax, nullptr) : f.grid.intersect(r, h, nullptr);
+        if ((t0 <= t1 ? (hit ? 2 : 1) : 0) == state.range(3)) rays.push_back(r);
+    }
+    state.counters["classShare"] = double(rays.size()) / double(all.size());
+    if (rays.empty()) {
+        state.SkipWithError("no ray of this class");
+        return;
+    }
+    for (size_t i = 0; rays.size() < all.size(); ++i) rays.push_back(rays[i]);
+    ratioTurns(state, f, rays, tmax, any);
 }
 #endif
 
@@ -329,5 +364,8 @@ BENCHMARK(BM_Embree)->Apply(rayArgs);
 BENCHMARK(BM_Ratio)
     ->ArgNames({"mesh", "camera", "occlusion"})
     ->ArgsProduct({{0, 1}, {0, 1}, {0, 1}});
+BENCHMARK(BM_RatioByClass)
+    ->ArgNames({"mesh", "camera", "occlusion", "class"})
+    ->ArgsProduct({{0, 1}, {0, 1}, {0, 1}, {0, 1, 2}});
 #endif
 BENCHMARK_MAIN();
