@@ -536,10 +536,11 @@ void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t 
     uint32_t first = uint32_t(groups_.size());
     for (size_t g = 0; g < groupCount; ++g) {
         PacketGroup group;
-        group.count = uint32_t(std::min<size_t>(4, used.size() - 4 * g));
+        const uint32_t count = uint32_t(std::min<size_t>(4, used.size() - 4 * g));
+        group.lanes = (1u << count) - 1u;
         group.run = uint32_t(groupCount - g);
         for (uint32_t j = 0; j < 4; ++j) {
-            const auto &[p, b] = used[4 * g + std::min(j, group.count - 1)];
+            const auto &[p, b] = used[4 * g + std::min(j, count - 1)];
             for (int a = 0; a < 3; ++a) {
                 group.lo[a][j] = quantise(std::max(b.min[a] - pad, cell.min[a] - pad), a, false);
                 group.hi[a][j] = quantise(std::min(b.max[a] + pad, cell.max[a] + pad), a, true);
@@ -668,6 +669,8 @@ bool instanceRay(const IntersectInstanceGrid &inst, const TraceRay &world, Trace
 
 namespace {
 
+constexpr float kInfinity = std::numeric_limits<float>::infinity();
+
 // Runs the packet kernel on packet k of the store and keeps the closest lane hit in the state.
 // The last packet of a store whose size is not a multiple of four is completed with lanes that
 // never hit.
@@ -693,17 +696,19 @@ __attribute__((always_inline)) inline bool testPacket(const PrimitiveStore &stor
         pk = IntersectSSETriangle::load(last);
     }
     float4 t, u, v;
-    int mask = intersectPacket(pk, r, s.limit, t, u, v);
+    const float4 lanes = intersectPacketLanes(pk, r, s.limit, t, u, v);
+    const int mask = movemask(lanes);
     if (!mask) return false;
     if constexpr (kAny) return true;
-    alignas(16) float ts[4], us[4], vs[4];
-    _mm_store_ps(ts, t);
-    int lane = -1;
-    for (int i = 0; i < 4; ++i)
-        if ((mask >> i & 1) && (lane < 0 || ts[i] < ts[lane])) lane = i;
+    // The nearest hit lane (of equally near ones the lowest), without a branch per lane.
+    const __m128 near = _mm_or_ps(_mm_and_ps(lanes, t), _mm_andnot_ps(lanes, _mm_set1_ps(kInfinity)));
+    __m128 m = _mm_min_ps(near, _mm_shuffle_ps(near, near, _MM_SHUFFLE(1, 0, 3, 2)));
+    m = _mm_min_ps(m, _mm_shuffle_ps(m, m, _MM_SHUFFLE(2, 3, 0, 1)));
+    const int lane = __builtin_ctz(_mm_movemask_ps(_mm_cmpeq_ps(near, m)) & mask);
+    alignas(16) float us[4], vs[4];
     _mm_store_ps(us, u);
     _mm_store_ps(vs, v);
-    s.limit = ts[lane];
+    s.limit = _mm_cvtss_f32(m);
     s.u = us[lane], s.v = vs[lane];
     s.kind = kItemTriangle;
     s.prim = k * 4 + uint32_t(lane);
@@ -711,22 +716,41 @@ __attribute__((always_inline)) inline bool testPacket(const PrimitiveStore &stor
     return true;
 }
 
-// Tests candidate packets (their box entry distances in tn) nearest first, until the nearest
-// left is entered beyond the closest hit found. True when a packet was hit.
+// Starts fetching packet k (three cache lines when the store is line-aligned).
+inline void prefetchPacket(const PrimitiveStore &store, uint32_t k) {
+    const char *p = reinterpret_cast<const char *>(store.triangles.data() + size_t(k) * 4);
+    __builtin_prefetch(p);
+    __builtin_prefetch(p + 64);
+    __builtin_prefetch(p + 128);
+}
+
+// Closest-hit queries test the packets of a cell of up to four groups nearest box first: lane
+// 4 i + j names packet j of the cell's group i, and the bit of a lane in a candidate mask says
+// that the ray passes through its box. The nearest candidate is tested next (of equally near
+// ones the lowest lane), until the nearest left is entered beyond the closest hit found. Both
+// the four-wide and the eight-wide paths keep this order, so that they report the same hit.
+constexpr uint32_t kMaxNearestGroups = 4;
+
+// The order above with the box entry distances of the lanes in tn. Starts fetching every
+// candidate's packet first, so that their misses overlap. True when a packet was hit.
 __attribute__((always_inline)) inline bool testNearestFirst(const PrimitiveStore &store,
-                                                            float *tn, uint32_t *packet,
-                                                            uint32_t count, const TraceRay &r,
+                                                            const PacketGroup *g, const float *tn,
+                                                            uint32_t cand, const TraceRay &r,
                                                             TraceState &s) {
+    for (uint32_t m = cand; m; m &= m - 1) {
+        const uint32_t lane = uint32_t(__builtin_ctz(m));
+        prefetchPacket(store, g[lane >> 2].packet[lane & 3]);
+    }
     bool hit = false;
-    while (count) {
-        uint32_t best = 0;
-        for (uint32_t i = 1; i < count; ++i)
-            if (tn[i] < tn[best]) best = i;
+    while (cand) {
+        uint32_t best = uint32_t(__builtin_ctz(cand));
+        for (uint32_t m = cand & (cand - 1); m; m &= m - 1) {
+            const uint32_t lane = uint32_t(__builtin_ctz(m));
+            if (tn[lane] < tn[best]) best = lane;
+        }
         if (!(tn[best] <= s.limit)) break;
-        uint32_t k = packet[best];
-        --count;
-        tn[best] = tn[count], packet[best] = packet[count];
-        if (testPacket<false>(store, k, r, s)) hit = true;
+        cand &= ~(1u << best);
+        if (testPacket<false>(store, g[best >> 2].packet[best & 3], r, s)) hit = true;
     }
     return hit;
 }
@@ -741,14 +765,6 @@ __attribute__((always_inline)) inline uint32_t prefetchGroupRun(const PacketGrou
     const uint32_t n = g->run;
     for (uint32_t i = 3; i < n; ++i) __builtin_prefetch(g + i);
     return n;
-}
-
-// Starts fetching packet k (three cache lines when the store is line-aligned).
-inline void prefetchPacket(const PrimitiveStore &store, uint32_t k) {
-    const char *p = reinterpret_cast<const char *>(store.triangles.data() + size_t(k) * 4);
-    __builtin_prefetch(p);
-    __builtin_prefetch(p + 64);
-    __builtin_prefetch(p + 128);
 }
 
 // Lanes of the group whose box the ray passes through between 0 and the limit, and the
@@ -776,7 +792,7 @@ inline int groupMask(const PacketGroup &g, const GroupFrame &f, float limit, flo
                        _mm_max_ps(_mm_min_ps(t0z, t1z), float4::zero()));
     float4 tfar = _mm_min_ps(_mm_min_ps(_mm_max_ps(t0x, t1x), _mm_max_ps(t0y, t1y)),
                              _mm_min_ps(_mm_max_ps(t0z, t1z), float4(limit)));
-    return movemask(_mm_cmple_ps(tnear, tfar)) & ((1 << g.count) - 1);
+    return movemask(_mm_cmple_ps(tnear, tfar)) & int(g.lanes);
 }
 
 }  // namespace
@@ -794,26 +810,15 @@ bool Grid::testGroups(uint32_t index, const TraceRay &r, TraceState &s, const Ve
     if constexpr (!kAny) {
         // Closest hit: the boxes the ray passes through, nearest first; a hit ends the cell's
         // tests at the first box entered beyond it.
-        constexpr uint32_t kMaxCandidates = 16;
-        if (n * 4 <= kMaxCandidates) {
-            alignas(16) float tn[kMaxCandidates];
-            uint32_t packet[kMaxCandidates], count = 0;
-            for (; n > 0; --n, ++g) {
+        if (n <= kMaxNearestGroups) {
+            alignas(16) float tn[4 * kMaxNearestGroups];
+            uint32_t cand = 0;
+            for (uint32_t i = 0; i < n; ++i) {
                 float4 tnear;
-                int mask = groupMask(*g, f, s.limit, tnear);
-                _mm_storeu_ps(tn + count, tnear);
-                // Keep the lanes passed through, in place (a kept lane never moves up), and start
-                // fetching their packets, so that the misses overlap.
-                uint32_t kept = count;
-                for (int m = mask; m; m &= m - 1) {
-                    int lane = __builtin_ctz(m);
-                    prefetchPacket(*store_, g->packet[lane]);
-                    tn[kept] = tn[count + uint32_t(lane)];
-                    packet[kept++] = g->packet[lane];
-                }
-                count = kept;
+                cand |= uint32_t(groupMask(g[i], f, s.limit, tnear)) << (4 * i);
+                _mm_store_ps(tn + 4 * i, tnear);
             }
-            return testNearestFirst(*store_, tn, packet, count, r, s);
+            return testNearestFirst(*store_, g, tn, cand, r, s);
         }
     }
     for (; n > 0; --n, ++g) {
@@ -885,9 +890,8 @@ OX_WIDE_INLINE int groupPairMask(const PacketGroup &g0, const PacketGroup *g1, c
                           _mm256_max_ps(_mm256_min_ps(t0z, t1z), _mm256_setzero_ps()));
     __m256 tfar = _mm256_min_ps(_mm256_min_ps(_mm256_max_ps(t0x, t1x), _mm256_max_ps(t0y, t1y)),
                                 _mm256_min_ps(_mm256_max_ps(t0z, t1z), _mm256_set1_ps(limit)));
-    int lanes = (1 << g0.count) - 1;
-    if (g1) lanes |= ((1 << g1->count) - 1) << 4;
-    return _mm256_movemask_ps(_mm256_cmp_ps(tnear, tfar, _CMP_LE_OS)) & lanes;
+    const uint32_t lanes = g0.lanes | (g1 ? g1->lanes : 0u) << 4;
+    return _mm256_movemask_ps(_mm256_cmp_ps(tnear, tfar, _CMP_LE_OS)) & int(lanes);
 }
 
 // True when packet k0 or k1 holds a hit below the limit. Both are tested together unless one is
@@ -915,26 +919,17 @@ __attribute__((target("avx2"))) bool Grid::closestInGroupsWide(uint32_t index, c
     uint32_t n;
     const WideFrame f = openGroupRun(g, n, frameStep_, frame, r);
     bool hit = false;
-    constexpr uint32_t kMaxCandidates = 16;
-    if (n * 4 <= kMaxCandidates) {
-        alignas(32) float tn[kMaxCandidates];
-        uint32_t packet[kMaxCandidates], count = 0;
+    if (n <= kMaxNearestGroups) {
+        alignas(32) float tn[4 * kMaxNearestGroups];
+        uint32_t cand = 0;
         for (uint32_t i = 0; i < n; i += 2) {
-            const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};
             __m256 tnear;
-            int mask = groupPairMask(*pair[0], pair[1], f, s.limit, tnear);
-            _mm256_storeu_ps(tn + count, tnear);
-            uint32_t kept = count;
-            for (int m = mask; m; m &= m - 1) {
-                int lane = __builtin_ctz(m);
-                uint32_t k = pair[lane >> 2]->packet[lane & 3];
-                prefetchPacket(*store_, k);
-                tn[kept] = tn[count + uint32_t(lane)];
-                packet[kept++] = k;
-            }
-            count = kept;
+            cand |= uint32_t(groupPairMask(g[i], i + 1 < n ? g + i + 1 : nullptr, f, s.limit,
+                                           tnear))
+                    << (4 * i);
+            _mm256_store_ps(tn + 4 * i, tnear);
         }
-        return testNearestFirst(*store_, tn, packet, count, r, s);
+        return testNearestFirst(*store_, g, tn, cand, r, s);
     }
     for (uint32_t i = 0; i < n; i += 2) {
         const PacketGroup *pair[2] = {g + i, i + 1 < n ? g + i + 1 : nullptr};

@@ -37,7 +37,7 @@ struct alignas(16) PacketGroup {
     uint8_t hi[3][4];
     uint32_t packet[4] = {0, 0, 0, 0};  ///< Packet indexes.
     uint32_t run = 1;                   ///< Groups of the cell from this one on.
-    uint32_t count = 0;                 ///< Number of packets (1 to 4).
+    uint32_t lanes = 0;  ///< Bit j set for each packet slot j in use (the first one to four).
 };
 static_assert(sizeof(PacketGroup) == 48, "three groups to two cache lines");
 constexpr uint32_t kItemIndexBits = 29;

@@ -173,12 +173,12 @@ struct IntersectSSETriangle {
     }
 };
 
-/// Tests the four lanes; returns the lane bit mask of hits with 1e-6 < t < tmax. Lanes with NaN
-/// corners never hit.
-__attribute__((always_inline)) inline int intersectPacket(const IntersectSSETriangle &pk,
-                                                          const TraceRay &r, float tmax,
-                                                          float4 &tOut, float4 &uOut,
-                                                          float4 &vOut) {
+/// Tests the four lanes; returns all ones in the lanes that hit with 1e-6 < t < tmax. Lanes with
+/// NaN corners never hit.
+__attribute__((always_inline)) inline float4 intersectPacketLanes(const IntersectSSETriangle &pk,
+                                                                  const TraceRay &r, float tmax,
+                                                                  float4 &tOut, float4 &uOut,
+                                                                  float4 &vOut) {
     int4 flags = (pk.flags & r.flagKeep) | r.flagSet;
     int4 zero(0);
     // Lanes whose flags lack every required bit are invisible.
@@ -209,7 +209,15 @@ __attribute__((always_inline)) inline int intersectPacket(const IntersectSSETria
     miss = miss | ((u + v) > float4(1.0f));
     float4 hit = andNot(miss, (t > float4(kMinHitDistance)) & (t < float4(tmax)));
     tOut = t, uOut = u, vOut = v;
-    return movemask(hit);
+    return hit;
+}
+
+/// intersectPacketLanes as a lane bit mask.
+__attribute__((always_inline)) inline int intersectPacket(const IntersectSSETriangle &pk,
+                                                          const TraceRay &r, float tmax,
+                                                          float4 &tOut, float4 &uOut,
+                                                          float4 &vOut) {
+    return movemask(intersectPacketLanes(pk, r, tmax, tOut, uOut, vOut));
 }
 
 }  // namespace ox
