@@ -1282,30 +1282,38 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                                   ? uint32_t(kWalkDistance[word >> shift & 7])
                                   : 0u;
         if (dist == 0) {
-            const uint32_t *first = cells + cell, *last = first + 1;
-            if ((word >> kItemIndexBits) == kItemList) {
-                const uint32_t *list = items + (word & kItemIndexMask);
-                first = list + 1;
-                last = first + *list;
-            }
-            // Several items: start fetching the boxes and packets of all of them at once.
-            if (last - first > 1)
-                for (const uint32_t *k = first; k != last; ++k) {
-                    uint32_t kind = *k >> kItemIndexBits;
-                    const char *p = nullptr;
-                    if (kind == kItemGroup)
-                        p = reinterpret_cast<const char *>(&groups_[*k & kItemIndexMask]);
-                    else if (kind == kItemPacket)
-                        p = reinterpret_cast<const char *>(store_->triangles.data() +
-                                                           size_t(*k & kItemIndexMask) * 4);
-                    if (p) {
-                        __builtin_prefetch(p);
-                        __builtin_prefetch(p + 64);
-                    }
+            const Vec3 frame =
+                frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead);
+            bool hitHere;
+            if ((word >> kItemIndexBits) == kItemGroup && r.wide) {
+                // Most occupied cells name their groups: no item dispatch.
+                hitHere = kAny ? anyHitInGroupsWide(word & kItemIndexMask, r, s, frame)
+                               : closestInGroupsWide(word & kItemIndexMask, r, s, frame);
+            } else {
+                const uint32_t *first = cells + cell, *last = first + 1;
+                if ((word >> kItemIndexBits) == kItemList) {
+                    const uint32_t *list = items + (word & kItemIndexMask);
+                    first = list + 1;
+                    last = first + *list;
                 }
-            if (testItems<kAny>(
-                    r, s, first, last,
-                    frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead))) {
+                // Several items: start fetching the boxes and packets of all of them at once.
+                if (last - first > 1)
+                    for (const uint32_t *k = first; k != last; ++k) {
+                        uint32_t kind = *k >> kItemIndexBits;
+                        const char *p = nullptr;
+                        if (kind == kItemGroup)
+                            p = reinterpret_cast<const char *>(&groups_[*k & kItemIndexMask]);
+                        else if (kind == kItemPacket)
+                            p = reinterpret_cast<const char *>(store_->triangles.data() +
+                                                               size_t(*k & kItemIndexMask) * 4);
+                        if (p) {
+                            __builtin_prefetch(p);
+                            __builtin_prefetch(p + 64);
+                        }
+                    }
+                hitHere = testItems<kAny>(r, s, first, last, frame);
+            }
+            if (hitHere) {
                 if constexpr (kAny) return true;
                 found = true;
             }
