@@ -1,6 +1,7 @@
 #include "raytrace/grid.h"
 
 #include <algorithm>
+#include <bit>
 #include <cmath>
 #include <cstring>
 #include <limits>
@@ -32,52 +33,93 @@ D3 crossD(const D3 &a, const D3 &b) {
 }
 double dotD(const D3 &a, const D3 &b) { return a.x * b.x + a.y * b.y + a.z * b.z; }
 
-// Separating-axis test of a triangle against boxes (the box faces, the nine edge cross axes and
-// the triangle plane), in double precision. What depends only on the triangle is computed once:
-// the projections of its corners on every axis.
+// Separating-axis test of a triangle against boxes in double precision, on the axes that can
+// separate them. Along a box axis on which the triangle's extent lies inside every box tested
+// ("held" axes), that face axis never separates, and one held axis c reduces the test to the
+// plane across it: the other two face axes and the edge normals c x edge (the triangle meets
+// the box exactly when its shadow in that plane meets the box's). With two held axes only the
+// third face axis is left. Otherwise the test takes all of them: the face axes, the nine edge
+// cross axes and the triangle plane. Each edge cross axis has a zero component, left out of its
+// products (the sums are the same). What depends only on the triangle is computed once.
 class TriangleBoxTest {
 public:
-    TriangleBoxTest(const Vec3 &a, const Vec3 &b, const Vec3 &c) {
-        const D3 v[3] = {{a.x, a.y, a.z}, {b.x, b.y, b.z}, {c.x, c.y, c.z}};
+    /// free: bit a set when the triangle's extent along axis a may reach beyond the boxes'.
+    TriangleBoxTest(const Vec3 &a, const Vec3 &b, const Vec3 &c, uint32_t free) : free_(free) {
         for (int axis = 0; axis < 3; ++axis) {
-            lo_[axis] = std::min({v[0][axis], v[1][axis], v[2][axis]});
-            hi_[axis] = std::max({v[0][axis], v[1][axis], v[2][axis]});
+            lo_[axis] = std::min({a[axis], b[axis], c[axis]});
+            hi_[axis] = std::max({a[axis], b[axis], c[axis]});
         }
+        const int freeCount = std::popcount(free);
+        if (freeCount == 1) return;
+        const D3 v[3] = {{a.x, a.y, a.z}, {b.x, b.y, b.z}, {c.x, c.y, c.z}};
         const D3 e[3] = {sub(v[1], v[0]), sub(v[2], v[1]), sub(v[0], v[2])};
-        const D3 units[3] = {{1, 0, 0}, {0, 1, 0}, {0, 0, 1}};
-        int k = 0;
-        for (const D3 &edge : e)
-            for (const D3 &u : units) setAxis(k++, crossD(u, edge), v);
-        setAxis(9, crossD(e[0], e[1]), v);
+        for (int g = 0; g < 3; ++g) {
+            if (freeCount == 2 && (free >> g & 1)) continue;
+            CrossAxes &x = cross_[groups_++];
+            // Unit axis g crossed with the edge: (0, -e.z, e.y), (e.z, 0, -e.x), (-e.y, e.x, 0).
+            x.u = g == 0 ? 1 : 0;
+            x.w = g == 2 ? 1 : 2;
+            for (int k = 0; k < 3; ++k) {
+                const D3 &d = e[k];
+                x.p[k] = g == 0 ? -d.z : (g == 1 ? d.z : -d.y);
+                x.q[k] = g == 0 ? d.y : (g == 1 ? -d.x : d.x);
+                double p0 = v[0][x.u] * x.p[k] + v[0][x.w] * x.q[k];
+                double p1 = v[1][x.u] * x.p[k] + v[1][x.w] * x.q[k];
+                double p2 = v[2][x.u] * x.p[k] + v[2][x.w] * x.q[k];
+                x.min[k] = std::min({p0, p1, p2});
+                x.max[k] = std::max({p0, p1, p2});
+            }
+        }
+        if (freeCount == 3) {
+            normal_ = crossD(e[0], e[1]);
+            double p0 = dotD(v[0], normal_), p1 = dotD(v[1], normal_), p2 = dotD(v[2], normal_);
+            normalMin_ = std::min({p0, p1, p2});
+            normalMax_ = std::max({p0, p1, p2});
+        }
     }
 
     /// True when the triangle and the box overlap.
     bool overlaps(const BBox &box) const {
-        const D3 lo{box.min.x, box.min.y, box.min.z}, hi{box.max.x, box.max.y, box.max.z};
         for (int axis = 0; axis < 3; ++axis)
-            if (lo_[axis] > hi[axis] || hi_[axis] < lo[axis]) return false;
-        const D3 center{0.5 * (lo.x + hi.x), 0.5 * (lo.y + hi.y), 0.5 * (lo.z + hi.z)};
-        const D3 h{0.5 * (hi.x - lo.x), 0.5 * (hi.y - lo.y), 0.5 * (hi.z - lo.z)};
-        for (int k = 0; k < 10; ++k) {
-            const D3 &l = axis_[k];
-            double c = dotD(center, l);
-            double r = h.x * std::fabs(l.x) + h.y * std::fabs(l.y) + h.z * std::fabs(l.z);
-            if (min_[k] - c > r || max_[k] - c < -r) return false;
+            if ((free_ >> axis & 1) && (lo_[axis] > box.max[axis] || hi_[axis] < box.min[axis]))
+                return false;
+        if (!groups_) return true;
+        const double lo[3] = {box.min.x, box.min.y, box.min.z};
+        const double hi[3] = {box.max.x, box.max.y, box.max.z};
+        const double center[3] = {0.5 * (lo[0] + hi[0]), 0.5 * (lo[1] + hi[1]),
+                                  0.5 * (lo[2] + hi[2])};
+        const double h[3] = {0.5 * (hi[0] - lo[0]), 0.5 * (hi[1] - lo[1]), 0.5 * (hi[2] - lo[2])};
+        for (int g = 0; g < groups_; ++g) {
+            const CrossAxes &x = cross_[g];
+            const double cu = center[x.u], cw = center[x.w], hu = h[x.u], hw = h[x.w];
+            for (int k = 0; k < 3; ++k) {
+                double c = cu * x.p[k] + cw * x.q[k];
+                double r = hu * std::fabs(x.p[k]) + hw * std::fabs(x.q[k]);
+                if (x.min[k] - c > r || x.max[k] - c < -r) return false;
+            }
+        }
+        if (groups_ == 3) {
+            const D3 &l = normal_;
+            double c = center[0] * l.x + center[1] * l.y + center[2] * l.z;
+            double r = h[0] * std::fabs(l.x) + h[1] * std::fabs(l.y) + h[2] * std::fabs(l.z);
+            if (normalMin_ - c > r || normalMax_ - c < -r) return false;
         }
         return true;
     }
 
 private:
-    void setAxis(int k, const D3 &l, const D3 *v) {
-        axis_[k] = l;
-        double p0 = dotD(v[0], l), p1 = dotD(v[1], l), p2 = dotD(v[2], l);
-        min_[k] = std::min({p0, p1, p2});
-        max_[k] = std::max({p0, p1, p2});
-    }
-
-    double lo_[3], hi_[3];
-    D3 axis_[10];
-    double min_[10], max_[10];
+    // The three axes (unit axis crossed with each edge) of one unit axis: components p and q
+    // along the box axes u and w, and the triangle's extent along each.
+    struct CrossAxes {
+        int u = 0, w = 0;
+        double p[3], q[3], min[3], max[3];
+    };
+    uint32_t free_;
+    int groups_ = 0;
+    float lo_[3], hi_[3];
+    CrossAxes cross_[3];
+    D3 normal_{0, 0, 0};
+    double normalMin_ = 0, normalMax_ = 0;
 };
 
 // Interleaves the low 21 bits of x, y and z.
@@ -334,10 +376,27 @@ BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
     return c;
 }
 
+const BBox *Grid::rowBoxes(const int64_t *lo, const int64_t *hi, std::vector<BBox> &rows) const {
+    // Per axis, the cells lo..hi grown by the margin, as cellBox and the margin give them (only
+    // the axis's own coordinates of each box are used).
+    rows.clear();
+    const int64_t n[3] = {nx_, ny_, nz_};
+    for (int a = 0; a < 3; ++a)
+        for (int64_t i = lo[a]; i <= hi[a]; ++i) {
+            BBox r;
+            r.min[a] = box_.min[a] + float(i) * cellSize_[a] - margin_;
+            r.max[a] =
+                (i + 1 == n[a] ? box_.max[a] : box_.min[a] + float(i + 1) * cellSize_[a]) + margin_;
+            rows.push_back(r);
+        }
+    return rows.data();
+}
+
 void Grid::insertAll(const std::vector<uint32_t> &prims) {
     size_t ncells = size_t(nx_ * ny_ * nz_);
     std::vector<std::pair<uint32_t, uint32_t>> pairs;
     pairs.reserve(prims.size() * 2);
+    std::vector<BBox> rows;
     for (uint32_t code : prims) {
         BBox b = store_->bounds(code);
         int64_t lo[3], hi[3];
@@ -351,26 +410,36 @@ void Grid::insertAll(const std::vector<uint32_t> &prims) {
         }
         // Each covered cell, grown by the margin, is tested against the primitive (a triangle
         // exactly, anything else by its box).
-        const Vec3 m(margin_, margin_, margin_);
+        const BBox *grown = rowBoxes(lo, hi, rows);
+        const size_t spanX = size_t(hi[0] - lo[0] + 1), spanY = size_t(hi[1] - lo[1] + 1);
+        auto cellOf = [&](int64_t x, int64_t y, int64_t z) {
+            return BBox({grown[x - lo[0]].min.x, grown[spanX + y - lo[1]].min.y,
+                         grown[spanX + spanY + z - lo[2]].min.z},
+                        {grown[x - lo[0]].max.x, grown[spanX + y - lo[1]].max.y,
+                         grown[spanX + spanY + z - lo[2]].max.z});
+        };
         if ((code >> kItemIndexBits) == kItemTriangle) {
             const IntersectTriangle &t = store_->triangles[code & kItemIndexMask];
-            const TriangleBoxTest test(t.p0, t.p0 + t.e1, t.p0 + t.e2);
+            // Axes along which the triangle lies inside its one row of cells cannot separate.
+            uint32_t free = 0;
+            for (int a = 0; a < 3; ++a) {
+                const BBox &row = grown[a == 0 ? 0 : (a == 1 ? spanX : spanX + spanY)];
+                if (lo[a] != hi[a] || !(row.min[a] <= b.min[a] && b.max[a] <= row.max[a]))
+                    free |= 1u << a;
+            }
+            const TriangleBoxTest test(t.p0, t.p0 + t.e1, t.p0 + t.e2, free);
             for (int64_t z = lo[2]; z <= hi[2]; ++z)
                 for (int64_t y = lo[1]; y <= hi[1]; ++y)
-                    for (int64_t x = lo[0]; x <= hi[0]; ++x) {
-                        BBox cell = cellBox(x, y, z);
-                        if (test.overlaps(BBox(cell.min - m, cell.max + m)))
+                    for (int64_t x = lo[0]; x <= hi[0]; ++x)
+                        if (test.overlaps(cellOf(x, y, z)))
                             pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
-                    }
             continue;
         }
         for (int64_t z = lo[2]; z <= hi[2]; ++z)
             for (int64_t y = lo[1]; y <= hi[1]; ++y)
-                for (int64_t x = lo[0]; x <= hi[0]; ++x) {
-                    BBox cell = cellBox(x, y, z);
-                    if (boxesOverlap(b, BBox(cell.min - m, cell.max + m)))
+                for (int64_t x = lo[0]; x <= hi[0]; ++x)
+                    if (boxesOverlap(b, cellOf(x, y, z)))
                         pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
-                }
     }
     // Cell lists are indexed with 32 bits.
     if (pairs.size() > 0xFFFFFFFFull) throw std::length_error("too many cell references");

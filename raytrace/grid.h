@@ -175,6 +175,8 @@ private:
                  const GridParams &params, uint32_t depth, bool widenBox);
     void insertAll(const std::vector<uint32_t> &prims);
     BBox cellBox(int64_t x, int64_t y, int64_t z) const;
+    /// Grown cell bounds along each axis over lo[a]..hi[a], axis after axis, in rows.
+    const BBox *rowBoxes(const int64_t *lo, const int64_t *hi, std::vector<BBox> &rows) const;
     void refine();
     void finalize();
     int64_t cellCoord(float v, int axis) const;
