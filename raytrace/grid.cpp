@@ -1,5 +1,7 @@
 #include "raytrace/grid.h"
 
+#include <emmintrin.h>
+
 #include <algorithm>
 #include <bit>
 #include <cmath>
@@ -7,6 +9,7 @@
 #include <limits>
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 #include "core/message.h"
 #include "raytrace/intersect_wide.h"
@@ -17,11 +20,6 @@ namespace ox {
 namespace {
 
 constexpr double kMaxCells = double(1u << 28);
-
-bool boxesOverlap(const BBox &a, const BBox &b) {
-    return a.min.x <= b.max.x && a.max.x >= b.min.x && a.min.y <= b.max.y && a.max.y >= b.min.y &&
-           a.min.z <= b.max.z && a.max.z >= b.min.z;
-}
 
 struct D3 {
     double x, y, z;
@@ -40,14 +38,18 @@ double dotD(const D3 &a, const D3 &b) { return a.x * b.x + a.y * b.y + a.z * b.z
 // the box exactly when its shadow in that plane meets the box's). With two held axes only the
 // third face axis is left. Otherwise the test takes all of them: the face axes, the nine edge
 // cross axes and the triangle plane. Each edge cross axis has a zero component, left out of its
-// products (the sums are the same). What depends only on the triangle is computed once.
+// products (the sums are the same); the three axes of one unit axis are tested two lanes at a
+// time, each lane with the scalar operations. What depends only on the triangle is computed
+// once.
 class TriangleBoxTest {
 public:
     /// free: bit a set when the triangle's extent along axis a may reach beyond the boxes'.
-    TriangleBoxTest(const Vec3 &a, const Vec3 &b, const Vec3 &c, uint32_t free) : free_(free) {
+    TriangleBoxTest(const Vec3 &a, const Vec3 &b, const Vec3 &c, uint32_t free) {
+        constexpr float kInf = std::numeric_limits<float>::infinity();
         for (int axis = 0; axis < 3; ++axis) {
-            lo_[axis] = std::min({a[axis], b[axis], c[axis]});
-            hi_[axis] = std::max({a[axis], b[axis], c[axis]});
+            const bool tested = free >> axis & 1;
+            lo_[axis] = tested ? std::min({a[axis], b[axis], c[axis]}) : -kInf;
+            hi_[axis] = tested ? std::max({a[axis], b[axis], c[axis]}) : kInf;
         }
         const int freeCount = std::popcount(free);
         if (freeCount == 1) return;
@@ -61,11 +63,13 @@ public:
             x.w = g == 2 ? 1 : 2;
             for (int k = 0; k < 3; ++k) {
                 const D3 &d = e[k];
-                x.p[k] = g == 0 ? -d.z : (g == 1 ? d.z : -d.y);
-                x.q[k] = g == 0 ? d.y : (g == 1 ? -d.x : d.x);
-                double p0 = v[0][x.u] * x.p[k] + v[0][x.w] * x.q[k];
-                double p1 = v[1][x.u] * x.p[k] + v[1][x.w] * x.q[k];
-                double p2 = v[2][x.u] * x.p[k] + v[2][x.w] * x.q[k];
+                const double p = g == 0 ? -d.z : (g == 1 ? d.z : -d.y);
+                const double q = g == 0 ? d.y : (g == 1 ? -d.x : d.x);
+                const double p0 = v[0][x.u] * p + v[0][x.w] * q;
+                const double p1 = v[1][x.u] * p + v[1][x.w] * q;
+                const double p2 = v[2][x.u] * p + v[2][x.w] * q;
+                x.p[k] = p, x.q[k] = q;
+                x.absP[k] = std::fabs(p), x.absQ[k] = std::fabs(q);
                 x.min[k] = std::min({p0, p1, p2});
                 x.max[k] = std::max({p0, p1, p2});
             }
@@ -78,24 +82,37 @@ public:
         }
     }
 
+    /// The same test for a box (its face axes only).
+    explicit TriangleBoxTest(const BBox &b) {
+        for (int axis = 0; axis < 3; ++axis) lo_[axis] = b.min[axis], hi_[axis] = b.max[axis];
+    }
+
     /// True when the triangle and the box overlap.
     bool overlaps(const BBox &box) const {
-        for (int axis = 0; axis < 3; ++axis)
-            if ((free_ >> axis & 1) && (lo_[axis] > box.max[axis] || hi_[axis] < box.min[axis]))
-                return false;
+        if ((lo_[0] > box.max.x) | (hi_[0] < box.min.x) | (lo_[1] > box.max.y) |
+            (hi_[1] < box.min.y) | (lo_[2] > box.max.z) | (hi_[2] < box.min.z))
+            return false;
         if (!groups_) return true;
         const double lo[3] = {box.min.x, box.min.y, box.min.z};
         const double hi[3] = {box.max.x, box.max.y, box.max.z};
         const double center[3] = {0.5 * (lo[0] + hi[0]), 0.5 * (lo[1] + hi[1]),
                                   0.5 * (lo[2] + hi[2])};
         const double h[3] = {0.5 * (hi[0] - lo[0]), 0.5 * (hi[1] - lo[1]), 0.5 * (hi[2] - lo[2])};
+        const __m128d sign = _mm_set1_pd(-0.0);
         for (int g = 0; g < groups_; ++g) {
             const CrossAxes &x = cross_[g];
-            const double cu = center[x.u], cw = center[x.w], hu = h[x.u], hw = h[x.w];
-            for (int k = 0; k < 3; ++k) {
-                double c = cu * x.p[k] + cw * x.q[k];
-                double r = hu * std::fabs(x.p[k]) + hw * std::fabs(x.q[k]);
-                if (x.min[k] - c > r || x.max[k] - c < -r) return false;
+            const __m128d cu = _mm_set1_pd(center[x.u]), cw = _mm_set1_pd(center[x.w]);
+            const __m128d hu = _mm_set1_pd(h[x.u]), hw = _mm_set1_pd(h[x.w]);
+            for (int k = 0; k < 4; k += 2) {
+                // c = cu p + cw q, r = hu |p| + hw |q|; apart when min - c > r or max - c < -r.
+                const __m128d c = _mm_add_pd(_mm_mul_pd(cu, _mm_load_pd(x.p + k)),
+                                             _mm_mul_pd(cw, _mm_load_pd(x.q + k)));
+                const __m128d r = _mm_add_pd(_mm_mul_pd(hu, _mm_load_pd(x.absP + k)),
+                                             _mm_mul_pd(hw, _mm_load_pd(x.absQ + k)));
+                const __m128d apart = _mm_or_pd(
+                    _mm_cmpgt_pd(_mm_sub_pd(_mm_load_pd(x.min + k), c), r),
+                    _mm_cmplt_pd(_mm_sub_pd(_mm_load_pd(x.max + k), c), _mm_xor_pd(r, sign)));
+                if (_mm_movemask_pd(apart)) return false;
             }
         }
         if (groups_ == 3) {
@@ -109,12 +126,13 @@ public:
 
 private:
     // The three axes (unit axis crossed with each edge) of one unit axis: components p and q
-    // along the box axes u and w, and the triangle's extent along each.
+    // along the box axes u and w, and the triangle's extent along each. The fourth lane is
+    // zero throughout and never separates.
     struct CrossAxes {
         int u = 0, w = 0;
-        double p[3], q[3], min[3], max[3];
+        alignas(16) double p[4] = {}, q[4] = {}, absP[4] = {}, absQ[4] = {}, min[4] = {},
+                           max[4] = {};
     };
-    uint32_t free_;
     int groups_ = 0;
     float lo_[3], hi_[3];
     CrossAxes cross_[3];
@@ -192,14 +210,11 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
     // inside one, the triangles that reach into the same neighbours together, then the curve
     // over the centres. Neighbouring triangles share packets, a packet rarely spans two cells,
     // and a neighbour that a few of a cell's triangles reach finds them in few packets.
+    // Sort keys: the home cell's curve position, the reach bits (above the triangle's index,
+    // which stays below 2^29) and the curve position inside the cell.
     struct Keyed {
         uint64_t cell;
-        uint32_t reach, inside, tri;
-        bool operator<(const Keyed &o) const {
-            if (cell != o.cell) return cell < o.cell;
-            if (reach != o.reach) return reach < o.reach;
-            return inside != o.inside ? inside < o.inside : tri < o.tri;
-        }
+        uint32_t inside, reachAndTri;
     };
     // Position in cell units along an axis, clamped (NaN to 0) before any integer conversion.
     const double scale[3] = {ext.x > 0.0f ? cells[0] / ext.x : 0.0,
@@ -209,7 +224,8 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
         double f = (double(v) - box.min[a]) * scale[a];
         return f >= 0.0 ? (f < cells[a] ? f : cells[a] - 0.5) : 0.0;
     };
-    std::vector<Keyed> keyed(n);
+    std::vector<Keyed> keyed(n), spare(n);
+    uint64_t cellBits = 0;
     for (size_t i = 0; i < n; ++i) {
         const IntersectTriangle &t = triangles[i];
         Vec3 centre = t.p0 + (t.e1 + t.e2) * (1.0f / 3.0f);
@@ -222,21 +238,54 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
             q[a] = uint32_t(std::min(f, 1.0) * 1023.0);
             reach |= uint32_t(uint64_t(unit(b.max[a], a)) > c[a]) << a;
         }
-        keyed[i] = {morton3x21(c[0], c[1], c[2]), reach, morton3(q[0], q[1], q[2]), uint32_t(i)};
+        keyed[i] = {morton3x21(c[0], c[1], c[2]), morton3(q[0], q[1], q[2]),
+                    reach << kItemIndexBits | uint32_t(i)};
+        cellBits |= keyed[i].cell;
     }
-    std::sort(keyed.begin(), keyed.end());
+    // Stable radix sort from triangle order, least significant digit first (ties keep the
+    // earlier triangle first): the 30 bits inside, the 3 reach bits, the cell bits in use.
+    struct Digit {
+        int word, shift, bits;
+    };
+    std::vector<Digit> digits = {{0, 0, 10}, {0, 10, 10}, {0, 20, 10}, {1, kItemIndexBits, 3}};
+    for (int shift = 0; shift < int(std::bit_width(cellBits)); shift += 11)
+        digits.push_back({2, shift, 11});
+    std::vector<uint32_t> count(size_t(1) << 11);
+    for (const Digit &d : digits) {
+        auto digit = [&](const Keyed &k) {
+            uint64_t w = d.word == 0 ? k.inside : (d.word == 1 ? k.reachAndTri : k.cell);
+            return uint32_t(w >> d.shift) & ((1u << d.bits) - 1u);
+        };
+        std::fill(count.begin(), count.end(), 0u);
+        for (const Keyed &k : keyed) ++count[digit(k)];
+        if (count[digit(keyed[0])] == n) continue;  // one bucket: the order stays
+        uint32_t sum = 0;
+        for (uint32_t &c : count) sum += std::exchange(c, sum);
+        for (const Keyed &k : keyed) spare[count[digit(k)]++] = k;
+        keyed.swap(spare);
+    }
     // Gather into a second store: its reads are independent, so their misses overlap.
     std::vector<uint32_t> newIndex(n);
     decltype(triangles) sorted(n);
     for (size_t i = 0; i < n; ++i) {
-        if (i + 8 < n) __builtin_prefetch(&triangles[keyed[i + 8].tri]);
-        sorted[i] = triangles[keyed[i].tri];
-        newIndex[keyed[i].tri] = uint32_t(i);
+        if (i + 8 < n) __builtin_prefetch(&triangles[keyed[i + 8].reachAndTri & kItemIndexMask]);
+        uint32_t tri = keyed[i].reachAndTri & kItemIndexMask;
+        sorted[i] = triangles[tri];
+        newIndex[tri] = uint32_t(i);
     }
     triangles.swap(sorted);
+    // The renamed triangle codes go back in ascending order into the places that held triangle
+    // codes (other codes keep theirs): a cell then lists its triangles in store order.
+    std::vector<uint32_t> uses(n, 0);
+    for (uint32_t code : codes)
+        if ((code >> kItemIndexBits) == kItemTriangle) ++uses[newIndex[code & kItemIndexMask]];
+    size_t next = 0;
     for (uint32_t &code : codes)
-        if ((code >> kItemIndexBits) == kItemTriangle)
-            code = itemCode(kItemTriangle, newIndex[code & kItemIndexMask]);
+        if ((code >> kItemIndexBits) == kItemTriangle) {
+            while (!uses[next]) ++next;
+            --uses[next];
+            code = itemCode(kItemTriangle, uint32_t(next));
+        }
 }
 
 BBox Grid::widen(const BBox &box) {
@@ -357,15 +406,6 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     return true;
 }
 
-int64_t Grid::cellCoord(float v, int axis) const {
-    int64_t n = axis == 0 ? nx_ : axis == 1 ? ny_ : nz_;
-    float f = (v - box_.min[axis]) * invCellSize_[axis];
-    // Clamp in floating point first: NaN and huge values never reach the integer conversion.
-    // Above 2^24 cells n - 1 may round up to n in float: clamp the index again.
-    f = f >= 0.0f ? (f < float(n - 1) ? f : float(n - 1)) : 0.0f;
-    return std::min(int64_t(f), n - 1);  // truncation is floor for the non-negative values left
-}
-
 BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
     BBox c;
     c.min = {box_.min.x + float(x) * cellSize_.x, box_.min.y + float(y) * cellSize_.y,
@@ -376,70 +416,62 @@ BBox Grid::cellBox(int64_t x, int64_t y, int64_t z) const {
     return c;
 }
 
-const BBox *Grid::rowBoxes(const int64_t *lo, const int64_t *hi, std::vector<BBox> &rows) const {
-    // Per axis, the cells lo..hi grown by the margin, as cellBox and the margin give them (only
-    // the axis's own coordinates of each box are used).
-    rows.clear();
-    const int64_t n[3] = {nx_, ny_, nz_};
-    for (int a = 0; a < 3; ++a)
-        for (int64_t i = lo[a]; i <= hi[a]; ++i) {
-            BBox r;
-            r.min[a] = box_.min[a] + float(i) * cellSize_[a] - margin_;
-            r.max[a] =
-                (i + 1 == n[a] ? box_.max[a] : box_.min[a] + float(i + 1) * cellSize_[a]) + margin_;
-            rows.push_back(r);
-        }
-    return rows.data();
-}
-
 void Grid::insertAll(const std::vector<uint32_t> &prims) {
     size_t ncells = size_t(nx_ * ny_ * nz_);
     std::vector<std::pair<uint32_t, uint32_t>> pairs;
     pairs.reserve(prims.size() * 2);
-    std::vector<BBox> rows;
+    const int64_t n[3] = {nx_, ny_, nz_};
+    const float lower[3] = {box_.min.x, box_.min.y, box_.min.z};
+    const float upper[3] = {box_.max.x, box_.max.y, box_.max.z};
+    const float size[3] = {cellSize_.x, cellSize_.y, cellSize_.z};
+    const float inverse[3] = {invCellSize_.x, invCellSize_.y, invCellSize_.z};
+    // cellCoord, and the bounds of cellBox grown by the margin, along one axis.
+    auto coord = [&](float v, int a) {
+        float f = (v - lower[a]) * inverse[a];
+        f = f >= 0.0f ? (f < float(n[a] - 1) ? f : float(n[a] - 1)) : 0.0f;
+        return std::min(int64_t(f), n[a] - 1);
+    };
+    auto grownMin = [&](int a, int64_t i) { return lower[a] + float(i) * size[a] - margin_; };
+    auto grownMax = [&](int a, int64_t i) {
+        return (i + 1 == n[a] ? upper[a] : lower[a] + float(i + 1) * size[a]) + margin_;
+    };
     for (uint32_t code : prims) {
-        BBox b = store_->bounds(code);
+        const bool triangle = (code >> kItemIndexBits) == kItemTriangle;
+        const IntersectTriangle *t = triangle ? &store_->triangles[code & kItemIndexMask] : nullptr;
+        const BBox b = triangle ? t->bounds() : store_->bounds(code);
         int64_t lo[3], hi[3];
         for (int a = 0; a < 3; ++a) {
-            lo[a] = cellCoord(b.min[a] - margin_, a);
-            hi[a] = cellCoord(b.max[a] + margin_, a);
+            lo[a] = coord(b.min[a] - margin_, a);
+            hi[a] = coord(b.max[a] + margin_, a);
         }
         if (lo[0] == hi[0] && lo[1] == hi[1] && lo[2] == hi[2]) {
             pairs.emplace_back(uint32_t((lo[2] * ny_ + lo[1]) * nx_ + lo[0]), code);
             continue;
         }
         // Each covered cell, grown by the margin, is tested against the primitive (a triangle
-        // exactly, anything else by its box).
-        const BBox *grown = rowBoxes(lo, hi, rows);
-        const size_t spanX = size_t(hi[0] - lo[0] + 1), spanY = size_t(hi[1] - lo[1] + 1);
-        auto cellOf = [&](int64_t x, int64_t y, int64_t z) {
-            return BBox({grown[x - lo[0]].min.x, grown[spanX + y - lo[1]].min.y,
-                         grown[spanX + spanY + z - lo[2]].min.z},
-                        {grown[x - lo[0]].max.x, grown[spanX + y - lo[1]].max.y,
-                         grown[spanX + spanY + z - lo[2]].max.z});
-        };
-        if ((code >> kItemIndexBits) == kItemTriangle) {
-            const IntersectTriangle &t = store_->triangles[code & kItemIndexMask];
-            // Axes along which the triangle lies inside its one row of cells cannot separate.
-            uint32_t free = 0;
-            for (int a = 0; a < 3; ++a) {
-                const BBox &row = grown[a == 0 ? 0 : (a == 1 ? spanX : spanX + spanY)];
-                if (lo[a] != hi[a] || !(row.min[a] <= b.min[a] && b.max[a] <= row.max[a]))
-                    free |= 1u << a;
-            }
-            const TriangleBoxTest test(t.p0, t.p0 + t.e1, t.p0 + t.e2, free);
-            for (int64_t z = lo[2]; z <= hi[2]; ++z)
-                for (int64_t y = lo[1]; y <= hi[1]; ++y)
-                    for (int64_t x = lo[0]; x <= hi[0]; ++x)
-                        if (test.overlaps(cellOf(x, y, z)))
-                            pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
-            continue;
-        }
-        for (int64_t z = lo[2]; z <= hi[2]; ++z)
-            for (int64_t y = lo[1]; y <= hi[1]; ++y)
-                for (int64_t x = lo[0]; x <= hi[0]; ++x)
-                    if (boxesOverlap(b, cellOf(x, y, z)))
+        // exactly, anything else by its box). Axes along which a triangle lies inside its one
+        // row of cells cannot separate.
+        uint32_t free = 7;
+        if (triangle)
+            for (int a = 0; a < 3; ++a)
+                if (lo[a] == hi[a] && grownMin(a, lo[a]) <= b.min[a] &&
+                    b.max[a] <= grownMax(a, lo[a]))
+                    free &= ~(1u << a);
+        const TriangleBoxTest test =
+            triangle ? TriangleBoxTest(t->p0, t->p0 + t->e1, t->p0 + t->e2, free)
+                     : TriangleBoxTest(b);
+        BBox cell;
+        for (int64_t z = lo[2]; z <= hi[2]; ++z) {
+            cell.min.z = grownMin(2, z), cell.max.z = grownMax(2, z);
+            for (int64_t y = lo[1]; y <= hi[1]; ++y) {
+                cell.min.y = grownMin(1, y), cell.max.y = grownMax(1, y);
+                for (int64_t x = lo[0]; x <= hi[0]; ++x) {
+                    cell.min.x = grownMin(0, x), cell.max.x = grownMax(0, x);
+                    if (test.overlaps(cell))
                         pairs.emplace_back(uint32_t((z * ny_ + y) * nx_ + x), code);
+                }
+            }
+        }
     }
     // Cell lists are indexed with 32 bits.
     if (pairs.size() > 0xFFFFFFFFull) throw std::length_error("too many cell references");
@@ -554,14 +586,13 @@ void Grid::finalize() {
 
 void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z,
                      GroupScratch &scratch) {
-    // The packets holding the cell's triangles, each with the box of those triangles.
-    auto &byPacket = scratch.byPacket;
-    byPacket.clear();
-    for (uint32_t t : tris) byPacket.emplace_back(t >> 2, t);
-    std::sort(byPacket.begin(), byPacket.end());
+    // The packets holding the cell's triangles, each with the box of those triangles (packet k
+    // holds triangles 4k to 4k + 3, so triangle order is packet order).
+    if (!std::is_sorted(tris.begin(), tris.end())) std::sort(tris.begin(), tris.end());
     auto &used = scratch.used;
     used.clear();
-    for (const auto &[p, t] : byPacket) {
+    for (uint32_t t : tris) {
+        const uint32_t p = t >> 2;
         const IntersectTriangle &tri = store_->triangles[t];
         const Vec3 p1 = tri.p0 + tri.e1, p2 = tri.p0 + tri.e2;
         Vec3 lo, hi;
@@ -1450,3 +1481,4 @@ template bool Grid::traverse<false>(const TraceRay &, TraceState &) const;
 template bool Grid::traverse<true>(const TraceRay &, TraceState &) const;
 
 }  // namespace ox
+

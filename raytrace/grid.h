@@ -88,7 +88,8 @@ struct PrimitiveStore {
     size_t sizeBytes() const;
     /// Reorders the triangles along a space-filling curve over the cells of a grid of the given
     /// density (inside one cell along the same curve), so that four consecutive triangles lie
-    /// close together, and renames the triangle codes in codes to match. Deterministic: ties
+    /// close together, and renames the triangle codes in codes to match; the renamed codes are
+    /// put back in ascending order into the places that held triangle codes. Deterministic: ties
     /// keep the earlier triangle first.
     void sortForPackets(std::vector<uint32_t> &codes, float density);
 };
@@ -175,14 +176,10 @@ private:
                  const GridParams &params, uint32_t depth, bool widenBox);
     void insertAll(const std::vector<uint32_t> &prims);
     BBox cellBox(int64_t x, int64_t y, int64_t z) const;
-    /// Grown cell bounds along each axis over lo[a]..hi[a], axis after axis, in rows.
-    const BBox *rowBoxes(const int64_t *lo, const int64_t *hi, std::vector<BBox> &rows) const;
     void refine();
     void finalize();
-    int64_t cellCoord(float v, int axis) const;
     /// Build-time lists groupCell reuses from cell to cell.
     struct GroupScratch {
-        std::vector<std::pair<uint32_t, uint32_t>> byPacket;
         std::vector<std::pair<uint32_t, BBox>> used;
     };
     void groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t z,
