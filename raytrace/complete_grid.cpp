@@ -113,12 +113,6 @@ size_t addMotionTriangles(PrimitiveStore &store, std::vector<uint32_t> &codes,
     return skipped;
 }
 
-BBox unionOf(const PrimitiveStore &store, const std::vector<uint32_t> &codes) {
-    BBox b;
-    for (uint32_t c : codes) b.extend(store.bounds(c));
-    return b;
-}
-
 GridParams gridParams(const ADSParameters &p) {
     GridParams g;
     g.density = p.gridDensity;
@@ -269,7 +263,7 @@ bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,
                 skipped =
                     addTriangles(owned->store, shapeCodes, in.mesh, Mtx4(), false, 0u, kNoInstance);
                 if (gp.sse) owned->store.sortForPackets(shapeCodes, gp.density);
-                if (!owned->grid.build(owned->store, shapeCodes, unionOf(owned->store, shapeCodes),
+                if (!owned->grid.build(owned->store, shapeCodes, owned->store.boundsOf(shapeCodes),
                                        gp, 0, true))
                     return false;
                 sg = owned.get();
@@ -320,9 +314,9 @@ bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,
         store_.sortForPackets(codes, gp.density);
         secondStore_.sortForPackets(secondCodes, gp.density);
     }
-    box_ = unionOf(store_, codes);
+    box_ = store_.boundsOf(codes);
     if (!grid_.build(store_, codes, box_, gp, 0, true)) return false;
-    if (!second_.build(secondStore_, secondCodes, unionOf(secondStore_, secondCodes), gp, 0, true))
+    if (!second_.build(secondStore_, secondCodes, secondStore_.boundsOf(secondCodes), gp, 0, true))
         return false;
 
     message(kMsgBench, 1, "Building ADS: %s", elapsedText(start).c_str());

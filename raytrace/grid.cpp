@@ -190,6 +190,28 @@ BBox PrimitiveStore::bounds(uint32_t code) const {
     }
 }
 
+namespace {
+
+// box.extend(b) for finite boxes, without the library calls: on equal values the same one as
+// fmin and fmax keep.
+void growBox(BBox &box, const BBox &b) {
+    box.min = {box.min.x < b.min.x ? box.min.x : b.min.x, box.min.y < b.min.y ? box.min.y : b.min.y,
+               box.min.z < b.min.z ? box.min.z : b.min.z};
+    box.max = {box.max.x > b.max.x ? box.max.x : b.max.x, box.max.y > b.max.y ? box.max.y : b.max.y,
+               box.max.z > b.max.z ? box.max.z : b.max.z};
+}
+
+}  // namespace
+
+BBox PrimitiveStore::boundsOf(const std::vector<uint32_t> &codes) const {
+    BBox box;
+    for (uint32_t code : codes)
+        growBox(box, (code >> kItemIndexBits) == kItemTriangle
+                         ? triangles[code & kItemIndexMask].bounds()
+                         : bounds(code));
+    return box;
+}
+
 size_t PrimitiveStore::sizeBytes() const {
     return triangles.capacity() * sizeof(IntersectTriangle) +
            motion.capacity() * sizeof(MotionTriangle) + motionCorners.capacity() * sizeof(Vec3) +
@@ -200,7 +222,7 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
     size_t n = triangles.size();
     if (n < 2) return;
     BBox box;
-    for (const IntersectTriangle &t : triangles) box.extend(t.bounds());
+    for (const IntersectTriangle &t : triangles) growBox(box, t.bounds());
     if (!Grid::boxUsable(box)) return;
     box = Grid::widen(box);
     Vec3 ext = box.extent();
@@ -573,7 +595,7 @@ void Grid::finalize() {
                          items_.begin() + cellBegin[c + 1]);
         }
     }
-    std::vector<uint32_t> occupied(cellBegin.size() - 1);
+    std::vector<uint8_t> occupied(cellBegin.size() - 1);
     for (size_t c = 0; c < ncells; ++c) occupied[c] = cellBegin[c + 1] != cellBegin[c];
     items_.swap(lists);
     computeDistances(occupied);
@@ -630,7 +652,12 @@ void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t 
     const Vec3 frame = frameOrigin(x, y, z);
     auto quantise = [&](float v, int a, bool up) {
         double q = (double(v) - double(frame[a])) / double(frameStep_[a]);
-        q = up ? std::ceil(q) + 1.0 : std::floor(q) - 1.0;
+        // Far outside the frame (or NaN) the step clamps to its end; inside, floor and ceiling
+        // through the integer part.
+        if (!(q > -8.0)) return uint8_t(0);
+        if (q > 264.0) return uint8_t(255);
+        const double whole = double(int32_t(q));
+        q = up ? whole + double(whole < q) + 1.0 : whole - double(whole > q) - 1.0;
         return uint8_t(q >= 0.0 ? (q <= 255.0 ? q : 255.0) : 0.0);
     };
     uint32_t first = uint32_t(groups_.size());
@@ -652,7 +679,34 @@ void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t 
     items_.push_back(itemCode(kItemGroup, first));
 }
 
-void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
+namespace {
+
+// out[i] = min(a[i], b[i], c[i]) for i < n, sixteen at a time.
+void minOfRows(const uint8_t *a, const uint8_t *b, const uint8_t *c, uint8_t *out, size_t n) {
+    size_t i = 0;
+    for (; i + 16 <= n; i += 16) {
+        auto load = [&](const uint8_t *p) {
+            return _mm_loadu_si128(reinterpret_cast<const __m128i *>(p + i));
+        };
+        _mm_storeu_si128(reinterpret_cast<__m128i *>(out + i),
+                         _mm_min_epu8(_mm_min_epu8(load(a), load(b)), load(c)));
+    }
+    if (n >= 16 && i < n) {
+        // The rest as one more block ending at n (out is none of the inputs).
+        i = n - 16;
+        auto load = [&](const uint8_t *p) {
+            return _mm_loadu_si128(reinterpret_cast<const __m128i *>(p + i));
+        };
+        _mm_storeu_si128(reinterpret_cast<__m128i *>(out + i),
+                         _mm_min_epu8(_mm_min_epu8(load(a), load(b)), load(c)));
+        return;
+    }
+    for (; i < n; ++i) out[i] = std::min({a[i], b[i], c[i]});
+}
+
+}  // namespace
+
+void Grid::computeDistances(const std::vector<uint8_t> &occupied) {
     // Per direction octant (signs of the ray direction), the side of the largest empty cube that
     // starts at the cell and extends the way the ray goes; cells beyond the grid count as empty.
     // One pass per octant against its direction: each cell takes one more than the smallest of
@@ -670,11 +724,13 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
             start[a] = s[a] > 0 ? n[a] - 1 : 0;
         }
         // Row by row: first the smallest of the six neighbours in the rows ahead (y, z or both
-        // one on), at x and at x one on, over the whole row at once; then along the row
-        // against its direction, the neighbour ahead in the row itself.
-        std::vector<uint8_t> ahead(static_cast<size_t>(nx_));
+        // one on), at x and at x one on, over the whole row at once (the smallest of the three
+        // rows, then of it and its neighbour along the ray); then along the row against its
+        // direction, the neighbour ahead in the row itself.
+        std::vector<uint8_t> three(static_cast<size_t>(nx_)), ahead(static_cast<size_t>(nx_));
         std::vector<uint8_t> none(static_cast<size_t>(nx_), static_cast<uint8_t>(kAhead));
         const int64_t sx = s[0];
+        const size_t rowLength = size_t(nx_);
         for (int64_t z = start[2]; z >= 0 && z < nz_; z -= s[2])
             for (int64_t y = start[1]; y >= 0 && y < ny_; y -= s[1]) {
                 const bool inY = y + s[1] >= 0 && y + s[1] < ny_;
@@ -685,19 +741,18 @@ void Grid::computeDistances(const std::vector<uint32_t> &occupied) {
                 const uint8_t *rows[3] = {inY ? row(y + s[1], z) : none.data(),
                                           inZ ? row(y, z + s[2]) : none.data(),
                                           inY && inZ ? row(y + s[1], z + s[2]) : none.data()};
-                uint8_t *m = ahead.data();
-                for (int64_t x = 0; x < nx_; ++x)
-                    m[x] = std::min({rows[0][x], rows[1][x], rows[2][x]});
+                uint8_t *t = three.data(), *m = ahead.data();
+                minOfRows(rows[0], rows[1], rows[2], t, rowLength);
                 // x one on along the ray (none beyond the row's end).
-                for (int k = 0; k < 3; ++k) {
-                    if (sx > 0) {
-                        for (int64_t x = 0; x + 1 < nx_; ++x) m[x] = std::min(m[x], rows[k][x + 1]);
-                    } else {
-                        for (int64_t x = nx_ - 1; x > 0; --x) m[x] = std::min(m[x], rows[k][x - 1]);
-                    }
+                if (sx > 0) {
+                    minOfRows(t, t + 1, t + 1, m, rowLength - 1);
+                    m[rowLength - 1] = t[rowLength - 1];
+                } else {
+                    m[0] = t[0];
+                    minOfRows(t + 1, t, t, m + 1, rowLength - 1);
                 }
                 uint8_t *out = row(y, z);
-                const uint32_t *occ = occupied.data() + size_t((z * ny_ + y) * nx_);
+                const uint8_t *occ = occupied.data() + size_t((z * ny_ + y) * nx_);
                 uint32_t prev = kAhead;  // the cell ahead in the row
                 for (int64_t x = start[0]; x >= 0 && x < nx_; x -= sx) {
                     uint32_t best = std::min<uint32_t>(prev, m[x]);

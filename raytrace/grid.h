@@ -84,6 +84,8 @@ struct PrimitiveStore {
 
     /// Box of the primitive an item code names.
     BBox bounds(uint32_t code) const;
+    /// Box of the primitives the item codes name (finite boxes, as stores hold).
+    BBox boundsOf(const std::vector<uint32_t> &codes) const;
     /// Bytes held.
     size_t sizeBytes() const;
     /// Reorders the triangles along a space-filling curve over the cells of a grid of the given
@@ -241,7 +243,7 @@ private:
     static constexpr int kFetchAhead = 6;
     static constexpr int64_t kFetchAheadMinCells = int64_t(1) << 18;
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> cells_;
-    void computeDistances(const std::vector<uint32_t> &occupied);
+    void computeDistances(const std::vector<uint8_t> &occupied);
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> items_;
     // Packets are the store's triangles four by four; cells name them through groups (or
     // directly when a cell needs a single packet).
