@@ -61,6 +61,7 @@ public:
             // Unit axis g crossed with the edge: (0, -e.z, e.y), (e.z, 0, -e.x), (-e.y, e.x, 0).
             x.u = g == 0 ? 1 : 0;
             x.w = g == 2 ? 1 : 2;
+            x.p[3] = x.q[3] = x.absP[3] = x.absQ[3] = x.min[3] = x.max[3] = 0.0;
             for (int k = 0; k < 3; ++k) {
                 const D3 &d = e[k];
                 const double p = g == 0 ? -d.z : (g == 1 ? d.z : -d.y);
@@ -130,8 +131,7 @@ private:
     // zero throughout and never separates.
     struct CrossAxes {
         int u = 0, w = 0;
-        alignas(16) double p[4] = {}, q[4] = {}, absP[4] = {}, absQ[4] = {}, min[4] = {},
-                           max[4] = {};
+        alignas(16) double p[4], q[4], absP[4], absQ[4], min[4], max[4];
     };
     int groups_ = 0;
     float lo_[3], hi_[3];
@@ -192,6 +192,26 @@ BBox PrimitiveStore::bounds(uint32_t code) const {
 
 namespace {
 
+// IntersectTriangle::bounds, written out so that it is inlined in the build's loops (the first
+// of equal values, as std::min and std::max over a list take it).
+inline BBox boxOf(const IntersectTriangle &t) {
+    const Vec3 p1 = t.p0 + t.e1, p2 = t.p0 + t.e2;
+    auto least = [](float a, float b, float c) {
+        float m = a;
+        if (b < m) m = b;
+        if (c < m) m = c;
+        return m;
+    };
+    auto most = [](float a, float b, float c) {
+        float m = a;
+        if (m < b) m = b;
+        if (m < c) m = c;
+        return m;
+    };
+    return {{least(t.p0.x, p1.x, p2.x), least(t.p0.y, p1.y, p2.y), least(t.p0.z, p1.z, p2.z)},
+            {most(t.p0.x, p1.x, p2.x), most(t.p0.y, p1.y, p2.y), most(t.p0.z, p1.z, p2.z)}};
+}
+
 // box.extend(b) for finite boxes, without the library calls: on equal values the same one as
 // fmin and fmax keep.
 void growBox(BBox &box, const BBox &b) {
@@ -207,7 +227,7 @@ BBox PrimitiveStore::boundsOf(const std::vector<uint32_t> &codes) const {
     BBox box;
     for (uint32_t code : codes)
         growBox(box, (code >> kItemIndexBits) == kItemTriangle
-                         ? triangles[code & kItemIndexMask].bounds()
+                         ? boxOf(triangles[code & kItemIndexMask])
                          : bounds(code));
     return box;
 }
@@ -222,7 +242,7 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
     size_t n = triangles.size();
     if (n < 2) return;
     BBox box;
-    for (const IntersectTriangle &t : triangles) growBox(box, t.bounds());
+    for (const IntersectTriangle &t : triangles) growBox(box, boxOf(t));
     if (!Grid::boxUsable(box)) return;
     box = Grid::widen(box);
     Vec3 ext = box.extent();
@@ -251,7 +271,7 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
     for (size_t i = 0; i < n; ++i) {
         const IntersectTriangle &t = triangles[i];
         Vec3 centre = t.p0 + (t.e1 + t.e2) * (1.0f / 3.0f);
-        BBox b = t.bounds();
+        BBox b = boxOf(t);
         uint64_t c[3];
         uint32_t q[3], reach = 0;
         for (int a = 0; a < 3; ++a) {
@@ -273,18 +293,25 @@ void PrimitiveStore::sortForPackets(std::vector<uint32_t> &codes, float density)
     for (int shift = 0; shift < int(std::bit_width(cellBits)); shift += 11)
         digits.push_back({2, shift, 11});
     std::vector<uint32_t> count(size_t(1) << 11);
-    for (const Digit &d : digits) {
+    auto pass = [&](const Digit &d, auto word) {
         auto digit = [&](const Keyed &k) {
-            uint64_t w = d.word == 0 ? k.inside : (d.word == 1 ? k.reachAndTri : k.cell);
-            return uint32_t(w >> d.shift) & ((1u << d.bits) - 1u);
+            return uint32_t(uint64_t(word(k)) >> d.shift) & ((1u << d.bits) - 1u);
         };
         std::fill(count.begin(), count.end(), 0u);
         for (const Keyed &k : keyed) ++count[digit(k)];
-        if (count[digit(keyed[0])] == n) continue;  // one bucket: the order stays
+        if (count[digit(keyed[0])] == n) return;  // one bucket: the order stays
         uint32_t sum = 0;
         for (uint32_t &c : count) sum += std::exchange(c, sum);
         for (const Keyed &k : keyed) spare[count[digit(k)]++] = k;
         keyed.swap(spare);
+    };
+    for (const Digit &d : digits) {
+        if (d.word == 0)
+            pass(d, [](const Keyed &k) { return k.inside; });
+        else if (d.word == 1)
+            pass(d, [](const Keyed &k) { return k.reachAndTri; });
+        else
+            pass(d, [](const Keyed &k) { return k.cell; });
     }
     // Gather into a second store: its reads are independent, so their misses overlap.
     std::vector<uint32_t> newIndex(n);
@@ -460,7 +487,7 @@ void Grid::insertAll(const std::vector<uint32_t> &prims) {
     for (uint32_t code : prims) {
         const bool triangle = (code >> kItemIndexBits) == kItemTriangle;
         const IntersectTriangle *t = triangle ? &store_->triangles[code & kItemIndexMask] : nullptr;
-        const BBox b = triangle ? t->bounds() : store_->bounds(code);
+        const BBox b = triangle ? boxOf(*t) : store_->bounds(code);
         int64_t lo[3], hi[3];
         for (int a = 0; a < 3; ++a) {
             lo[a] = coord(b.min[a] - margin_, a);
@@ -615,21 +642,15 @@ void Grid::groupCell(std::vector<uint32_t> &tris, int64_t x, int64_t y, int64_t 
     used.clear();
     for (uint32_t t : tris) {
         const uint32_t p = t >> 2;
-        const IntersectTriangle &tri = store_->triangles[t];
-        const Vec3 p1 = tri.p0 + tri.e1, p2 = tri.p0 + tri.e2;
-        Vec3 lo, hi;
-        for (int a = 0; a < 3; ++a) {
-            lo[a] = std::min({tri.p0[a], p1[a], p2[a]});
-            hi[a] = std::max({tri.p0[a], p1[a], p2[a]});
-        }
+        const BBox tb = boxOf(store_->triangles[t]);
         if (used.empty() || used.back().first != p) {
-            used.emplace_back(p, BBox(lo, hi));
+            used.emplace_back(p, tb);
         } else {
             BBox &b = used.back().second;
-            for (int a = 0; a < 3; ++a) {
-                b.min[a] = std::min(b.min[a], lo[a]);
-                b.max[a] = std::max(b.max[a], hi[a]);
-            }
+            b.min = {std::min(b.min.x, tb.min.x), std::min(b.min.y, tb.min.y),
+                     std::min(b.min.z, tb.min.z)};
+            b.max = {std::max(b.max.x, tb.max.x), std::max(b.max.y, tb.max.y),
+                     std::max(b.max.z, tb.max.z)};
         }
     }
     // Groups address packets with 29 bits; a structure that large keeps the remaining
