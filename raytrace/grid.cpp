@@ -1557,4 +1557,3 @@ template bool Grid::traverse<false>(const TraceRay &, TraceState &) const;
 template bool Grid::traverse<true>(const TraceRay &, TraceState &) const;
 
 }  // namespace ox
-

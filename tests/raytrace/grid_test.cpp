@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <array>
 #include <cmath>
 #include <limits>
 #include <map>
@@ -648,6 +650,255 @@ TEST(GridTest, RefinementFollowsDepthAndAcceptanceRules) {
     EXPECT_EQ(g.grid().cells().total(), 1);
     EXPECT_EQ(g.grid().nestedGridCount(), 0u);
     EXPECT_EQ(g.grid().stats().maxElements, 400u);
+}
+
+// Whether a triangle meets a closed box, by clipping the triangle against the box's six planes
+// in double precision (independent of the structure's separating-axis test).
+bool clippedOverlap(const Vec3 corners[3], const double lo[3], const double hi[3]) {
+    std::vector<std::array<double, 3>> poly, next;
+    for (int c = 0; c < 3; ++c) poly.push_back({corners[c].x, corners[c].y, corners[c].z});
+    for (int a = 0; a < 3 && !poly.empty(); ++a)
+        for (int side = 0; side < 2 && !poly.empty(); ++side) {
+            auto inside = [&](const std::array<double, 3> &p) {
+                return side == 0 ? p[a] >= lo[a] : p[a] <= hi[a];
+            };
+            const double plane = side == 0 ? lo[a] : hi[a];
+            next.clear();
+            for (size_t i = 0; i < poly.size(); ++i) {
+                const auto &p = poly[i], &q = poly[(i + 1) % poly.size()];
+                if (inside(p)) next.push_back(p);
+                if (inside(p) != inside(q)) {
+                    double f = (plane - p[a]) / (q[a] - p[a]);
+                    std::array<double, 3> x;
+                    for (int k = 0; k < 3; ++k) x[k] = p[k] + f * (q[k] - p[k]);
+                    x[a] = plane;
+                    next.push_back(x);
+                }
+            }
+            poly.swap(next);
+        }
+    return !poly.empty();
+}
+
+// Checks every cell of the grid and of its nested grids against every triangle: a cell that the
+// triangle meets clearly inside (the cell shrunk by 1e-4 of its size) must list it, one that
+// the triangle misses clearly (the cell grown by 5% of its smallest side, more than the cell
+// margin) must not. Counts the cases of each kind.
+void checkCellContents(const Grid &grid, const PrimitiveStore &store, size_t &held, size_t &apart) {
+    const GridResolution n = grid.cells();
+    const BBox box = grid.box();
+    const Vec3 size = grid.cellSize();
+    const float minSide = std::min({size.x, size.y, size.z});
+    for (int64_t z = 0; z < n.nz; ++z)
+        for (int64_t y = 0; y < n.ny; ++y)
+            for (int64_t x = 0; x < n.nx; ++x) {
+                const std::vector<uint32_t> items = grid.cellItems(x, y, z);
+                if (items.size() == 1 && (items[0] >> kItemIndexBits) == kItemChild) {
+                    checkCellContents(*grid.child(items[0] & kItemIndexMask), store, held, apart);
+                    continue;
+                }
+                const int64_t i[3] = {x, y, z}, last[3] = {n.nx - 1, n.ny - 1, n.nz - 1};
+                double lo[3], hi[3], inLo[3], inHi[3], outLo[3], outHi[3];
+                for (int a = 0; a < 3; ++a) {
+                    lo[a] = box.min[a] + float(i[a]) * size[a];
+                    hi[a] = i[a] == last[a] ? box.max[a] : box.min[a] + float(i[a] + 1) * size[a];
+                    inLo[a] = lo[a] + 1e-4 * (hi[a] - lo[a]);
+                    inHi[a] = hi[a] - 1e-4 * (hi[a] - lo[a]);
+                    outLo[a] = lo[a] - 0.05 * minSide;
+                    outHi[a] = hi[a] + 0.05 * minSide;
+                }
+                for (uint32_t k = 0; k < store.triangles.size(); ++k) {
+                    const IntersectTriangle &t = store.triangles[k];
+                    const Vec3 c[3] = {t.p0, t.p0 + t.e1, t.p0 + t.e2};
+                    const bool listed = std::find(items.begin(), items.end(),
+                                                  itemCode(kItemTriangle, k)) != items.end();
+                    if (clippedOverlap(c, inLo, inHi)) {
+                        ++held;
+                        ASSERT_TRUE(listed) << "triangle " << t.id << " missing from cell " << x
+                                            << " " << y << " " << z << " depth " << grid.depth();
+                    } else if (!clippedOverlap(c, outLo, outHi)) {
+                        ++apart;
+                        ASSERT_FALSE(listed) << "triangle " << t.id << " listed in far cell " << x
+                                             << " " << y << " " << z << " depth " << grid.depth();
+                    }
+                }
+            }
+}
+
+TEST(GridTest, CellsHoldExactlyTheTrianglesThatMeetThem) {
+    // Triangles of every shape the insertion treats apart: inside one cell, thin ones along one
+    // axis (one row of cells), flat ones across an axis (one layer), skewed ones through all
+    // three axes, long diagonal slivers whose box covers many cells they miss, degenerate ones
+    // (collinear corners) and ones on the grid's outer cells.
+    Rng rng(17);
+    PrimitiveStore store;
+    auto add = [&](Vec3 a, Vec3 b, Vec3 c) {
+        IntersectTriangle t;
+        t.p0 = a, t.e1 = b - a, t.e2 = c - a;
+        t.id = uint32_t(store.triangles.size());
+        store.triangles.push_back(t);
+    };
+    const BBox scene({-1, -1, -1}, {1, 1, 1});
+    for (int i = 0; i < 300; ++i) {
+        const Vec3 p = rng.inBox(scene);
+        const float s = i % 3 == 0 ? 0.02f : (i % 3 == 1 ? 0.2f : 0.9f);
+        auto jitter = [&](float e) {
+            return Vec3(rng.uniform(), rng.uniform(), rng.uniform()) * e;
+        };
+        const int a = i % 3;
+        Vec3 along;
+        along[a] = s;
+        switch (i % 6) {
+            case 0:  // thin along one axis
+                add(p, p + along + jitter(0.002f), p + along * 0.5f + jitter(0.004f));
+                break;
+            case 1: {  // flat across an axis
+                Vec3 q = p + jitter(s), r = p + jitter(s);
+                q[a] = r[a] = p[a];
+                add(p, q, r);
+                break;
+            }
+            case 2:  // any orientation
+                add(p, p + jitter(s) - jitter(s), p + jitter(s) - jitter(s));
+                break;
+            case 3: {  // long diagonal sliver
+                Vec3 d = rng.direction() * (2.0f * s);
+                add(p - d, p + d, p + d + jitter(0.01f));
+                break;
+            }
+            case 4: {  // collinear corners
+                Vec3 d = rng.direction() * s;
+                add(p, p + d, p + d * 2.0f);
+                break;
+            }
+            default:  // at the scene's edge
+                add({1.0f, p.y, p.z}, {1.0f - 0.1f * s, p.y + s, p.z}, {1.0f, p.y, p.z + s});
+                break;
+        }
+    }
+    std::vector<uint32_t> codes;
+    for (uint32_t k = 0; k < store.triangles.size(); ++k)
+        codes.push_back(itemCode(kItemTriangle, k));
+    for (uint32_t depth : {0u, 2u})
+        for (float density : {1.0f, 8.0f}) {
+            SCOPED_TRACE(::testing::Message() << "depth " << depth << " density " << density);
+            GridParams params;
+            params.sse = false;  // cells list their triangles themselves
+            params.maxDepth = depth;
+            params.threshold = 4;
+            params.density = density;
+            Grid grid;
+            ASSERT_TRUE(grid.build(store, codes, store.boundsOf(codes), params));
+            EXPECT_EQ(grid.nestedGridCount() > 0, depth > 0);
+            size_t held = 0, apart = 0;
+            checkCellContents(grid, store, held, apart);
+            EXPECT_GT(held, 500u);
+            EXPECT_GT(apart, 50000u);
+        }
+}
+
+TEST(PrimitiveStoreTest, PacketOrderKeepsTrianglesAndListsCodesInStoreOrder) {
+    // Small triangles on a long thin strip, shuffled, with duplicates, among moving-triangle and
+    // instance codes: the strip's grid has thousands of cells along x (curve positions of many
+    // radix digits).
+    Rng rng(23);
+    PrimitiveStore store;
+    std::vector<uint32_t> codes;
+    const int kCount = 6000;
+    for (int i = 0; i < kCount; ++i) {
+        IntersectTriangle t;
+        const float x = float((i * 7919) % kCount) * 0.01f;
+        t.p0 = {x, 0.1f * rng.uniform(), 0.1f * rng.uniform()};
+        t.e1 = {0.005f, 0.001f, 0.0f};
+        t.e2 = {0.0f, 0.001f, 0.004f};
+        t.id = uint32_t(i);
+        store.triangles.push_back(t);
+        codes.push_back(itemCode(kItemTriangle, uint32_t(i)));
+        if (i % 500 == 0) codes.push_back(itemCode(kItemMotion, uint32_t(i)));
+        if (i % 700 == 0) codes.push_back(itemCode(kItemInstance, uint32_t(i)));
+    }
+    // Copies of triangle 0 (same corners, later ids) must follow it in id order.
+    for (uint32_t k = 1; k <= 5; ++k) {
+        IntersectTriangle t = store.triangles[0];
+        t.id = uint32_t(kCount) + k - 1;
+        codes.insert(codes.begin() + 3 * k, itemCode(kItemTriangle, uint32_t(kCount) + k - 1));
+        store.triangles.push_back(t);
+    }
+    const std::vector<uint32_t> before = codes;
+    store.sortForPackets(codes, 1.0f);
+    ASSERT_EQ(codes.size(), before.size());
+    std::vector<char> seen(store.triangles.size(), 0);
+    uint32_t next = 0;
+    for (size_t k = 0; k < codes.size(); ++k) {
+        if ((before[k] >> kItemIndexBits) != kItemTriangle) {
+            EXPECT_EQ(codes[k], before[k]) << k;  // other codes stay in place
+            continue;
+        }
+        ASSERT_EQ(codes[k] >> kItemIndexBits, uint32_t(kItemTriangle));
+        EXPECT_EQ(codes[k] & kItemIndexMask, next++);  // ascending, each once
+        seen[store.triangles[codes[k] & kItemIndexMask].id] = 1;
+    }
+    EXPECT_EQ(next, store.triangles.size());
+    EXPECT_EQ(std::count(seen.begin(), seen.end(), 1), kCount + 5);
+    // Stable among equals: the copies right after the original, in id order.
+    size_t first = 0;
+    while (store.triangles[first].id != 0) ++first;
+    for (uint32_t k = 1; k <= 5; ++k) EXPECT_EQ(store.triangles[first + k].id, kCount + k - 1);
+    // Packets hold neighbours: the four of a packet lie within a few triangle spacings along
+    // the strip (shuffled, they would lie over half the strip apart).
+    double spread = 0.0;
+    for (size_t p = 0; p + 4 <= store.triangles.size(); p += 4) {
+        float lo = 1e30f, hi = -1e30f;
+        for (size_t k = p; k < p + 4; ++k)
+            lo = std::min(lo, store.triangles[k].p0.x), hi = std::max(hi, store.triangles[k].p0.x);
+        spread += hi - lo;
+    }
+    EXPECT_LT(spread / double(store.triangles.size() / 4), 0.5);
+}
+
+TEST(CompleteGridTest, RaysAimedAtSparseTrianglesFindThem) {
+    // Small triangles scattered through a box of mostly empty cells, in rows of all lengths
+    // (below, at and above sixteen cells), and rays from all over aimed at each triangle's
+    // centre: a walk that jumps too far over empty space misses them.
+    for (float density : {1.0f, 8.0f}) {
+        SCOPED_TRACE(::testing::Message() << "density " << density);
+        Rng rng(41);
+        Mesh m;
+        for (int i = 0; i < 1200; ++i) {
+            uint32_t base = uint32_t(m.positions.size());
+            Vec3 c = rng.inBox(BBox({-3, -1, -2}, {3, 1, 2}));
+            m.positions.insert(m.positions.end(), {c + Vec3(-0.003f, -0.002f, 0.001f),
+                                                   c + Vec3(0.003f, -0.001f, -0.002f),
+                                                   c + Vec3(0.0f, 0.003f, 0.002f)});
+            m.indices.insert(m.indices.end(), {base, base + 1, base + 2});
+        }
+        const std::vector<InstanceInput> ins = {instanceOf(m, 0, Mtx4(), kAllFlags, 0)};
+        ADSParameters p;
+        p.gridDensity = density;
+        p.gridMaxDepth = 0;
+        CompleteGrid grid;
+        ASSERT_TRUE(grid.build(ins, p));
+        const std::vector<Held> held = heldAs(ins, p);
+        int hits = 0;
+        for (uint32_t t = 0; t < m.triangleCount(); ++t) {
+            Vec3 centre = (m.positions[3 * t] + m.positions[3 * t + 1] + m.positions[3 * t + 2]) *
+                          (1.0f / 3.0f);
+            for (int k = 0; k < 4; ++k) {
+                Ray ray;
+                ray.origin = rng.inBox(BBox({-4, -2, -3}, {4, 2, 3}));
+                ray.direction = (centre - ray.origin).normalized();
+                Hit hit;
+                bool found = grid.intersect(ray, hit, kInfiniteDistance, nullptr);
+                Reference ref = bruteForce(ins, held, ray, kInfiniteDistance);
+                ASSERT_EQ(found, ref.t >= 0.0f) << "triangle " << t << " ray " << k;
+                if (found) {
+                    ASSERT_EQ(hit.t, ref.t) << "triangle " << t << " ray " << k;
+                }
+                hits += found;
+            }
+        }
+        EXPECT_GT(hits, 3600);
+    }
 }
 
 TEST(MotionBlurTest, MovingTrianglesFollowTheRayTime) {
