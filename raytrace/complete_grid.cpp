@@ -250,6 +250,7 @@ bool CompleteGrid::buildStructure(const std::vector<InstanceInput> &instances,
 
     message(kMsgProgress, 1, "Inserting Shapes into ADS");
     std::vector<uint32_t> codes, secondCodes;
+    codes.reserve(countPlain + countDisplaced + countMoving + countInstanced);
     std::map<uint64_t, ShapeGrid *> shapeGrids;
     for (size_t i = 0; i < instances.size(); ++i) {
         if (!usable[i]) continue;
