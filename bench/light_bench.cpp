@@ -59,14 +59,7 @@ struct Fixture {
     Fixture() {
         setTypeEnabled(kMsgProgress | kMsgInfo | kMsgBench | kMsgVerbose, false);
         mesh = testmesh::blob(466, 935);  // 869,550 triangles
-        InstanceInput in;
-        in.name = "blob";
-        in.mesh.positions = mesh.positions.data();
-        in.mesh.vertexCount = mesh.positions.size();
-        in.mesh.indices = mesh.indices.data();
-        in.mesh.triangleCount = mesh.triangleCount();
-        in.flags = 0x4EDFF;
-        in.index = 0;
+        const InstanceInput in = testmesh::instanceOf(mesh, "blob");
         grid.build({in}, ADSParameters());
         const BBox box = grid.bounds();
         tracer.ads = &grid;

@@ -118,14 +118,7 @@ struct Fixture {
     explicit Fixture(uint32_t rings, uint32_t segments) {
         setTypeEnabled(kMsgProgress | kMsgInfo | kMsgBench | kMsgVerbose, false);
         mesh = testmesh::blob(rings, segments);
-        InstanceInput in;
-        in.name = "blob";
-        in.mesh.positions = mesh.positions.data();
-        in.mesh.vertexCount = mesh.positions.size();
-        in.mesh.indices = mesh.indices.data();
-        in.mesh.triangleCount = mesh.triangleCount();
-        in.flags = 0x4EDFF;
-        in.index = 0;
+        const InstanceInput in = testmesh::instanceOf(mesh, "blob");
         double cpuStart = processSeconds();
         auto start = std::chrono::steady_clock::now();
         grid.build({in}, ADSParameters());
@@ -349,14 +342,7 @@ void BM_GridBuild(benchmark::State &state) {
     setTypeEnabled(kMsgProgress | kMsgInfo | kMsgBench | kMsgVerbose, false);
     const testmesh::Mesh mesh =
         state.range(0) == 0 ? testmesh::blob(133, 265) : testmesh::blob(466, 935);
-    InstanceInput in;
-    in.name = "blob";
-    in.mesh.positions = mesh.positions.data();
-    in.mesh.vertexCount = mesh.positions.size();
-    in.mesh.indices = mesh.indices.data();
-    in.mesh.triangleCount = mesh.triangleCount();
-    in.flags = 0x4EDFF;
-    in.index = 0;
+    const InstanceInput in = testmesh::instanceOf(mesh, "blob");
     const std::vector<InstanceInput> instances{in};
     for (auto _ : state) {
         CompleteGrid grid;

@@ -5,6 +5,8 @@
 #include <vector>
 
 #include "core/types.h"
+#include "raytrace/complete_grid.h"
+#include "raytrace/render_stats.h"
 
 /// Procedural meshes shaped like scanned models, for tests and benchmarks of the tracer.
 namespace ox::testmesh {
@@ -97,5 +99,19 @@ struct Rng {
         return {r * std::cos(a), r * std::sin(a), z};
     }
 };
+
+/// The mesh as instance 0 of a complete grid, seen by every ray type. It points into the mesh,
+/// which must outlive it.
+inline InstanceInput instanceOf(const Mesh &m, const char *name) {
+    InstanceInput in;
+    in.name = name;
+    in.mesh.positions = m.positions.data();
+    in.mesh.vertexCount = m.positions.size();
+    in.mesh.indices = m.indices.data();
+    in.mesh.triangleCount = m.triangleCount();
+    in.flags = RenderStats::kDefault;
+    in.index = 0;
+    return in;
+}
 
 }  // namespace ox::testmesh
