@@ -152,6 +152,41 @@ void expectSameHit(const Hit &hit, const Reference &ref, int ray) {
     }
 }
 
+// The closest hit of one ray on both paths (the four-wide one must report the very hit of the
+// eight-wide one, where the processor has it) against brute force, and occlusion below tmax.
+// Returns whether the ray hits.
+bool compareWithBruteForce(const CompleteGrid &grid, const std::vector<InstanceInput> &ins,
+                           const std::vector<Held> &held, const Ray &ray, float tmax, int i) {
+    Hit hit, narrow;
+    setWideTests(false);
+    bool foundNarrow = grid.intersect(ray, narrow, kInfiniteDistance, nullptr);
+    setWideTests(true);
+    bool found = grid.intersect(ray, hit, kInfiniteDistance, nullptr);
+    EXPECT_EQ(found, foundNarrow) << "ray " << i;
+    EXPECT_EQ(hit.t, narrow.t) << "ray " << i;
+    EXPECT_EQ(hit.primitive, narrow.primitive) << "ray " << i;
+    Reference ref = bruteForce(ins, held, ray, kInfiniteDistance);
+    EXPECT_EQ(found, ref.t >= 0.0f) << "ray " << i;
+    if (found && ref.t >= 0.0f) {
+        // Another triangle at exactly the same distance may be reported: then the whole hit
+        // must be that triangle's.
+        if (hit.id != ref.id || hit.instance != ref.instance) {
+            Reference other = hitOf(ins, held, ray, hit.instance, hit.id);
+            EXPECT_EQ(other.t, ref.t) << "ray " << i;
+            ref = other;
+        }
+        expectSameHit(hit, ref, i);
+    }
+    bool occluded = bruteForce(ins, held, ray, tmax).t >= 0.0f;
+    for (bool wide : {false, true}) {
+        setWideTests(wide);
+        bool occ = grid.occluded(ray, tmax, nullptr);
+        setWideTests(true);
+        EXPECT_EQ(occ, occluded) << "ray " << i << " wide " << wide;
+    }
+    return found;
+}
+
 // Compares whole closest hits and occlusion answers on random rays, most from inside the scene
 // box, at random shutter times. At least minHits rays must hit (default a sixth), so that the
 // comparison means something.
@@ -179,39 +214,8 @@ void checkAgainstBruteForce(const std::vector<InstanceInput> &ins, const ADSPara
         ray.direction = ray.direction.normalized();
         ray.type = i % 3 == 0 ? kRayShadow : kRayPrimary;
         ray.time = rng.uniform();
-        // The four-wide path must report the very hit of the eight-wide one (where the
-        // processor has it).
-        Hit hit, narrow;
-        setWideTests(false);
-        bool foundNarrow = grid.intersect(ray, narrow, kInfiniteDistance, nullptr);
-        setWideTests(true);
-        bool found = grid.intersect(ray, hit, kInfiniteDistance, nullptr);
-        ASSERT_EQ(found, foundNarrow) << "ray " << i;
-        ASSERT_EQ(hit.t, narrow.t) << "ray " << i;
-        ASSERT_EQ(hit.primitive, narrow.primitive) << "ray " << i;
-        Reference ref = bruteForce(ins, held, ray, kInfiniteDistance);
-        ASSERT_EQ(found, ref.t >= 0.0f) << "ray " << i;
-        if (found) {
-            ++hits;
-            // Another triangle at exactly the same distance may be reported: then the whole hit
-            // must be that triangle's.
-            if (hit.id != ref.id || hit.instance != ref.instance) {
-                Reference other = hitOf(ins, held, ray, hit.instance, hit.id);
-                ASSERT_EQ(other.t, ref.t) << "ray " << i;
-                ref = other;
-            }
-            expectSameHit(hit, ref, i);
-            if (::testing::Test::HasFailure()) return;
-        }
-        // Occlusion with both.
-        float tmax = diag * rng.uniform() * 0.5f;
-        bool occluded = bruteForce(ins, held, ray, tmax).t >= 0.0f;
-        for (bool wide : {false, true}) {
-            setWideTests(wide);
-            bool occ = grid.occluded(ray, tmax, nullptr);
-            setWideTests(true);
-            ASSERT_EQ(occ, occluded) << "ray " << i << " wide " << wide;
-        }
+        hits += compareWithBruteForce(grid, ins, held, ray, diag * rng.uniform() * 0.5f, i);
+        if (::testing::Test::HasFailure()) return;
     }
     EXPECT_GT(hits, minHits < 0 ? rays / 6 : minHits);
 }
@@ -898,6 +902,98 @@ TEST(CompleteGridTest, RaysAimedAtSparseTrianglesFindThem) {
             }
         }
         EXPECT_GT(hits, 3600);
+    }
+}
+
+// A strip folded like an accordion: columns of quads of width w whose ridges alternate between
+// heights -a and a, so that neighbouring triangles (and the packets they form) face steeply
+// different ways; with a second sheet at height gap below the first (facing the other way) when
+// gap > 0.
+Mesh accordion(uint32_t columns, uint32_t rows, float w, float a, float gap) {
+    Mesh m;
+    for (int sheet = 0; sheet < (gap > 0.0f ? 2 : 1); ++sheet) {
+        uint32_t base = uint32_t(m.positions.size());
+        for (uint32_t j = 0; j <= rows; ++j)
+            for (uint32_t i = 0; i <= columns; ++i)
+                m.positions.push_back(
+                    {float(i) * w, float(j) * w, (i % 2 ? a : -a) - float(sheet) * gap});
+        for (uint32_t j = 0; j < rows; ++j)
+            for (uint32_t i = 0; i < columns; ++i) {
+                uint32_t c = base + j * (columns + 1) + i, d = c + columns + 1;
+                if (sheet == 0)
+                    m.indices.insert(m.indices.end(), {c, c + 1, d + 1, c, d + 1, d});
+                else
+                    m.indices.insert(m.indices.end(), {c, d + 1, c + 1, c, d, d + 1});
+            }
+    }
+    return m;
+}
+
+TEST(CompleteGridTest, RaysThatGrazeOrTouchTrianglesFindThem) {
+    // Rays aimed at corners, edges and insides of triangles, from every side and along the
+    // surface (in its plane or nearly): the group tests drop packets the ray passes beside,
+    // which must never be a packet the ray hits. Folded packets, two sheets close together,
+    // nested grids of tiny cells and coordinates far larger than the cells.
+    struct Case {
+        const char *name;
+        Mesh mesh;
+        Vec3 offset;
+        float density;
+        uint32_t depth, threshold;
+    };
+    const Case cases[] = {
+        {"folded", accordion(40, 30, 0.05f, 0.04f, 0.0f), {0, 0, 0}, 0.05f, 0, 25},
+        {"two sheets", accordion(30, 30, 0.05f, 0.01f, 1e-4f), {0, 0, 0}, 0.05f, 0, 25},
+        {"far away", accordion(30, 20, 0.02f, 0.015f, 0.0f), {1.2e4f, -0.8e4f, 1e4f}, 0.05f, 0, 25},
+        {"nested", testmesh::blob(30, 40), {0, 0, 0}, 0.2f, 3, 2},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.name);
+        const std::vector<InstanceInput> ins = {
+            instanceOf(c.mesh, 0, Mtx4::translation(c.offset), kAllFlags, 0)};
+        ADSParameters p;
+        p.gridDensity = c.density;
+        p.gridMaxDepth = c.depth;
+        p.gridThreshold = c.threshold;
+        CompleteGrid grid;
+        ASSERT_TRUE(grid.build(ins, p));
+        const std::vector<Held> held = heldAs(ins, p);
+        const float diag = grid.bounds().extent().length();
+        Rng rng(17);
+        int rays = 0, hits = 0;
+        for (uint32_t t = 0; t < c.mesh.triangleCount(); t += 5) {
+            Vec3 q[3];
+            for (int k = 0; k < 3; ++k) q[k] = c.mesh.positions[c.mesh.indices[3 * t + k]] + c.offset;
+            const Vec3 e1 = q[1] - q[0], e2 = q[2] - q[0];
+            const Vec3 n = cross(e1, e2).normalized();
+            const float u = rng.uniform(), v = rng.uniform() * (1.0f - u);
+            const Vec3 targets[] = {q[0], q[1], q[0] + e1 * 0.5f, q[1] + (q[2] - q[1]) * u,
+                                    q[0] + e1 * u + e2 * v};
+            for (const Vec3 &target : targets) {
+                // From anywhere, then along an edge or the surface with a small slope (a
+                // ten-thousandth, a thousandth, a hundredth) from either side; exactly in the
+                // plane the triangle test itself is ill-conditioned.
+                Vec3 along = (rng.uniform() < 0.5f ? e1 : e2 - e1 * rng.uniform()).normalized();
+                const float slopes[] = {1e-4f, 1e-3f, -1e-3f, 1e-2f};
+                Vec3 dirs[5] = {rng.direction()};
+                for (int k = 0; k < 4; ++k) dirs[k + 1] = (along + n * slopes[k]).normalized();
+                for (const Vec3 &d : dirs) {
+                    Ray ray;
+                    const float length = diag * (0.05f + 1.5f * rng.uniform());
+                    ray.direction = d;
+                    ray.origin = target - d * length;
+                    ray.type = rays % 3 == 0 ? kRayShadow : kRayPrimary;
+                    // Occlusion up to just short of or just beyond the point aimed at.
+                    const float tmax = length * (rays % 2 ? 1.001f : 0.999f);
+                    hits += compareWithBruteForce(grid, ins, held, ray, tmax, rays);
+                    ASSERT_FALSE(::testing::Test::HasFailure())
+                        << "triangle " << t << " target " << target.x << " " << target.y << " "
+                        << target.z;
+                    ++rays;
+                }
+            }
+        }
+        EXPECT_GT(hits, rays / 2);
     }
 }
 
