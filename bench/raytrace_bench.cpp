@@ -381,7 +381,8 @@ BENCHMARK(BM_RatioByClass)
         for (int mesh : {0, 1})
             for (int rays : {0, 1})
                 for (int any : {0, 1})
-                    for (int cls = rays == 0 ? 1 : 0; cls < 3; ++cls) b->Args({mesh, rays, any, cls});
+                    for (int cls = rays == 0 ? 1 : 0; cls < 3; ++cls)
+                        b->Args({mesh, rays, any, cls});
     });
 #endif
 BENCHMARK_MAIN();

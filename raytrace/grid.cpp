@@ -877,7 +877,8 @@ __attribute__((always_inline)) inline bool testPacket(const PrimitiveStore &stor
     if (!mask) return false;
     if constexpr (kAny) return true;
     // The nearest hit lane (of equally near ones the lowest), without a branch per lane.
-    const __m128 near = _mm_or_ps(_mm_and_ps(lanes, t), _mm_andnot_ps(lanes, _mm_set1_ps(kInfinity)));
+    const __m128 near =
+        _mm_or_ps(_mm_and_ps(lanes, t), _mm_andnot_ps(lanes, _mm_set1_ps(kInfinity)));
     __m128 m = _mm_min_ps(near, _mm_shuffle_ps(near, near, _MM_SHUFFLE(1, 0, 3, 2)));
     m = _mm_min_ps(m, _mm_shuffle_ps(m, m, _MM_SHUFFLE(2, 3, 0, 1)));
     const int lane = __builtin_ctz(_mm_movemask_ps(_mm_cmpeq_ps(near, m)) & mask);
@@ -1100,9 +1101,9 @@ __attribute__((target("avx2"))) bool Grid::closestInGroupsWide(uint32_t index, c
         uint32_t cand = 0;
         for (uint32_t i = 0; i < n; i += 2) {
             __m256 tnear;
-            cand |= uint32_t(groupPairMask(g[i], i + 1 < n ? g + i + 1 : nullptr, f, s.limit,
-                                           tnear))
-                    << (4 * i);
+            cand |=
+                uint32_t(groupPairMask(g[i], i + 1 < n ? g + i + 1 : nullptr, f, s.limit, tnear))
+                << (4 * i);
             _mm256_store_ps(tn + 4 * i, tnear);
         }
         return testNearestFirst(*store_, g, tn, cand, r, s);
@@ -1382,11 +1383,11 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
         const __m128i step = _mm_sub_epi32(back, up);
         const __m128i next = _mm_sub_epi32(cell3, up);
         // Beyond: the cell count + 1 going up, -1 going down, -2 standing still.
-        const __m128i beyond = _mm_or_si128(
-            _mm_and_si128(up, _mm_add_epi32(walk_.last, _mm_set1_epi32(2))),
-            _mm_andnot_si128(up, _mm_or_si128(back, _mm_set1_epi32(-2))));
-        const __m128i cellStep = _mm_sub_epi32(_mm_and_si128(up, walk_.stride),
-                                               _mm_and_si128(back, walk_.stride));
+        const __m128i beyond =
+            _mm_or_si128(_mm_and_si128(up, _mm_add_epi32(walk_.last, _mm_set1_epi32(2))),
+                         _mm_andnot_si128(up, _mm_or_si128(back, _mm_set1_epi32(-2))));
+        const __m128i cellStep =
+            _mm_sub_epi32(_mm_and_si128(up, walk_.stride), _mm_and_si128(back, walk_.stride));
         const __m128 base = _mm_sub_ps(walk_.lo, o);
         const __m128 largest = _mm_set1_ps(kInfiniteDistance);
         const __m128 tNext =
@@ -1458,8 +1459,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                                   ? uint32_t(kWalkDistance[word >> shift & 7])
                                   : 0u;
         if (dist == 0) {
-            const Vec3 frame =
-                frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead);
+            const Vec3 frame = frameOrigin(X.next - X.ahead, Y.next - Y.ahead, Z.next - Z.ahead);
             bool hitHere;
             if ((word >> kItemIndexBits) == kItemGroup && r.wide) {
                 // Most occupied cells name their groups: no item dispatch.

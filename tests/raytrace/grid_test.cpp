@@ -963,7 +963,8 @@ TEST(CompleteGridTest, RaysThatGrazeOrTouchTrianglesFindThem) {
         int rays = 0, hits = 0;
         for (uint32_t t = 0; t < c.mesh.triangleCount(); t += 5) {
             Vec3 q[3];
-            for (int k = 0; k < 3; ++k) q[k] = c.mesh.positions[c.mesh.indices[3 * t + k]] + c.offset;
+            for (int k = 0; k < 3; ++k)
+                q[k] = c.mesh.positions[c.mesh.indices[3 * t + k]] + c.offset;
             const Vec3 e1 = q[1] - q[0], e2 = q[2] - q[0];
             const Vec3 n = cross(e1, e2).normalized();
             const float u = rng.uniform(), v = rng.uniform() * (1.0f - u);
