@@ -10,6 +10,7 @@
 #include <random>
 #include <vector>
 
+#include "bench/silent_io.h"
 #include "render/frame.h"
 #include "render/post_filter.h"
 
@@ -87,20 +88,15 @@ ox::RenderContext &noContext() {
     return *reinterpret_cast<ox::RenderContext *>(storage);
 }
 
-/// Progress goes nowhere; nothing aborts.
-struct NoIO final : ox::RenderIOInterface {
-    bool isAborted() const override { return false; }
-    bool isReleased() override { return false; }
-    void setProgressTitle(const std::string &) override {}
-    void beginCommand() override {}
-    void endCommand() override {}
-    void finish() override {}
-    void setProgress(float) override {}
-    void abort() override {}
-    void release() override {}
-    void clearRelease() override {}
-    void refreshDisplay() override {}
-};
+/// Argument "threads" 1 and 2, in milliseconds of wall-clock time with the process's CPU time.
+void onOneAndTwoThreads(benchmark::internal::Benchmark *b) {
+    b->ArgName("threads")
+        ->Arg(1)
+        ->Arg(2)
+        ->Unit(benchmark::kMillisecond)
+        ->MeasureProcessCPUTime()
+        ->UseRealTime();
+}
 
 /// The floor of every filter that replaces a layer: read it in bands, paste into a scratch
 /// layer (the storage retired by the previous round), retire the old one and rename the new
@@ -151,36 +147,24 @@ void BM_Premultiply(benchmark::State &state) {
         std::make_unique<ox::PremultiplyFilter>(std::vector<std::string>{"beauty"}, 0.0f,
                                                 ox::Color(0, 0, 0, 0)),
         int(state.range(0)));
-    NoIO io;
+    oxbench::SilentIO io;
     for (auto _ : state)
         if (!premultiply.execute(*frame, noContext(), io)) state.SkipWithError("failed");
     state.SetItemsProcessed(int64_t(state.iterations()) * kSize * kSize);
 }
-BENCHMARK(BM_Premultiply)
-    ->ArgName("threads")
-    ->Arg(1)
-    ->Arg(2)
-    ->Unit(benchmark::kMillisecond)
-    ->MeasureProcessCPUTime()
-    ->UseRealTime();
+BENCHMARK(BM_Premultiply)->Apply(onOneAndTwoThreads);
 
 void BM_ShapeNormalization(benchmark::State &state) {
     auto frame = makeFrame();
     CellInstances instances;
     ox::ShapeNormalizationFilter normalization("beauty", ox::NormalizeOptions{}, &instances);
     normalization.setThreadCount(int(state.range(0)));
-    NoIO io;
+    oxbench::SilentIO io;
     for (auto _ : state)
         if (!normalization.run(*frame, &io)) state.SkipWithError("failed");
     state.SetItemsProcessed(int64_t(state.iterations()) * kSize * kSize);
 }
-BENCHMARK(BM_ShapeNormalization)
-    ->ArgName("threads")
-    ->Arg(1)
-    ->Arg(2)
-    ->Unit(benchmark::kMillisecond)
-    ->MeasureProcessCPUTime()
-    ->UseRealTime();
+BENCHMARK(BM_ShapeNormalization)->Apply(onOneAndTwoThreads);
 
 void BM_FilterChain(benchmark::State &state) {
     auto frame = makeFrame();
@@ -194,7 +178,7 @@ void BM_FilterChain(benchmark::State &state) {
     dilation.setThreadCount(threads);
     ox::ShapeNormalizationFilter normalization("beauty", ox::NormalizeOptions{}, &instances);
     normalization.setThreadCount(threads);
-    NoIO io;
+    oxbench::SilentIO io;
     for (auto _ : state) {
         const bool ok = premultiply.execute(*frame, noContext(), io) && dilation.run(*frame, &io) &&
                         normalization.run(*frame, &io);
@@ -203,13 +187,7 @@ void BM_FilterChain(benchmark::State &state) {
     state.counters["coverage"] = islands().coverage;
     state.SetItemsProcessed(int64_t(state.iterations()) * kSize * kSize);
 }
-BENCHMARK(BM_FilterChain)
-    ->ArgName("threads")
-    ->Arg(1)
-    ->Arg(2)
-    ->Unit(benchmark::kMillisecond)
-    ->MeasureProcessCPUTime()
-    ->UseRealTime();
+BENCHMARK(BM_FilterChain)->Apply(onOneAndTwoThreads);
 
 }  // namespace
 

@@ -6,27 +6,13 @@
 #include <chrono>
 #include <cmath>
 
+#include "bench/silent_io.h"
 #include "core/message.h"
 #include "core/render_io.h"
 #include "platform/work_server.h"
 #include "render/tile_renderer.h"
 
 namespace {
-
-class SilentIO : public ox::RenderIOInterface {
-public:
-    bool isAborted() const override { return false; }
-    bool isReleased() override { return false; }
-    void setProgressTitle(const std::string &) override {}
-    void beginCommand() override {}
-    void endCommand() override {}
-    void finish() override {}
-    void setProgress(float fraction) override { benchmark::DoNotOptimize(fraction); }
-    void abort() override {}
-    void release() override {}
-    void clearRelease() override {}
-    void refreshDisplay() override {}
-};
 
 class EmptyRenderer : public ox::TileRenderer {
 protected:
@@ -75,7 +61,7 @@ ox::TileRunSettings region(uint32_t w, uint32_t h, int tile, int threads, int sc
 // mutex, the abort test and the progress report per tile), list building included.
 void BM_TileHandOut(benchmark::State &state) {
     const int threads = int(state.range(0));
-    SilentIO io;
+    oxbench::SilentIO io;
     EmptyRenderer r;
     const auto s = region(512, 512, 1, threads, ox::kTileLeftToRight);
     for (auto _ : state) r.run(s, io);
@@ -95,7 +81,7 @@ BENCHMARK(BM_TileOrderBuild)->DenseRange(0, 3)->Unit(benchmark::kMillisecond);
 // A compute-bound tile loop on 1 and 2 threads; compare the real times for the scaling.
 void BM_ComputeTiles(benchmark::State &state) {
     const int threads = int(state.range(0));
-    SilentIO io;
+    oxbench::SilentIO io;
     ComputeRenderer r;
     const auto s = region(256, 256, 16, threads, ox::kTileHilbert);
     double cpu = 0.0, wall = 0.0;
