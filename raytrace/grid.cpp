@@ -438,6 +438,20 @@ bool Grid::prepare(const PrimitiveStore &store, const std::vector<uint32_t> &pri
     walk_.top = _mm_setr_ps(float(nx_ - 1), float(ny_ - 1), float(nz_ - 1), 0.0f);
     walk_.last = _mm_setr_epi32(int32_t(nx_ - 1), int32_t(ny_ - 1), int32_t(nz_ - 1), 0);
     walk_.stride = _mm_setr_epi32(1, int32_t(nx_), int32_t(nx_ * ny_), 0);
+    const float lo[3] = {b.min.x, b.min.y, b.min.z};
+    const float invSize[3] = {invCellSize_.x, invCellSize_.y, invCellSize_.z};
+    const int64_t n[3] = {nx_, ny_, nz_};
+    for (int a = 0; a < 3; ++a) {
+        fetch_.lo[a] = float4(lo[a]);
+        fetch_.invSize[a] = float4(invSize[a]);
+        fetch_.top[a] = float4(float(n[a] - 1));
+    }
+    fetch_.strideY = float4(float(nx_));
+    fetch_.strideZ = float4(float(nx_ * ny_));
+    const int64_t lastCell = nx_ * ny_ * nz_ - 1;
+    float lastF = float(lastCell);
+    if (double(lastF) > double(lastCell)) lastF = std::nextafter(lastF, 0.0f);
+    fetch_.lastCell = float4(lastF);
     tolerance_ = std::max(0.001f, 1e-5f * cellSize_.length());
     // Cells take their primitives with a small margin, so that a ray walking next to a cell
     // boundary finds a triangle that only touches the neighbouring cell. The tolerance, bounded
@@ -1416,30 +1430,25 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
     // the ray now, so that those waits overlap.
     if (nx_ * ny_ * nz_ >= kFetchAheadMinCells) {
         __builtin_prefetch(cells + cell);
-        // The points in cell units, stepped by 2 crossings of the smallest cell side; the cell
-        // counts fit 32 bits.
-        float h = 2.0f * std::min({X.delta, Y.delta, Z.delta});
-        const float4 scale(_mm_setr_ps(invCellSize_.x, invCellSize_.y, invCellSize_.z, 0.0f));
-        const float4 top(_mm_setr_ps(float(nx_ - 1), float(ny_ - 1), float(nz_ - 1), 0.0f));
-        const float4 dir(_mm_setr_ps(r.d.x, r.d.y, r.d.z, 0.0f));
-        float4 f = (float4(_mm_setr_ps(r.o.x, r.o.y, r.o.z, 0.0f)) + dir * float4(t0) -
-                    float4(_mm_setr_ps(box_.min.x, box_.min.y, box_.min.z, 0.0f))) *
-                   scale;
-        const float4 df = dir * float4(h) * scale;
-        const int64_t lastCell = nx_ * ny_ * nz_ - 1;
-        float t = t0;
-        for (int k = 0; k < kFetchAhead; ++k) {
-            t += h;
-            if (!(t < t1)) break;
-            f = f + df;
-            alignas(16) int32_t at[4];
-            _mm_store_si128(reinterpret_cast<__m128i *>(at),
-                            _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), top)));
-            // (Above 2^24 cells a coordinate may round one or two past the last cell.)
-            int64_t c =
-                std::min(at[0] + int64_t(at[1]) * strideY + int64_t(at[2]) * strideZ, lastCell);
-            __builtin_prefetch(cells + c);
-        }
+        // The points, held at the walk's end, in cell units clamped to the grid, and their
+        // cells' indices, all four side by side. The indices are computed in float: above 2^24
+        // cells one may round to a neighbouring cell, which only costs a useless fetch.
+        const float h = kFetchAheadSpacing * std::min({X.delta, Y.delta, Z.delta});
+        const float4 t = _mm_min_ps(
+            float4(t0) + float4(_mm_setr_ps(1.0f, 2.0f, 3.0f, 4.0f)) * float4(h), float4(t1));
+        const auto axisCell = [&](const float4 &o, const float4 &d, int a) {
+            const float4 f = (o + d * t - fetch_.lo[a]) * fetch_.invSize[a];
+            return float4(_mm_cvtepi32_ps(
+                _mm_cvttps_epi32(_mm_min_ps(_mm_max_ps(f, float4::zero()), fetch_.top[a]))));
+        };
+        const float4 at =
+            _mm_min_ps(axisCell(r.ox, r.dx, 0) + axisCell(r.oy, r.dy, 1) * fetch_.strideY +
+                           axisCell(r.oz, r.dz, 2) * fetch_.strideZ,
+                       fetch_.lastCell);
+        alignas(16) int32_t index[4];
+        _mm_store_si128(reinterpret_cast<__m128i *>(index), _mm_cvttps_epi32(at));
+        static_assert(kFetchAhead == 4);
+        for (int k = 0; k < kFetchAhead; ++k) __builtin_prefetch(cells + index[k]);
     }
     bool found = false;
     // Every iteration advances at least one cell along the ray, so a walk needs at most

@@ -222,6 +222,14 @@ private:
         int4 last, stride;
     };
     WalkFrame walk_;
+    /// What the fetch ahead reads: per axis the lower bound, the reciprocal cell size and the
+    /// last cell index in all four lanes, the strides of y and z and the last cell's index (as
+    /// floats, the last index rounded down).
+    struct FetchFrame {
+        float4 lo[3], invSize[3], top[3];
+        float4 strideY, strideZ, lastCell;
+    };
+    FetchFrame fetch_;
     // Per cell one word: the only item's code, or a kItemList code with the offset in items_ of
     // the cell's item count followed by its codes (most cells reach their data without the
     // list), or for an empty cell a kItemEmpty code with three bits per direction octant (bits
@@ -238,9 +246,11 @@ private:
             if (kWalkDistance[i] != kCubeSide[i]) return false;
         return true;
     }());
-    /// Points along a ray whose cells the walk fetches before it starts, in grids of at least
-    /// kFetchAheadMinCells cells (1 MiB of cell words).
-    static constexpr int kFetchAhead = 6;
+    /// Points along a ray whose cells the walk fetches before it starts, kFetchAheadSpacing
+    /// crossings of the smallest cell side apart, in grids of at least kFetchAheadMinCells cells
+    /// (1 MiB of cell words).
+    static constexpr int kFetchAhead = 4;
+    static constexpr float kFetchAheadSpacing = 3.0f;
     static constexpr int64_t kFetchAheadMinCells = int64_t(1) << 18;
     std::vector<uint32_t, LargeArrayAllocator<uint32_t>> cells_;
     void computeDistances(const std::vector<uint8_t> &occupied);
