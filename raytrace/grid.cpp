@@ -1484,14 +1484,8 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
                 // Several items: start fetching the boxes and packets of all of them at once.
                 if (last - first > 1)
                     for (const uint32_t *k = first; k != last; ++k) {
-                        uint32_t kind = *k >> kItemIndexBits;
-                        const char *p = nullptr;
-                        if (kind == kItemGroup)
-                            p = reinterpret_cast<const char *>(&groups_[*k & kItemIndexMask]);
-                        else if (kind == kItemPacket)
-                            p = reinterpret_cast<const char *>(store_->triangles.data() +
-                                                               size_t(*k & kItemIndexMask) * 4);
-                        if (p) {
+                        // (A list holds no list codes.)
+                        if (const char *p = itemData(*k)) {
                             __builtin_prefetch(p);
                             __builtin_prefetch(p + 64);
                         }
@@ -1504,17 +1498,7 @@ bool Grid::traverse(const TraceRay &r, TraceState &s) const {
             }
             // The next cell's word has arrived meanwhile: start fetching what it names.
             if (inside && tA < s.limit) {
-                uint32_t nextWord = cells[cell + stepA];
-                uint32_t kind = nextWord >> kItemIndexBits, index = nextWord & kItemIndexMask;
-                const char *p = nullptr;
-                if (kind == kItemGroup)
-                    p = reinterpret_cast<const char *>(groups_.data() + index);
-                else if (kind == kItemPacket)
-                    p = reinterpret_cast<const char *>(store_->triangles.data() +
-                                                       size_t(index) * 4);
-                else if (kind == kItemList)
-                    p = reinterpret_cast<const char *>(items + index);
-                if (p) __builtin_prefetch(p);
+                if (const char *p = itemData(cells[cell + stepA])) __builtin_prefetch(p);
             }
         } else if (dist >= 2) {
             // Nothing lies ahead of this cell the way the ray goes: the walk is over.

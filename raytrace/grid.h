@@ -192,6 +192,21 @@ private:
                 box_.min.y + float(y) * cellSize_.y - framePad_,
                 box_.min.z + float(z) * cellSize_.z - framePad_};
     }
+    /// Start of the data an item code names (a group, a packet or a cell's list), for fetching
+    /// it early; nullptr for other kinds.
+    const char *itemData(uint32_t code) const {
+        const uint32_t index = code & kItemIndexMask;
+        switch (code >> kItemIndexBits) {
+            case kItemGroup:
+                return reinterpret_cast<const char *>(groups_.data() + index);
+            case kItemPacket:
+                return reinterpret_cast<const char *>(store_->triangles.data() + size_t(index) * 4);
+            case kItemList:
+                return reinterpret_cast<const char *>(items_.data() + index);
+            default:
+                return nullptr;
+        }
+    }
     template <bool kAny>
     bool testGroups(uint32_t index, const TraceRay &ray, TraceState &state,
                     const Vec3 &frame) const;
